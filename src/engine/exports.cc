@@ -1,0 +1,2 @@
+// The JNI exports: thin functions that convert their arguments and call the engine.
+#include <jni.h>

@@ -1,0 +1,60 @@
+// The engine's one way to the host: value calls for the SNMP objects, status lines and traffic
+// logging. The product installs the JNI implementation; unit tests, fuzzers and benchmarks
+// install an in-memory host. Methods are called concurrently from many engine threads, so an
+// implementation must be thread-safe. Subsystems call this interface, never JNI directly.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace tessel {
+
+// The arguments of one value call. Which fields a method passes is fixed per method (see each
+// method); texts that the host may receive as null are optional.
+struct HostValueQuery {
+  std::string label;                  // the tree cell's label
+  std::string objectOid;              // scalar: the group OID; table: the entry OID (.1.3...)
+  std::string subId;                  // scalar: the sub-identifier; table: the column, decimal
+  std::optional<std::string> instance;  // scalar: ".0"; table: ".5", or null for a first GetNext
+  std::string previousSubId;          // scalar GetNext: the registered sub-identifier below
+  std::int32_t column = 0;            // table GetNext: the column and the one after it
+  std::int32_t nextColumn = -1;
+  std::int32_t dataType = 0;          // the column's BER identifier
+  std::int32_t nextDataType = 0;
+  std::string databaseName;
+  std::string tableName;
+  std::string valueText;              // Set: the value rendered as text
+  std::int32_t agentId = 0;
+  std::int32_t rowStatusColumn = 0;
+  std::string agentAddress;
+  std::int32_t agentPort = 0;
+  std::optional<std::string> syntax;
+};
+
+// A host's answer: a String[] whose elements may be null, or null altogether.
+using HostAnswer = std::optional<std::vector<std::optional<std::string>>>;
+
+class HostBridge {
+ public:
+  virtual ~HostBridge() = default;
+
+  virtual void PrintStatus(const std::string& text) = 0;
+
+  // [value, error]
+  virtual HostAnswer ScalarGetOidVal(const HostValueQuery& query) = 0;
+  virtual HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) = 0;
+  virtual HostAnswer SetOidVal(const HostValueQuery& query) = 0;
+  virtual HostAnswer TableGetOidVal(const HostValueQuery& query) = 0;
+  // [value, column-and-instance relative to the entry OID, error]
+  virtual HostAnswer TableGetNextOidVal(const HostValueQuery& query) = 0;
+  virtual HostAnswer TableSetOidVal(const HostValueQuery& query) = 0;
+};
+
+// The installed host, or nullptr. Installing is not synchronised with calls in flight: install
+// before agents serve requests.
+HostBridge* InstalledHost();
+void InstallHost(HostBridge* host);
+
+}  // namespace tessel

@@ -1,0 +1,124 @@
+#include "base/vector.h"
+
+#include <gtest/gtest.h>
+
+#include <thread>
+#include <vector>
+
+namespace tessel {
+namespace {
+
+std::int8_t CompareData(const VectorNode* a, const VectorNode* b) {
+  return a->data < b->data ? -1 : (a->data > b->data ? 1 : 0);
+}
+
+class VectorTest : public ::testing::Test {
+ protected:
+  void SetUp() override { InitVector(&ordered_, &kOrdered); InitVector(&plain_, nullptr); }
+  void TearDown() override { FreeVector(&ordered_); FreeVector(&plain_); }
+
+  static std::vector<std::uint64_t> Contents(Vector* vector) {
+    std::vector<std::uint64_t> out;
+    for (VectorNode* node = GetElementAt(vector, 0); node; node = node->next) out.push_back(node->data);
+    return out;
+  }
+
+  static constexpr VectorProperties kOrdered{CompareData};
+  Vector ordered_;
+  Vector plain_;
+};
+
+TEST_F(VectorTest, OrderedInsertionSortsAndRefusesDuplicates) {
+  for (std::uint64_t v : {5, 1, 3}) ASSERT_TRUE(AddElement(&ordered_, NewVectorNode(v)));
+  EXPECT_EQ(Contents(&ordered_), (std::vector<std::uint64_t>{1, 3, 5}));
+  ASSERT_TRUE(AddElement(&ordered_, NewVectorNode(0)));
+  ASSERT_TRUE(AddElement(&ordered_, NewVectorNode(9)));
+  EXPECT_EQ(Contents(&ordered_), (std::vector<std::uint64_t>{0, 1, 3, 5, 9}));
+  VectorNode* duplicate = NewVectorNode(3);
+  EXPECT_FALSE(AddElement(&ordered_, duplicate));
+  delete duplicate;
+  EXPECT_EQ(ordered_.count, 5);
+  EXPECT_EQ(ordered_.tail->data, 9u);
+}
+
+TEST_F(VectorTest, OrderedInsertionOfManyKeepsEveryValueOnce) {
+  for (std::uint64_t i = 0; i < 200; ++i) {
+    std::uint64_t v = (i * 37) % 101;
+    VectorNode* node = NewVectorNode(v);
+    if (!AddElement(&ordered_, node)) delete node;
+  }
+  std::vector<std::uint64_t> expected;
+  for (std::uint64_t v = 0; v < 101; ++v) expected.push_back(v);
+  EXPECT_EQ(Contents(&ordered_), expected);
+  EXPECT_EQ(ordered_.tail->data, 100u);
+}
+
+TEST_F(VectorTest, PositionalOperationsRespectBounds) {
+  for (std::uint64_t v : {10, 20, 30}) AddElement(&plain_, NewVectorNode(v));
+  VectorNode* appended = NewVectorNode(40);
+  EXPECT_TRUE(InsertElementAt(&plain_, appended, 3));
+  EXPECT_EQ(plain_.tail, appended);
+  VectorNode* rejected = NewVectorNode(50);
+  EXPECT_FALSE(InsertElementAt(&plain_, rejected, 5));
+  delete rejected;
+  EXPECT_TRUE(InsertElementAt(&plain_, NewVectorNode(5), 0));
+  EXPECT_EQ(Contents(&plain_), (std::vector<std::uint64_t>{5, 10, 20, 30, 40}));
+  EXPECT_EQ(GetElementAt(&plain_, -1), nullptr);
+  EXPECT_EQ(GetElementAt(&plain_, plain_.count), nullptr);
+  EXPECT_FALSE(DeleteElementAt(&plain_, 5));
+  EXPECT_TRUE(DeleteElementAt(&plain_, 4));
+  EXPECT_EQ(plain_.tail->data, 30u);
+  EXPECT_EQ(GetNthElement(&plain_, 2, plain_.head)->data, 20u);
+  EXPECT_EQ(GetNthElement(&plain_, 9, plain_.head), nullptr);
+}
+
+TEST_F(VectorTest, DeleteElementByNode) {
+  VectorNode foreign{};
+  EXPECT_FALSE(DeleteElement(&plain_, &foreign));
+  AddElement(&plain_, NewVectorNode(1));
+  VectorNode* last = NewVectorNode(2);
+  AddElement(&plain_, last);
+  EXPECT_TRUE(DeleteElement(&plain_, &foreign));
+  EXPECT_EQ(plain_.count, 2);
+  EXPECT_TRUE(DeleteElement(&plain_, last));
+  EXPECT_EQ(plain_.tail, plain_.head);
+  EXPECT_TRUE(DeleteLCDVector(&plain_, 1));
+  EXPECT_EQ(plain_.count, 0);
+  EXPECT_FALSE(DeleteLCDVector(&plain_, 1));
+  AddElement(&plain_, NewVectorNode(7));
+  EXPECT_EQ(Contents(&plain_), (std::vector<std::uint64_t>{7}));
+}
+
+TEST_F(VectorTest, MergeDropsDuplicatesAndEmptiesSource) {
+  for (std::uint64_t v : {2, 4}) AddElement(&ordered_, NewVectorNode(v));
+  for (std::uint64_t v : {4, 1, 3}) AddElement(&plain_, NewVectorNode(v));
+  EXPECT_EQ(MergeVector(&ordered_, &plain_), 1);
+  EXPECT_EQ(Contents(&ordered_), (std::vector<std::uint64_t>{1, 2, 3, 4}));
+  EXPECT_EQ(plain_.count, 0);
+}
+
+TEST_F(VectorTest, ConcurrentProducersAndConsumerLoseNothing) {
+  constexpr int kPerThread = 2000;
+  std::vector<std::thread> producers;
+  for (int t = 0; t < 4; ++t) {
+    producers.emplace_back([this, t] {
+      for (int i = 0; i < kPerThread; ++i) AddElement(&plain_, NewVectorNode(t * kPerThread + i + 1));
+    });
+  }
+  std::uint64_t sum = 0;
+  int taken = 0;
+  while (taken < 4 * kPerThread) {
+    std::uint64_t payload;
+    if (TakeFirstElement(&plain_, &payload)) {
+      sum += payload;
+      ++taken;
+    }
+  }
+  for (auto& producer : producers) producer.join();
+  const std::uint64_t n = 4 * kPerThread;
+  EXPECT_EQ(sum, n * (n + 1) / 2);
+  EXPECT_EQ(plain_.count, 0);
+}
+
+}  // namespace
+}  // namespace tessel

@@ -1,0 +1,112 @@
+#include "support/memory_host.h"
+
+namespace tessel {
+
+Oid MemoryHost::ToOid(const std::string& oidText) {
+  std::string text = oidText;
+  if (text.empty() || text[0] != '.') text.insert(text.begin(), '.');
+  Oid oid;
+  if (ParseDottedText(&oid, text, false) <= 0) oid.clear();
+  return oid;
+}
+
+void MemoryHost::SetValue(const std::string& oidText, const std::string& valueText) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  objects_[ToOid(oidText)] = Entry{valueText, "-1"};
+}
+
+void MemoryHost::SetError(const std::string& oidText, const std::string& errorText) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  Entry& entry = objects_[ToOid(oidText)];
+  if (!entry.value) entry.value = "x";
+  entry.error = errorText;
+}
+
+void MemoryHost::SetNullValue(const std::string& oidText) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1"};
+}
+
+std::string MemoryHost::ValueOf(const std::string& oidText) const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  auto found = objects_.find(ToOid(oidText));
+  return found == objects_.end() || !found->second.value ? "" : *found->second.value;
+}
+
+std::vector<std::string> MemoryHost::StatusLines() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return statusLines_;
+}
+
+std::vector<HostValueQuery> MemoryHost::SetCalls() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return setCalls_;
+}
+
+int MemoryHost::CallCount() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return callCount_;
+}
+
+void MemoryHost::PrintStatus(const std::string& text) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  statusLines_.push_back(text);
+}
+
+HostAnswer MemoryHost::Answer(const Oid& oid) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  ++callCount_;
+  auto found = objects_.find(oid);
+  if (found == objects_.end()) return std::nullopt;
+  return std::vector<std::optional<std::string>>{found->second.value, found->second.error};
+}
+
+HostAnswer MemoryHost::Store(const Oid& oid, const HostValueQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  ++callCount_;
+  setCalls_.push_back(query);
+  Entry& entry = objects_[oid];
+  if (entry.error != "-1") return std::vector<std::optional<std::string>>{entry.value, entry.error};
+  entry.value = query.valueText;
+  return std::vector<std::optional<std::string>>{query.valueText, std::string("-1")};
+}
+
+HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) {
+  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
+}
+
+HostAnswer MemoryHost::ScalarGetNextOidVal(const HostValueQuery& query) {
+  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
+}
+
+HostAnswer MemoryHost::SetOidVal(const HostValueQuery& query) {
+  return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
+}
+
+HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) {
+  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
+}
+
+HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
+  Oid entryOid = ToOid(query.objectOid);
+  Oid columnOid = entryOid;
+  columnOid.push_back(static_cast<std::uint32_t>(query.column));
+  Oid from = ToOid(query.objectOid + "." + std::to_string(query.column) + query.instance.value_or(""));
+  std::lock_guard<std::mutex> lock(mutex_);
+  ++callCount_;
+  auto next = query.instance ? objects_.upper_bound(from) : objects_.lower_bound(from);
+  if (next == objects_.end() || next->first.size() <= columnOid.size() ||
+      !std::equal(columnOid.begin(), columnOid.end(), next->first.begin())) {
+    return std::nullopt;
+  }
+  std::span<const std::uint32_t> relative(next->first.data() + entryOid.size(),
+                                          next->first.size() - entryOid.size());
+  return std::vector<std::optional<std::string>>{next->second.value, OidToPlainText(relative),
+                                                  next->second.error};
+}
+
+HostAnswer MemoryHost::TableSetOidVal(const HostValueQuery& query) {
+  return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
+}
+
+}  // namespace tessel

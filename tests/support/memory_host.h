@@ -1,0 +1,53 @@
+// An in-memory host for tests, fuzzers and benchmarks: values are kept in one map keyed by the
+// object's full OID and served with the same contract as the Java host (scalar Get and GetNext
+// of the named object, table GetNext of the next instance of the same column). Thread-safe.
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "base/conversions.h"
+#include "engine/host_bridge.h"
+
+namespace tessel {
+
+class MemoryHost : public HostBridge {
+ public:
+  // oidText is dotted, with or without a leading dot.
+  void SetValue(const std::string& oidText, const std::string& valueText);
+  // The object answers [value, errorText] (its value, or "x" when it has none).
+  void SetError(const std::string& oidText, const std::string& errorText);
+  // The object answers a null value.
+  void SetNullValue(const std::string& oidText);
+  std::string ValueOf(const std::string& oidText) const;
+  std::vector<std::string> StatusLines() const;
+  std::vector<HostValueQuery> SetCalls() const;
+  int CallCount() const;
+
+  void PrintStatus(const std::string& text) override;
+  HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
+  HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) override;
+  HostAnswer SetOidVal(const HostValueQuery& query) override;
+  HostAnswer TableGetOidVal(const HostValueQuery& query) override;
+  HostAnswer TableGetNextOidVal(const HostValueQuery& query) override;
+  HostAnswer TableSetOidVal(const HostValueQuery& query) override;
+
+ private:
+  struct Entry {
+    std::optional<std::string> value;
+    std::string error = "-1";
+  };
+  static Oid ToOid(const std::string& oidText);
+  HostAnswer Answer(const Oid& oid);
+  HostAnswer Store(const Oid& oid, const HostValueQuery& query);
+
+  mutable std::mutex mutex_;
+  std::map<Oid, Entry> objects_;
+  std::vector<std::string> statusLines_;
+  std::vector<HostValueQuery> setCalls_;
+  int callCount_ = 0;
+};
+
+}  // namespace tessel
