@@ -8,6 +8,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <span>
 #include <shared_mutex>
 #include <string>
 #include <vector>
@@ -63,7 +64,12 @@ struct TreeCell {
                    : std::span<const std::uint32_t>(oid.data(), oid.empty() ? 0 : oid.size() - 1);
   }
   // Position of a sub-identifier among the columns, -1 when it is not registered.
-  int ColumnPosition(std::uint32_t subId) const;
+  int ColumnPosition(std::uint32_t subId) const {
+    for (std::size_t i = 0; i < subIds.size(); ++i) {
+      if (subIds[i] == subId) return static_cast<int>(i);
+    }
+    return -1;
+  }
 };
 
 // The texts the host registers a cell with.
