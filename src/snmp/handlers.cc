@@ -564,7 +564,7 @@ std::optional<VarValue> ScalarProcessReadReq(std::uint8_t pduType, Oid* oid, std
   if (pduType == kGetRequest) {
     text = AdapterGetOidVal(*query, errorCode);
   } else {
-    query->previousSubId = UIntToText(PreviousSubId(*target.cell, (*oid)[oid->size() - 2]));
+    query->previousSubId = UIntToText(PreviousSubId(*target.cell, static_cast<std::uint32_t>(query->column)));
     text = AdapterGetNextOidVal(*query, errorCode);
     if (!text) *errorCode = kNoSuchInstance;
   }
