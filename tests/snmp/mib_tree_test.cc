@@ -113,15 +113,6 @@ TEST_F(MibTreeTest, LookupOfExtremeOids) {
             GetTreeCellByName("ifEntry"));
 }
 
-TEST_F(MibTreeTest, CompareKeyOrdersPrefixesFirst) {
-  EXPECT_EQ(CompareKey(Oid{1, 3}, Oid{1, 3}), 0);
-  EXPECT_EQ(CompareKey(Oid{1, 2, 9}, Oid{1, 3}), -1);
-  EXPECT_EQ(CompareKey(Oid{1, 3}, Oid{1, 3, 1}), -1);
-  EXPECT_EQ(CompareKey(Oid{1, 4}, Oid{1, 3, 1}), 1);
-  EXPECT_EQ(CompareKey(Oid{1, 3, 1}, Oid{1, 3}), 2);
-  EXPECT_EQ(CompareKey(Oid{}, Oid{}), 0);
-}
-
 TEST_F(MibTreeTest, ReRegistrationKeepsOneCellAndMergesColumns) {
   ASSERT_TRUE(CreateAndRegisterCell(Cell("ifEntry", "1.3.6.1.2.1.2.2.1", Range(1, 22), true)));
   ASSERT_TRUE(CreateAndRegisterCell(Cell("ifEntry", "1.3.6.1.2.1.2.2.1", Range(1, 22), true)));
