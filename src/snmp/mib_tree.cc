@@ -298,17 +298,20 @@ std::size_t FirstGap(const std::vector<std::uint32_t>& subIds) {
   return subIds.size();
 }
 
-// A scalar group whose scalars are not consecutive becomes one cell per consecutive run, so that
-// a cell's OID (the OID of the run's last scalar; the last run keeps the OID it was registered
-// with) orders it among the other cells.
+// A scalar group whose scalars are not consecutive becomes one cell per consecutive run. Each
+// run's cell OID is the OID of its last scalar, so that the runs order among themselves and the
+// other cells whichever scalar of the group the host named.
 void RegisterScalarRuns(MibTree& tree, std::unique_ptr<TreeCell> group) {
+  bool split = false;
   for (std::size_t k = FirstGap(group->subIds); k < group->subIds.size();
        k = FirstGap(group->subIds)) {
     std::unique_ptr<TreeCell> run = SliceCell(*group, 0, k + 1);
     run->oid.back() = group->subIds[k];
     RegisterOID(tree, std::move(run));
     group = SliceCell(*group, k + 1, group->subIds.size());
+    split = true;
   }
+  if (split) group->oid.back() = group->subIds.back();
   RegisterOID(tree, std::move(group));
 }
 

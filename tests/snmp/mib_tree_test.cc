@@ -165,6 +165,15 @@ TEST_F(MibTreeTest, ScalarGroupWithSyntaxesSplitsAtGaps) {
   EXPECT_EQ(Lookup(kGetRequest, Append(base, {9, 0}), &code), first->next->next);
   EXPECT_EQ(Lookup(kGetRequest, Append(base, {3, 0}), &code), nullptr);
 
+  // Named by its first scalar, the last run still sorts after the others and answers.
+  TreeCellRegistration byFirst = Cell("byFirst", "1.3.6.1.4.3.1", {1, 2, 5}, false);
+  byFirst.syntaxes = std::vector<std::string>{"a", "b", "c"};
+  ASSERT_TRUE(CreateAndRegisterCell(byFirst));
+  StoreTreeCellsRefInArray();
+  const TreeCell* found = Lookup(kGetRequest, Oid{1, 3, 6, 1, 4, 3, 5, 0}, &code);
+  ASSERT_NE(found, nullptr);
+  EXPECT_EQ(found->subIds, (std::vector<std::uint32_t>{5}));
+
   // Without syntaxes the group stays whole.
   ASSERT_TRUE(CreateAndRegisterCell(Cell("whole", "1.3.6.1.4.2.9", {1, 2, 5}, false)));
   EXPECT_EQ(GetTreeCellByName("whole")->subIds.size(), 3u);

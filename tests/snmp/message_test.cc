@@ -1,0 +1,173 @@
+#include "snmp/message.h"
+
+#include <gtest/gtest.h>
+
+#include "engine/engine_state.h"
+#include "snmp/statistics.h"
+#include "support/snmp_agent_fixture.h"
+
+namespace tessel {
+namespace {
+
+class MessageTest : public SnmpAgentTest {};
+
+Request GetOf(const std::string& oid) {
+  Request request;
+  request.bindings = {{O(oid), VarValue::Empty(kAsnNull)}};
+  return request;
+}
+
+std::uint32_t Count(SnmpCounter counter) { return SnmpCount(counter); }
+
+TEST_F(MessageTest, GetIsAnsweredWithTheFixedHeaderForm) {
+  auto reply = Send(GetOf("1.3.6.1.2.1.1.5.0"));
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->type, kGetResponse);
+  EXPECT_EQ(reply->requestId, 42);
+  ASSERT_EQ(reply->requestVarBinds.size(), 1u);
+  EXPECT_EQ(reply->requestVarBinds[0].value, VarValue::Octets(kAsnOctetString, "r1"));
+  const std::vector<std::uint8_t> expected = {
+      0x30, 0x82, 0x00, 0x2E, 0x02, 0x01, 0x01, 0x04, 0x06, 'p',  'u',  'b',  'l',  'i',
+      'c',  0xA2, 0x82, 0x00, 0x1F, 0x02, 0x01, 0x2A, 0x02, 0x01, 0x00, 0x02, 0x01, 0x00,
+      0x30, 0x82, 0x00, 0x12, 0x30, 0x82, 0x00, 0x0E, 0x06, 0x08, 0x2B, 0x06, 0x01, 0x02,
+      0x01, 0x01, 0x05, 0x00, 0x04, 0x02, 'r',  '1'};
+  EXPECT_EQ(lastReply_, expected);
+  EXPECT_EQ(Count(SnmpCounter::kInMessages), 1u);
+  EXPECT_EQ(Count(SnmpCounter::kV2GetRequests), 1u);
+  EXPECT_EQ(Count(SnmpCounter::kOutResponses), 1u);
+}
+
+TEST_F(MessageTest, RefusedMessagesAreDroppedAndCounted) {
+  Request wrongCommunity = GetOf("1.3.6.1.2.1.1.5.0");
+  wrongCommunity.community = "private";  // a write community is not a read community
+  EXPECT_FALSE(Send(wrongCommunity));
+  EXPECT_EQ(Count(SnmpCounter::kBadCommunityNames), 1u);
+
+  Request trap = GetOf("1.3.6.1.2.1.1.5.0");
+  trap.type = kTrapV2;
+  EXPECT_FALSE(Send(trap));
+  EXPECT_EQ(Count(SnmpCounter::kInTraps), 1u);
+
+  Request bulkInV1 = GetOf("1.3.6.1.2.1.1");
+  bulkInV1.version = kSnmpV1;
+  bulkInV1.type = kGetBulkRequest;
+  EXPECT_FALSE(Send(bulkInV1));
+  Request strayResponse = GetOf("1.3.6.1.2.1.1.5.0");
+  strayResponse.type = kGetResponse;
+  EXPECT_FALSE(Send(strayResponse));
+
+  Request v3 = GetOf("1.3.6.1.2.1.1.5.0");
+  v3.version = kSnmpV3;
+  EXPECT_FALSE(Send(v3));
+  EXPECT_EQ(Count(SnmpCounter::kBadVersions), 1u);
+
+  gv_processV2Only = 1;
+  Request v1 = GetOf("1.3.6.1.2.1.1.5.0");
+  v1.version = kSnmpV1;
+  EXPECT_FALSE(Send(v1));
+  gv_processV2Only = 0;
+  EXPECT_TRUE(Send(v1));
+  EXPECT_EQ(Count(SnmpCounter::kBadVersions), 2u);
+  EXPECT_EQ(Count(SnmpCounter::kDroppedRequests), 6u);
+  EXPECT_EQ(Count(SnmpCounter::kV1Requests), 2u);  // the GetBulk and the Get
+}
+
+TEST_F(MessageTest, SizeLimitAndMalformedInput) {
+  Request big = GetOf("1.3.6.1.2.1.1.5.0");
+  big.type = kSetRequest;
+  big.community = "private";
+  big.bindings[0].second = VarValue::Octets(kAsnOctetString, std::string(19989 - 50, 'x'));
+  std::vector<std::uint8_t> datagram = EncodeRequest(big);
+  std::size_t overhead = datagram.size() - (19989 - 50);
+  big.bindings[0].second.octets.resize(19989 - overhead);
+  datagram = EncodeRequest(big);
+  ASSERT_EQ(datagram.size(), 19989u);
+  EXPECT_TRUE(Exchange(datagram));
+  big.bindings[0].second.octets.push_back('x');
+  EXPECT_FALSE(Send(big));
+  EXPECT_EQ(Count(SnmpCounter::kInTooBigs), 1u);
+
+  // A name of 129 sub-identifiers: 1.3 then 127 times 1.
+  std::vector<std::uint8_t> binding(3 + 131 + 2, 0x01);
+  const std::uint8_t header[] = {0x30, 0x81, 133, 0x06, 0x81, 128, 0x2B};
+  std::copy(std::begin(header), std::end(header), binding.begin());
+  binding[binding.size() - 2] = 0x05;
+  binding[binding.size() - 1] = 0x00;
+  Request longName;
+  longName.rawBindings = {binding};
+  EXPECT_FALSE(Send(longName));
+  // The last sub-identifier 2^32 - 1 is 8F FF FF FF 7F (then the NULL value 05 00); 9F in its
+  // first octet makes it exceed 32 bits.
+  std::vector<std::uint8_t> bad = EncodeRequest(GetOf("1.3.6.1.2.1.1.5.0.4294967295"));
+  ASSERT_EQ(bad[bad.size() - 7], 0x8F);
+  bad[bad.size() - 7] = 0x9F;
+  EXPECT_FALSE(Exchange(bad));
+  EXPECT_EQ(Count(SnmpCounter::kAsnParseErrors), 2u);
+  std::vector<std::uint8_t> valid = EncodeRequest(GetOf("1.3.6.1.2.1.1.5.0"));
+  std::vector<std::uint8_t> truncated(valid.begin(), valid.end() - 3);
+  EXPECT_FALSE(Exchange(truncated));
+  EXPECT_EQ(Count(SnmpCounter::kAsnParseErrors), 3u);
+}
+
+TEST_F(MessageTest, InformIsAcknowledgedWithItsOwnOctets) {
+  Request inform = GetOf("1.3.6.1.2.1.1.3.0");
+  inform.type = kInformRequest;
+  inform.bindings[0].second = VarValue::Unsigned(kAsnTimeTicks, 5);
+  std::vector<std::uint8_t> datagram = EncodeRequest(inform);
+  ASSERT_TRUE(Exchange(datagram));
+  datagram[15] = kGetResponse;
+  EXPECT_EQ(lastReply_, datagram);
+}
+
+TEST_F(MessageTest, ErrorRepliesFollowTheVersion) {
+  Request set;
+  set.type = kSetRequest;
+  set.community = "private";
+  set.bindings = {{O("1.3.6.1.2.1.1.4.0"), VarValue::Octets(kAsnOctetString, "x")},
+                  {O("1.3.6.1.2.1.1.3.0"), VarValue::Unsigned(kAsnTimeTicks, 1)}};
+  auto v2 = Send(set);
+  ASSERT_TRUE(v2);
+  EXPECT_EQ(v2->errorStatus, kNotWritable);
+  EXPECT_EQ(v2->errorIndex, 2);
+  set.version = kSnmpV1;
+  auto v1 = Send(set);
+  ASSERT_TRUE(v1);
+  EXPECT_EQ(v1->errorStatus, kNoSuchName);
+  EXPECT_EQ(v1->errorIndex, 2);
+  ASSERT_EQ(v1->requestVarBinds.size(), 2u);
+  EXPECT_EQ(v1->requestVarBinds[1].value, VarValue::Unsigned(kAsnTimeTicks, 1));
+
+  std::vector<std::int32_t> log = GetErrorLogs();
+  ASSERT_EQ(log.size(), 9u);
+  EXPECT_EQ(log.back(), 2);
+  EXPECT_EQ(log[4], 42);
+  EXPECT_EQ(log[5], kSnmpV1);
+  EXPECT_EQ(log[6], kSetRequest);
+  EXPECT_EQ(log[7], kNotWritable);
+  EXPECT_EQ(GetIpAddrArr(2), (std::vector<std::string>{"127.0.0.9", "127.0.0.9"}));
+}
+
+TEST_F(MessageTest, OversizedRepliesBecomeTooBig) {
+  host_.SetValue("1.3.6.1.2.1.1.1.0", std::string(1200, 'd'));
+  Request get;
+  for (int i = 0; i < 20; ++i) get.bindings.push_back({O("1.3.6.1.2.1.1.1.0"), VarValue::Empty(kAsnNull)});
+  auto v2 = Send(get);
+  ASSERT_TRUE(v2);
+  EXPECT_EQ(v2->errorStatus, kTooBig);
+  EXPECT_TRUE(v2->requestVarBinds.empty());
+  get.version = kSnmpV1;
+  auto v1 = Send(get);
+  ASSERT_TRUE(v1);
+  EXPECT_EQ(v1->errorStatus, kTooBig);
+  EXPECT_EQ(v1->requestVarBinds.size(), 20u);
+}
+
+TEST(ErrorStatusMappingTest, SnmpV2StatusesMapToV1) {
+  const std::pair<std::int32_t, std::int32_t> cases[] = {
+      {0, 0}, {5, 5}, {6, 2}, {11, 2}, {14, 2}, {15, 2}, {16, 2}, {17, 2}, {18, 2},
+      {7, 3}, {8, 3}, {9, 3}, {10, 3}, {12, 3}, {13, 5}, {19, 5}, {-1, 5}};
+  for (auto [v2, v1] : cases) EXPECT_EQ(MapErrorStatusToV1(v2), v1) << v2;
+}
+
+}  // namespace
+}  // namespace tessel

@@ -1,0 +1,194 @@
+#include "snmp/pdu_processing.h"
+
+#include <gtest/gtest.h>
+
+#include "support/snmp_agent_fixture.h"
+
+namespace tessel {
+namespace {
+
+class PduProcessingTest : public SnmpAgentTest {
+ protected:
+  // One GetNext per step from `from`, as a manager's walk does; the names answered.
+  std::vector<std::string> Walk(std::int32_t version, const std::string& from) {
+    std::vector<std::string> names;
+    Oid next = O(from);
+    for (int step = 0; step < 100; ++step) {
+      Request request;
+      request.version = version;
+      request.type = kGetNextRequest;
+      request.bindings = {{next, VarValue::Empty(kAsnNull)}};
+      auto reply = Send(request);
+      if (!reply || reply->errorStatus != 0) break;
+      const VarBind& answer = reply->requestVarBinds.at(0);
+      if (answer.value.type == kEndOfMibView) break;
+      names.push_back(OidToPlainText(answer.name));
+      next = answer.name;
+    }
+    return names;
+  }
+
+  SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions, std::vector<std::string> oids) {
+    Request request;
+    request.type = kGetBulkRequest;
+    request.field1 = nonRepeaters;
+    request.field2 = maxRepetitions;
+    for (const std::string& oid : oids) request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
+    auto reply = Send(request);
+    EXPECT_TRUE(reply);
+    return reply.value_or(SnmpPdu{});
+  }
+};
+
+const std::vector<std::string> kWholeMib = {
+    "1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.1.2.0", "1.3.6.1.2.1.1.3.0", "1.3.6.1.2.1.1.4.0",
+    "1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.1.6.0", "1.3.6.1.2.1.1.7.0", "1.3.6.1.2.1.2.2.1.1.1",
+    "1.3.6.1.2.1.2.2.1.1.2", "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.2.2", "1.3.6.1.2.1.2.2.1.10.1",
+    "1.3.6.1.2.1.2.2.1.10.2", "1.3.6.1.2.1.31.1.1.1.1.1", "1.3.6.1.2.1.31.1.1.1.1.2",
+    "1.3.6.1.2.1.31.1.1.1.6.1", "1.3.6.1.2.1.31.1.1.1.6.2"};
+
+TEST_F(PduProcessingTest, WalkVisitsEveryObjectInOrderAcrossCellsAndColumns) {
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3"), kWholeMib);
+  // SNMPv1 managers never see Counter64 instances.
+  std::vector<std::string> v1(kWholeMib.begin(), kWholeMib.end() - 2);
+  EXPECT_EQ(Walk(kSnmpV1, "1.3"), v1);
+  // Starting points inside, between and below registered objects.
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.1").front(), "1.3.6.1.2.1.1.1.0");
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.1.1").front(), "1.3.6.1.2.1.1.1.0");
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.1.4.0.7").front(), "1.3.6.1.2.1.1.5.0");
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.2.2").front(), "1.3.6.1.2.1.2.2.1.1.1");
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.2.2.1.3").front(), "1.3.6.1.2.1.2.2.1.10.1");
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.2.2.1.2.2").front(), "1.3.6.1.2.1.2.2.1.10.1");
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.2.1.2.3").front(), "1.3.6.1.2.1.31.1.1.1.1.1");
+}
+
+TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
+  Request request;
+  request.type = kGetNextRequest;
+  request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)},
+                      {O("1.3.6.1.2.1.31.1.1.1.6.2"), VarValue::Empty(kAsnNull)}};
+  auto v2 = Send(request);
+  ASSERT_TRUE(v2);
+  EXPECT_EQ(v2->errorStatus, 0);
+  EXPECT_EQ(v2->requestVarBinds[1].value.type, kEndOfMibView);
+  EXPECT_EQ(v2->requestVarBinds[1].name, O("1.3.6.1.2.1.31.1.1.1.6.2"));
+  request.version = kSnmpV1;
+  request.bindings[1].first = O("1.3.6.1.2.1.31.1.1.1.1.2");  // only Counter64 follows
+  auto v1 = Send(request);
+  ASSERT_TRUE(v1);
+  EXPECT_EQ(v1->errorStatus, kNoSuchName);
+  EXPECT_EQ(v1->errorIndex, 2);
+}
+
+TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
+  Request request;
+  request.bindings = {{O("1.3.6.1.2.1.1.3.0"), VarValue::Empty(kAsnNull)},
+                      {O("1.3.6.1.2.1.1.9.0"), VarValue::Empty(kAsnNull)},
+                      {O("1.3.6.1.2.1.2.2.1.2.7"), VarValue::Empty(kAsnNull)},
+                      {O("1.3.6.1.2.1.31.1.1.1.6.1"), VarValue::Empty(kAsnNull)}};
+  auto v2 = Send(request);
+  ASSERT_TRUE(v2);
+  ASSERT_EQ(v2->requestVarBinds.size(), 4u);
+  EXPECT_EQ(v2->requestVarBinds[0].value, VarValue::Unsigned(kAsnTimeTicks, 12345));
+  EXPECT_EQ(v2->requestVarBinds[1].value.type, kNoSuchObject);
+  EXPECT_EQ(v2->requestVarBinds[2].value.type, kNoSuchInstance);
+  EXPECT_EQ(v2->requestVarBinds[3].value, VarValue::Unsigned(kAsnCounter64, 4294967296ull));
+  request.version = kSnmpV1;
+  request.bindings.erase(request.bindings.begin() + 1, request.bindings.begin() + 3);
+  auto v1 = Send(request);
+  ASSERT_TRUE(v1);
+  EXPECT_EQ(v1->errorStatus, kNoSuchName);
+  EXPECT_EQ(v1->errorIndex, 2);
+}
+
+TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
+  TreeCellRegistration hidden;
+  hidden.label = "hidden";
+  hidden.versionText = "V2";
+  hidden.oidText = "1.3.6.1.4.1.5.1";
+  hidden.subIds = {"1", "2"};
+  hidden.dataTypes = {"2", "2"};
+  hidden.access = {"0", "43706"};
+  ASSERT_TRUE(CreateAndRegisterCell(hidden));
+  StoreTreeCellsRefInArray();
+  host_.SetValue("1.3.6.1.4.1.5.1.0", "1");
+  host_.SetValue("1.3.6.1.4.1.5.2.0", "2");
+  Request get;
+  get.bindings = {{O("1.3.6.1.4.1.5.1.0"), VarValue::Empty(kAsnNull)}};
+  EXPECT_EQ(Send(get)->errorStatus, kNoAccess);
+  get.version = kSnmpV1;
+  EXPECT_EQ(Send(get)->errorStatus, kNoSuchName);
+  // A walk steps over the column that is not accessible.
+  EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.4.1.5").front(), "1.3.6.1.4.1.5.2.0");
+
+  Request set;
+  set.type = kSetRequest;
+  set.community = "private";
+  set.bindings = {{O("1.3.6.1.4.1.5.2.0"), VarValue::Integer(9)}};
+  auto written = Send(set);
+  ASSERT_TRUE(written);
+  EXPECT_EQ(written->errorStatus, 0);
+  EXPECT_EQ(written->requestVarBinds[0].value, VarValue::Integer(9));
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.4.1.5.2.0"), "9");
+  host_.SetError("1.3.6.1.4.1.5.2.0", "4");
+  EXPECT_EQ(Send(set)->errorStatus, kBadValue);
+  set.bindings[0].first = O("1.3.6.1.4.1.5.3.0");
+  EXPECT_EQ(Send(set)->errorStatus, kNotWritable);
+}
+
+TEST_F(PduProcessingTest, SetWritesInCellOrderAndStopsAfterAFailure) {
+  TreeCellRegistration writable;
+  writable.label = "writable";
+  writable.versionText = "V2";
+  writable.oidText = "1.3.6.1.4.1.6.1";
+  writable.subIds = {"1", "2"};
+  writable.dataTypes = {"4", "4"};
+  writable.access = {"43706", "43706"};
+  ASSERT_TRUE(CreateAndRegisterCell(writable));
+  StoreTreeCellsRefInArray();
+  host_.SetError("1.3.6.1.4.1.6.2.0", "5");  // the host refuses this one
+  Request set;
+  set.type = kSetRequest;
+  set.community = "private";
+  set.bindings = {{O("1.3.6.1.4.1.6.2.0"), VarValue::Octets(kAsnOctetString, "b")},
+                  {O("1.3.6.1.4.1.6.1.0"), VarValue::Octets(kAsnOctetString, "a")}};
+  auto reply = Send(set);
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->errorStatus, kReadOnly);
+  EXPECT_EQ(reply->errorIndex, 1);
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.4.1.6.1.0"), "");  // never written: it follows the failure
+}
+
+TEST_F(PduProcessingTest, GetBulkRepeatsTheRepeatersAfterTheNonRepeaters) {
+  SnmpPdu reply = Bulk(1, 3, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1", "1.3.6.1.2.1.2.2.1.2"});
+  std::vector<std::string> names;
+  for (const VarBind& binding : reply.requestVarBinds) names.push_back(OidToPlainText(binding.name));
+  EXPECT_EQ(names, (std::vector<std::string>{"1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1", "1.3.6.1.2.1.2.2.1.2.1",
+                                             "1.3.6.1.2.1.2.2.1.1.2", "1.3.6.1.2.1.2.2.1.2.2",
+                                             "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.10.1"}));
+  EXPECT_EQ(Bulk(1, 0, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 1u);
+  EXPECT_EQ(Bulk(-5, -1, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 0u);
+  EXPECT_EQ(Bulk(-5, 2, {"1.3.6.1.2.1.1.1"}).requestVarBinds.size(), 2u);
+  EXPECT_EQ(Bulk(5, 100, {"1.3.6.1.2.1.1.1"}).requestVarBinds.size(), 1u);
+  // Past the end every repeater stops at endOfMibView.
+  SnmpPdu tail = Bulk(0, 50, {"1.3.6.1.2.1.31.1.1.1.6.1"});
+  ASSERT_EQ(tail.requestVarBinds.size(), 2u);
+  EXPECT_EQ(tail.requestVarBinds[1].value.type, kEndOfMibView);
+}
+
+TEST_F(PduProcessingTest, GetBulkReplyIsTrimmedOnlyAtItsEnd) {
+  for (int row = 3; row <= 400; ++row) {
+    host_.SetValue("1.3.6.1.2.1.2.2.1.2." + std::to_string(row), std::string(100, 'd'));
+  }
+  SnmpPdu reply = Bulk(0, 1000000, {"1.3.6.1.2.1.2.2.1.2"});
+  ASSERT_GT(reply.requestVarBinds.size(), 100u);
+  ASSERT_LT(reply.requestVarBinds.size(), 399u);
+  EXPECT_LE(lastReply_.size(), kMaxSnmpMessage);
+  EXPECT_GT(lastReply_.size(), kMaxSnmpMessage - 200);
+  for (std::size_t i = 0; i < reply.requestVarBinds.size(); ++i) {
+    EXPECT_EQ(OidToPlainText(reply.requestVarBinds[i].name), "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
+  }
+}
+
+}  // namespace
+}  // namespace tessel
