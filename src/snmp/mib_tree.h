@@ -86,14 +86,18 @@ struct TreeCellRegistration {
 };
 
 bool CreateAndRegisterCell(const TreeCellRegistration& registration);
+// The handlers registration gives new scalar groups and tables (also applied to the cells already
+// registered); none until set at engine start-up.
+void SetDefaultCellHandlers(ReadHandler scalarRead, WriteHandler scalarWrite, ReadHandler tableRead,
+                            WriteHandler tableWrite);
 // Rebuilds the search array from the ordered list; returns the cell count.
 int StoreTreeCellsRefInArray();
 // Releases every cell and empties the tree.
 void FreeTreeCells();
 int RegisteredCellCount();
 
-// The cell that answers oid for the PDU type, or nullptr with *errorCode set (0 when a missing
-// search array or an unregistered cell ends the search).
+// The cell that answers oid for the PDU type, or nullptr with *errorCode set (noSuchInstance when
+// there is no search array yet; 0 when an unregistered cell ends the search).
 TreeCell* GetTreeCell(std::uint8_t pduType, std::span<const std::uint32_t> oid, std::uint8_t* errorCode);
 bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell, std::span<const std::uint32_t> oid,
                        std::uint8_t* errorCode);
@@ -101,7 +105,8 @@ bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell, std::span<con
 int CompareKey(std::span<const std::uint32_t> a, std::span<const std::uint32_t> b);
 TreeCell* GetTreeCellByName(const std::string& label);
 // The OID text of the cell after the one that answers a GetNext of oidText (".1" appended for a
-// table), or nothing.
+// table), or nothing. Takes the tree itself: not for a thread that holds a MibTreeReadLock (nor
+// GetTreeCellByName and RegisteredCellCount); GetTreeCell and CompareSubIdLists expect one held.
 std::optional<std::string> GetNextGroupOid(const std::string& oidText);
 
 // Shared access to the tree for the span of one request.
