@@ -60,7 +60,8 @@ void CloseSocketLocked(Registry& registry, std::int64_t socket) {
 // gv_maxSocket only ever grows, as the receive loop sizes its socket sets from it.
 void UpdateMaxSocketLocked(Registry& registry) {
   for (const auto& session : registry.sessions) {
-    if (session->transport.socket > registry.maxSocket) registry.maxSocket = session->transport.socket;
+    if (session->transport.socket > registry.maxSocket)
+      registry.maxSocket = session->transport.socket;
   }
 }
 
@@ -112,8 +113,8 @@ std::string StartedText(std::uint16_t port, const std::string& address) {
 
 std::string NotStartedText(std::int32_t port, const std::string& address) {
   char line[512];
-  std::snprintf(line, sizeof line, "Unable to start SNMP Agent at Port : %d and at IpAddress : %s ", port,
-                address.c_str());
+  std::snprintf(line, sizeof line, "Unable to start SNMP Agent at Port : %d and at IpAddress : %s ",
+                port, address.c_str());
   return line;
 }
 
@@ -142,7 +143,8 @@ std::vector<std::string> SplitCommunities(const std::string& list) {
   std::size_t begin = 0;
   for (;;) {
     std::size_t comma = list.find(',', begin);
-    tokens.push_back(list.substr(begin, comma == std::string::npos ? std::string::npos : comma - begin));
+    tokens.push_back(
+        list.substr(begin, comma == std::string::npos ? std::string::npos : comma - begin));
     if (comma == std::string::npos) return tokens;
     begin = comma + 1;
   }

@@ -80,12 +80,14 @@ std::vector<std::int64_t> StartSnmpNetwork(const std::vector<AgentRegistration>&
   LOG_TRACE("\n\t@@@@@ Inside startSnmpNetwork() @@@@@ \n");
   std::vector<std::int64_t> sockets;
   sockets.reserve(agents.size());
-  for (const AgentRegistration& agent : agents) sockets.push_back(FillAgentInfoAndStartAgent(agent));
+  for (const AgentRegistration& agent : agents)
+    sockets.push_back(FillAgentInfoAndStartAgent(agent));
   gv_snmpServiceStarted = 1;
   return sockets;
 }
 
-bool StartAgentAndService(const std::string& address, std::int32_t port, std::uint32_t engineBoots) {
+bool StartAgentAndService(const std::string& address, std::int32_t port,
+                          std::uint32_t engineBoots) {
   if (!StartAgent(address, port, engineBoots)) return false;
   Lifecycle& lifecycle = TheLifecycle();
   std::lock_guard<std::mutex> lock(lifecycle.mutex);

@@ -52,7 +52,8 @@ class LocalFrame {
 // A global reference, released in the thread that drops the last binding holding it.
 class GlobalRef {
  public:
-  GlobalRef(JavaVM* vm, JNIEnv* env, jobject object) : vm_(vm), object_(env->NewGlobalRef(object)) {}
+  GlobalRef(JavaVM* vm, JNIEnv* env, jobject object)
+      : vm_(vm), object_(env->NewGlobalRef(object)) {}
   ~GlobalRef() {
     if (object_ == nullptr) return;
     if (JNIEnv* env = AttachedEnv(vm_)) env->DeleteGlobalRef(object_);
@@ -119,7 +120,8 @@ bool IsPlainAscii(const std::string& text) {
 std::optional<std::string> BytesFromJava(JNIEnv* env, jbyteArray bytes) {
   if (bytes == nullptr) return std::nullopt;
   std::string text(static_cast<std::size_t>(env->GetArrayLength(bytes)), '\0');
-  env->GetByteArrayRegion(bytes, 0, static_cast<jsize>(text.size()), reinterpret_cast<jbyte*>(text.data()));
+  env->GetByteArrayRegion(bytes, 0, static_cast<jsize>(text.size()),
+                          reinterpret_cast<jbyte*>(text.data()));
   env->DeleteLocalRef(bytes);
   return text;
 }
@@ -165,34 +167,44 @@ struct MethodName {
 
 constexpr MethodName kValueMethods[kValueMethodCount] = {
     {"ScalarGetOidVal",
-     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
      "String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
     {"ScalarGetNextOidVal",
-     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
      "String;Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
     {"SetOidVal",
-     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
      "String;Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
     {"TableGetOidVal",
-     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
      "String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
     {"TableGetNextOidVal",
-     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;IIIILjava/lang/String;Ljava/lang/String;IILjava/"
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;IIIILjava/lang/String;Ljava/lang/"
+     "String;IILjava/"
      "lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
     {"TableSetOidVal",
-     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
-     "String;Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/"
-     "String;[Ljava/lang/String;[Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/"
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
+     "String;Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/String;[Ljava/"
+     "lang/"
+     "String;[Ljava/lang/String;[Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/"
+     "lang/"
      "String;"},
 };
 
 // Status methods the handler must have although the engine does not call them.
-constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"}, {"setProgressValue", "(I)V"}};
+constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"},
+                                         {"setProgressValue", "(I)V"}};
 
 }  // namespace
 
 struct SimulatorBinding {
-  SimulatorBinding(JavaVM* vm, JNIEnv* env, jobject simulator) : vm(vm), object(vm, env, simulator) {}
+  SimulatorBinding(JavaVM* vm, JNIEnv* env, jobject simulator)
+      : vm(vm), object(vm, env, simulator) {}
   JavaVM* vm;
   GlobalRef object;
   jmethodID getBytes = nullptr;
@@ -217,7 +229,9 @@ class JavaArguments {
     values_.push_back(value);
     return *this;
   }
-  JavaArguments& Text(const std::optional<std::string>& text) { return text ? Text(*text) : Null(); }
+  JavaArguments& Text(const std::optional<std::string>& text) {
+    return text ? Text(*text) : Null();
+  }
   JavaArguments& Int(std::int32_t number) {
     jvalue value;
     value.i = number;
@@ -232,7 +246,11 @@ class JavaArguments {
   }
   // The trailing arguments every value method ends with.
   JavaArguments& AgentTail(const HostValueQuery& query) {
-    return Int(query.agentId).Int(query.rowStatusColumn).Text(query.agentAddress).Int(query.agentPort).Text(query.syntax);
+    return Int(query.agentId)
+        .Int(query.rowStatusColumn)
+        .Text(query.agentAddress)
+        .Int(query.agentPort)
+        .Text(query.syntax);
   }
   bool Failed() const { return failed_; }
   const jvalue* Values() const { return values_.data(); }
@@ -268,8 +286,10 @@ jstring StringToJava(JNIEnv* env, const std::string& text) {
     env->ExceptionClear();
     return nullptr;
   }
-  env->SetByteArrayRegion(bytes, 0, static_cast<jsize>(text.size()), reinterpret_cast<const jbyte*>(text.data()));
-  auto result = static_cast<jstring>(env->NewObject(strings->stringClass, strings->fromBytes, bytes, strings->utf8));
+  env->SetByteArrayRegion(bytes, 0, static_cast<jsize>(text.size()),
+                          reinterpret_cast<const jbyte*>(text.data()));
+  auto result = static_cast<jstring>(
+      env->NewObject(strings->stringClass, strings->fromBytes, bytes, strings->utf8));
   env->DeleteLocalRef(bytes);
   if (ClearException(env, "StringToJava")) return nullptr;
   return result;
@@ -293,8 +313,10 @@ std::optional<std::vector<std::string>> StringsFromJava(JNIEnv* env, jobjectArra
 
 std::optional<std::vector<std::int32_t>> IntsFromJava(JNIEnv* env, jintArray array) {
   if (array == nullptr) return std::nullopt;
-  std::vector<std::int32_t> values(static_cast<std::size_t>(std::min(env->GetArrayLength(array), kMaxArrayElements)));
-  env->GetIntArrayRegion(array, 0, static_cast<jsize>(values.size()), reinterpret_cast<jint*>(values.data()));
+  std::vector<std::int32_t> values(
+      static_cast<std::size_t>(std::min(env->GetArrayLength(array), kMaxArrayElements)));
+  env->GetIntArrayRegion(array, 0, static_cast<jsize>(values.size()),
+                         reinterpret_cast<jint*>(values.data()));
   return values;
 }
 
@@ -305,7 +327,8 @@ jintArray IntsToJava(JNIEnv* env, std::span<const std::int32_t> values) {
     LOG_ERROR("unable to alloc memory \n");
     return nullptr;
   }
-  env->SetIntArrayRegion(array, 0, static_cast<jsize>(values.size()), reinterpret_cast<const jint*>(values.data()));
+  env->SetIntArrayRegion(array, 0, static_cast<jsize>(values.size()),
+                         reinterpret_cast<const jint*>(values.data()));
   return array;
 }
 
@@ -340,7 +363,8 @@ bool JniHost::BindNetworkSimulator(JNIEnv* env, jobject simulator) {
   jclass type = env->GetObjectClass(simulator);
   jmethodID getBytes = LookUpMethod(env, type, "getBytes", "(Ljava/lang/String;)[B");
   jmethodID printStatus = LookUpMethod(env, type, "printStatus", "(Ljava/lang/String;)V");
-  if (getBytes == nullptr || printStatus == nullptr || LoadJavaStrings(env) == nullptr) return false;
+  if (getBytes == nullptr || printStatus == nullptr || LoadJavaStrings(env) == nullptr)
+    return false;
   auto binding = std::make_shared<SimulatorBinding>(vm, env, simulator);
   binding->getBytes = getBytes;
   binding->printStatus = printStatus;
@@ -360,7 +384,8 @@ bool JniHost::BindSnmpHandler(JNIEnv* env, jobject handler) {
   jclass type = env->GetObjectClass(handler);
   auto binding = std::make_shared<HandlerBinding>(vm, env, handler);
   for (int i = 0; i < kValueMethodCount; ++i) {
-    binding->methods[i] = LookUpMethod(env, type, kValueMethods[i].name, kValueMethods[i].signature);
+    binding->methods[i] =
+        LookUpMethod(env, type, kValueMethods[i].name, kValueMethods[i].signature);
     if (binding->methods[i] == nullptr) return false;
   }
   for (const MethodName& method : kStatusMethods) {
@@ -419,7 +444,8 @@ HostAnswer JniHost::CallValueMethod(int method, Fill fill) {
     JavaArguments arguments(env);
     fill(arguments);
     if (arguments.Failed()) return std::nullopt;
-    jobject answer = env->CallObjectMethodA(handler->object.Get(), handler->methods[method], arguments.Values());
+    jobject answer =
+        env->CallObjectMethodA(handler->object.Get(), handler->methods[method], arguments.Values());
     if (ClearException(env, kValueMethods[method].name)) return std::nullopt;
     return AnswerFromJava(env, static_cast<jobjectArray>(answer));
   } catch (const std::bad_alloc&) {
@@ -459,7 +485,11 @@ HostAnswer JniHost::ScalarGetOidVal(const HostValueQuery& query) {
 
 HostAnswer JniHost::ScalarGetNextOidVal(const HostValueQuery& query) {
   return CallValueMethod(kScalarGetNext, [&](JavaArguments& a) {
-    a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance).Text(query.previousSubId);
+    a.Text(query.label)
+        .Text(query.objectOid)
+        .Text(query.subId)
+        .Text(query.instance)
+        .Text(query.previousSubId);
     a.Text(query.databaseName).Text(query.tableName).Int(query.dataType).AgentTail(query);
   });
 }
@@ -467,7 +497,11 @@ HostAnswer JniHost::ScalarGetNextOidVal(const HostValueQuery& query) {
 HostAnswer JniHost::SetOidVal(const HostValueQuery& query) {
   return CallValueMethod(kScalarSet, [&](JavaArguments& a) {
     a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
-    a.Text(query.databaseName).Text(query.tableName).Text(query.valueText).Int(query.dataType).AgentTail(query);
+    a.Text(query.databaseName)
+        .Text(query.tableName)
+        .Text(query.valueText)
+        .Int(query.dataType)
+        .AgentTail(query);
   });
 }
 

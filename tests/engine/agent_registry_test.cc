@@ -34,7 +34,8 @@ class AgentRegistryTest : public ::testing::Test {
     InstallHost(nullptr);
   }
 
-  static AgentRegistration Agent(const std::string& address, std::uint16_t port, std::int32_t id = 1) {
+  static AgentRegistration Agent(const std::string& address, std::uint16_t port,
+                                 std::int32_t id = 1) {
     AgentRegistration agent;
     agent.agentId = id;
     agent.address = address;
@@ -73,15 +74,17 @@ TEST_F(AgentRegistryTest, StartedAgentIsRegisteredPublishedAndReported) {
   EXPECT_EQ(GetModeInfo("127.0.0.1", "162"), std::nullopt);
   EXPECT_EQ(GetAgentID("127.0.0.1"), 7);
   EXPECT_EQ(GetAgentID("127.0.0.2"), -1);
-  EXPECT_THAT(host_.StatusLines(), ElementsAre("Snmp Agent Started at port : 161 and at IPAddress : 127.0.0.1"));
+  EXPECT_THAT(host_.StatusLines(),
+              ElementsAre("Snmp Agent Started at port : 161 and at IPAddress : 127.0.0.1"));
 }
 
 TEST_F(AgentRegistryTest, AgentThatCannotOpenIsDroppedAndReported) {
   EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.0.0.99", 161)), 0);
   EXPECT_EQ(RegisteredAgentCount(), 0);
   EXPECT_FALSE(LookupAgentByAddress("127.0.0.99"));
-  EXPECT_THAT(host_.StatusLines(),
-              ElementsAre("Unable to start SNMP Agent at Port : 161 and at IpAddress : 127.0.0.99 "));
+  EXPECT_THAT(
+      host_.StatusLines(),
+      ElementsAre("Unable to start SNMP Agent at Port : 161 and at IpAddress : 127.0.0.99 "));
 
   InstallSessionTransport(nullptr, nullptr);
   EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.0.0.1", 161)), 0) << "no transport opens nothing";
@@ -138,8 +141,9 @@ TEST_F(AgentRegistryTest, StartThatCannotOpenRemovesTheAgent) {
   RegisterAgentInfo(Agent("127.0.0.99", 161));
   EXPECT_FALSE(StartAgent("127.0.0.99", 161, 0));
   EXPECT_EQ(RegisteredAgentCount(), 0);
-  EXPECT_THAT(host_.StatusLines(),
-              ElementsAre("Unable to start SNMP Agent at Port : 161 and at IpAddress : 127.0.0.99 "));
+  EXPECT_THAT(
+      host_.StatusLines(),
+      ElementsAre("Unable to start SNMP Agent at Port : 161 and at IpAddress : 127.0.0.99 "));
 }
 
 TEST_F(AgentRegistryTest, TrapPortAvoidsTheAgentPort) {

@@ -62,7 +62,8 @@ TEST_F(EngineTest, BaseLoopHoldsItsThreadUntilTheNetworkStops) {
 }
 
 TEST_F(EngineTest, StopSnmpReleasesAgentsAndTheServiceStartsAgain) {
-  EXPECT_EQ(StartSnmpNetwork({Agent("127.0.0.1"), Agent("127.0.0.2")}), (std::vector<std::int64_t>{50, 51}));
+  EXPECT_EQ(StartSnmpNetwork({Agent("127.0.0.1"), Agent("127.0.0.2")}),
+            (std::vector<std::int64_t>{50, 51}));
   EXPECT_EQ(gv_snmpServiceStarted.load(), 1);
   ASSERT_TRUE(InitSnmpThread());
   gv_virtualIpBase = 140;
@@ -82,7 +83,8 @@ TEST_F(EngineTest, StopSnmpReleasesAgentsAndTheServiceStartsAgain) {
 }
 
 TEST_F(EngineTest, LogFileFollowsTheDebugLevel) {
-  std::filesystem::path directory = std::filesystem::path(testing::TempDir()) / "tessel_engine_test";
+  std::filesystem::path directory =
+      std::filesystem::path(testing::TempDir()) / "tessel_engine_test";
   std::filesystem::remove_all(directory);
   std::filesystem::create_directories(directory);
   std::string quiet = (directory / "quiet.log").string();
