@@ -1,0 +1,141 @@
+// The host bridge against the real Java host classes in an embedded JVM: the value methods'
+// signatures and argument order, texts that are not ASCII, host exceptions, and engine threads
+// that attach on their own and detach when they end.
+#include "engine/jni_host.h"
+
+#include <gtest/gtest.h>
+
+#include <thread>
+
+namespace tessel {
+namespace {
+
+class JniHostTest : public ::testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    std::string classPath = std::string("-Djava.class.path=") + TESSEL_HOST_CLASSPATH;
+    std::string library = std::string("-Dtessel.library=") + TESSEL_LIBRARY;
+    JavaVMOption options[] = {{classPath.data(), nullptr},
+                              {library.data(), nullptr},
+                              {const_cast<char*>("-Xcheck:jni"), nullptr}};
+    JavaVMInitArgs args{JNI_VERSION_1_8, 3, options, JNI_FALSE};
+    void* env = nullptr;
+    ASSERT_EQ(JNI_CreateJavaVM(&vm_, &env, &args), JNI_OK);
+    env_ = static_cast<JNIEnv*>(env);
+    simulator_ = NewObject("com/kestrelon/simulator/tessel/NetworkSimulator");
+    ASSERT_TRUE(JniHost::Instance().BindNetworkSimulator(env_, simulator_));
+  }
+
+  void SetUp() override {
+    ASSERT_TRUE(JniHost::Instance().BindSnmpHandler(env_, NewObject(kHandler)));
+  }
+
+  static jobject NewObject(const char* className) {
+    jclass type = env_->FindClass(className);
+    EXPECT_NE(type, nullptr) << className;
+    jobject object = env_->NewObject(type, env_->GetMethodID(type, "<init>", "()V"));
+    EXPECT_NE(object, nullptr);
+    return env_->NewGlobalRef(object);
+  }
+
+  static jobject ProbeCall(const char* name, const char* signature, jobject argument) {
+    jclass probe = env_->FindClass("com/kestrelon/simulator/tessel/NativeProbe");
+    jobject result = env_->CallStaticObjectMethod(
+        probe, env_->GetStaticMethodID(probe, name, signature), argument);
+    EXPECT_FALSE(env_->ExceptionCheck());
+    return result;
+  }
+
+  static int ThreadsNamed(JNIEnv* env, const char* name) {
+    jclass probe = env->FindClass("com/kestrelon/simulator/tessel/NativeProbe");
+    jmethodID method = env->GetStaticMethodID(probe, "threadsNamed", "(Ljava/lang/String;)I");
+    int count = env->CallStaticIntMethod(probe, method, env->NewStringUTF(name));
+    EXPECT_FALSE(env->ExceptionCheck());
+    return count;
+  }
+
+  static HostValueQuery Scalar(const std::string& subId) {
+    HostValueQuery query;
+    query.label = "system";
+    query.objectOid = ".1.3.6.1.2.1.1";
+    query.subId = subId;
+    query.instance = ".0";
+    return query;
+  }
+
+  static HostValueQuery Column(const std::optional<std::string>& instance,
+                               const std::string& value = "") {
+    HostValueQuery query;
+    query.label = "ifEntry";
+    query.objectOid = ".1.3.6.1.2.1.2.2.1";
+    query.subId = "2";
+    query.column = 2;
+    query.nextColumn = 3;
+    query.instance = instance;
+    query.valueText = value;
+    return query;
+  }
+
+  using Texts = std::vector<std::optional<std::string>>;
+  static constexpr const char* kHandler = "com/kestrelon/simulator/tessel/snmp/SnmpHandler";
+  static inline JavaVM* vm_ = nullptr;
+  static inline JNIEnv* env_ = nullptr;
+  static inline jobject simulator_ = nullptr;
+};
+
+TEST_F(JniHostTest, ScalarValuesCrossAsUtf8Bytes) {
+  JniHost& host = JniHost::Instance();
+  const std::string name = std::string("h\xC3\xA9llo \xE2\x82\xAC", 10) + std::string("\0x", 2);
+  HostValueQuery set = Scalar("5");
+  set.valueText = name;
+  EXPECT_EQ(host.SetOidVal(set), (Texts{name, "-1"}));
+  EXPECT_EQ(host.ScalarGetOidVal(Scalar("5")), (Texts{name, "-1"}));
+  EXPECT_EQ(host.ScalarGetNextOidVal(Scalar("5")), (Texts{name, "-1"}));
+  EXPECT_EQ(host.ScalarGetOidVal(Scalar("6")), std::nullopt);
+
+  host.PrintStatus("\xC3\xA9tat");
+  auto line = static_cast<jstring>(ProbeCall(
+      "lastStatus", "(Lcom/kestrelon/simulator/tessel/NetworkSimulator;)Ljava/lang/String;",
+      simulator_));
+  EXPECT_EQ(host.ToCpp(env_, line), "\xC3\xA9tat");
+}
+
+TEST_F(JniHostTest, TableValuesAreSetAndWalkedInColumnOrder) {
+  JniHost& host = JniHost::Instance();
+  EXPECT_EQ(host.TableSetOidVal(Column(".3", "eth2")), (Texts{"eth2", "-1"}));
+  EXPECT_EQ(host.TableSetOidVal(Column(".1", "eth0")), (Texts{"eth0", "-1"}));
+  EXPECT_EQ(host.TableGetOidVal(Column(".1")), (Texts{"eth0", "-1"}));
+  EXPECT_EQ(host.TableGetNextOidVal(Column(std::nullopt)), (Texts{"eth0", "2.1", "-1"}));
+  EXPECT_EQ(host.TableGetNextOidVal(Column(".1")), (Texts{"eth2", "2.3", "-1"}));
+  EXPECT_EQ(host.TableGetNextOidVal(Column(".3")), std::nullopt);
+}
+
+TEST_F(JniHostTest, HostExceptionIsNoAnswer) {
+  JniHost& host = JniHost::Instance();
+  ASSERT_TRUE(host.BindSnmpHandler(
+      env_, NewObject("com/kestrelon/simulator/tessel/NativeProbe$ThrowingHandler")));
+  EXPECT_EQ(host.ScalarGetOidVal(Scalar("1")), std::nullopt);
+  EXPECT_FALSE(env_->ExceptionCheck());
+  HostValueQuery set = Scalar("1");
+  set.valueText = "still answers";
+  EXPECT_EQ(host.SetOidVal(set), (Texts{"still answers", "-1"}));
+}
+
+TEST_F(JniHostTest, EngineThreadAttachesOnceAndDetachesAtItsEnd) {
+  JniHost& host = JniHost::Instance();
+  HostValueQuery set = Scalar("4");
+  set.valueText = "from a thread";
+  int attachedDuring = -1;
+  std::thread engineThread([&] {
+    host.SetOidVal(set);
+    HostAnswer answer = host.ScalarGetOidVal(Scalar("4"));
+    EXPECT_EQ(answer, (Texts{"from a thread", "-1"}));
+    attachedDuring = ThreadsNamed(AttachedEnv(vm_), "tessel-engine");
+  });
+  engineThread.join();
+  EXPECT_EQ(attachedDuring, 1) << "two calls, one attachment";
+  EXPECT_EQ(ThreadsNamed(env_, "tessel-engine"), 0);
+}
+
+}  // namespace
+}  // namespace tessel

@@ -1,0 +1,353 @@
+#include "engine/agent_registry.h"
+
+#include <cstdio>
+#include <memory>
+#include <mutex>
+#include <new>
+#include <unordered_map>
+#include <utility>
+
+#include "base/clock.h"
+#include "base/conversions.h"
+#include "engine/engine_state.h"
+#include "engine/log.h"
+
+namespace tessel {
+namespace {
+
+constexpr std::size_t kAgentKeyLength = 47;
+
+// One mutex guards the ordered session list, the address table and the socket bookkeeping.
+// The transport's opener and closer run under it, so they must not call back into the registry.
+struct Registry {
+  std::mutex mutex;
+  std::vector<std::unique_ptr<AgentSession>> sessions;  // registration order
+  std::unordered_map<std::string, AgentSession> addressTable;
+  SessionOpener opener;
+  SessionCloser closer;
+  std::int64_t maxSocket = 0;
+};
+
+Registry& TheRegistry() {
+  static Registry registry;
+  return registry;
+}
+
+std::uint16_t StoredPort(std::int32_t configuredPort) {
+  return static_cast<std::uint16_t>(static_cast<std::uint32_t>(configuredPort) - 1u);
+}
+
+// The notification socket must never share the port of an agent.
+void ApplyTrapPortRule(std::uint16_t port) {
+  std::uint16_t trapPort = gv_trapPort.load();
+  if (trapPort == port || trapPort == 0) gv_trapPort = static_cast<std::uint16_t>(port + 1u);
+}
+
+std::string AgentKey(const std::string& address, std::uint16_t port) {
+  std::string key = address + "#" + std::to_string(port);
+  if (key.size() > kAgentKeyLength) key.resize(kAgentKeyLength);
+  return key;
+}
+
+std::int64_t OpenSessionLocked(Registry& registry, AgentSession& session) {
+  return registry.opener ? registry.opener(session) : 0;
+}
+
+void CloseSocketLocked(Registry& registry, std::int64_t socket) {
+  if (socket != 0 && registry.closer) registry.closer(socket);
+}
+
+// gv_maxSocket only ever grows, as the receive loop sizes its socket sets from it.
+void UpdateMaxSocketLocked(Registry& registry) {
+  for (const auto& session : registry.sessions) {
+    if (session->transport.socket > registry.maxSocket)
+      registry.maxSocket = session->transport.socket;
+  }
+}
+
+std::vector<std::unique_ptr<AgentSession>>::iterator FindSessionLocked(Registry& registry,
+                                                                       const std::string& address,
+                                                                       std::int32_t port) {
+  std::uint16_t storedPort = StoredPort(port);
+  for (auto it = registry.sessions.begin(); it != registry.sessions.end(); ++it) {
+    const TransportDomainInfo& transport = (*it)->transport;
+    if (transport.localAddress == address && transport.localPort == storedPort) return it;
+  }
+  return registry.sessions.end();
+}
+
+// The records shared by both ways of registering an agent; communities are left to the caller.
+std::unique_ptr<AgentSession> NewSession(const AgentRegistration& registration) {
+  auto session = std::make_unique<AgentSession>();
+  session->transport.isIPv6 = registration.ipv6Flag;
+  session->transport.localAddress = registration.address;
+  ApplyTrapPortRule(registration.port);
+  session->transport.localPort = StoredPort(registration.port);
+  gv_snmpPort = registration.port;
+  auto info = std::make_shared<AgentInfo>();
+  info->databaseName = registration.databaseName;
+  info->tableName = registration.tableName;
+  info->agentId = registration.agentId;
+  info->startTime = GetCurrentSeconds();
+  info->agentKey = AgentKey(registration.address, registration.port);
+  session->agentInfo = std::move(info);
+  return session;
+}
+
+void AppendSplit(CommunityList& list, const std::vector<std::string>& lists) {
+  for (const std::string& text : lists) {
+    for (std::string& token : SplitCommunities(text)) list.Append(std::move(token));
+  }
+}
+
+void AppendEach(CommunityList& list, const std::vector<std::string>& communities) {
+  for (const std::string& community : communities) list.Append(community);
+}
+
+std::string StartedText(std::uint16_t port, const std::string& address) {
+  char line[512];
+  std::snprintf(line, sizeof line, "Snmp Agent Started at port : %d and at IPAddress : %s", port,
+                address.c_str());
+  return line;
+}
+
+std::string NotStartedText(std::int32_t port, const std::string& address) {
+  char line[512];
+  std::snprintf(line, sizeof line, "Unable to start SNMP Agent at Port : %d and at IpAddress : %s ",
+                port, address.c_str());
+  return line;
+}
+
+// Stores the session's socket and publishes it; returns the socket (0: not opened, the agent
+// then leaves the address table and is not kept).
+std::int64_t OpenAndKeepLocked(Registry& registry, std::unique_ptr<AgentSession> session) {
+  const std::string address = session->transport.localAddress;
+  registry.addressTable.insert_or_assign(address, CopyAgentSession(*session));
+  std::int64_t socket = OpenSessionLocked(registry, *session);
+  if (socket == 0) {
+    registry.addressTable.erase(address);
+    return 0;
+  }
+  session->socket = socket;
+  session->transport.socket = socket;
+  registry.addressTable.insert_or_assign(address, CopyAgentSession(*session));
+  registry.sessions.push_back(std::move(session));
+  UpdateMaxSocketLocked(registry);
+  return socket;
+}
+
+}  // namespace
+
+std::vector<std::string> SplitCommunities(const std::string& list) {
+  std::vector<std::string> tokens;
+  std::size_t begin = 0;
+  for (;;) {
+    std::size_t comma = list.find(',', begin);
+    tokens.push_back(
+        list.substr(begin, comma == std::string::npos ? std::string::npos : comma - begin));
+    if (comma == std::string::npos) return tokens;
+    begin = comma + 1;
+  }
+}
+
+void InstallSessionTransport(SessionOpener opener, SessionCloser closer) {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  registry.opener = std::move(opener);
+  registry.closer = std::move(closer);
+}
+
+std::int64_t FillAgentInfoAndStartAgent(const AgentRegistration& registration) {
+  LOG_TRACE("\n\t@@@@@ Inside FillAgentInfoAndStartAgent() @@@@@ \n");
+  std::int64_t socket = 0;
+  try {
+    std::unique_ptr<AgentSession> session = NewSession(registration);
+    AgentInfo& info = *session->agentInfo;
+    AppendSplit(info.readCommunities, registration.readCommunities);
+    AppendSplit(info.writeCommunities, registration.writeCommunities);
+    info.engineBoots = registration.engineBoots;
+    info.started = 1;
+    Registry& registry = TheRegistry();
+    std::lock_guard<std::mutex> lock(registry.mutex);
+    socket = OpenAndKeepLocked(registry, std::move(session));
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("Memory allocation failure ...\n");
+    return -1;
+  }
+  PrintStatus(socket != 0 ? StartedText(registration.port, registration.address)
+                          : NotStartedText(registration.port, registration.address));
+  return socket;
+}
+
+std::int32_t RegisterAgentInfo(const AgentRegistration& registration) {
+  LOG_TRACE("### Inside nativePassOneAgentInfo \n");
+  try {
+    std::unique_ptr<AgentSession> session = NewSession(registration);
+    AppendEach(session->agentInfo->readCommunities, registration.readCommunities);
+    AppendEach(session->agentInfo->writeCommunities, registration.writeCommunities);
+    Registry& registry = TheRegistry();
+    std::lock_guard<std::mutex> lock(registry.mutex);
+    registry.addressTable.insert_or_assign(registration.address, CopyAgentSession(*session));
+    registry.sessions.push_back(std::move(session));
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("Memory allocation failure ...\n");
+    return -1;
+  }
+  return registration.agentId;
+}
+
+bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t engineBoots) {
+  LOG_TRACE("\n\t@@@@@ Inside StartAgent() @@@@@ \n");
+  Registry& registry = TheRegistry();
+  {
+    std::lock_guard<std::mutex> lock(registry.mutex);
+    if (registry.sessions.empty()) return false;
+    ApplyTrapPortRule(static_cast<std::uint16_t>(port));
+    auto found = FindSessionLocked(registry, address, port);
+    if (found == registry.sessions.end()) {
+      LOG_TRACE("The td Info cannot be obtained for %s\n", address.c_str());
+      return false;
+    }
+    AgentSession& session = **found;
+    std::int64_t socket = OpenSessionLocked(registry, session);
+    if (socket != 0) {
+      // A second start replaces the agent's socket; the one it replaces would otherwise leak.
+      if (session.agentInfo->started.load()) CloseSocketLocked(registry, session.socket);
+      session.socket = socket;
+      session.transport.socket = socket;
+      session.agentInfo->started = 1;
+      session.agentInfo->engineBoots = engineBoots;
+      LOG_TRACE("The engine boot count value @ start is : %ld\n", static_cast<long>(engineBoots));
+      UpdateMaxSocketLocked(registry);
+      return true;
+    }
+    session.agentInfo->started = 0;
+    registry.sessions.erase(found);
+  }
+  PrintStatus(NotStartedText(port, address));
+  return false;
+}
+
+bool StopAgent(const std::string& address, std::int32_t port) {
+  LOG_TRACE("\n\t@@@@@ Inside StopAgent() @@@@@ \n");
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  if (registry.sessions.empty()) return false;
+  ApplyTrapPortRule(static_cast<std::uint16_t>(port));
+  auto found = FindSessionLocked(registry, address, port);
+  if (found == registry.sessions.end()) {
+    LOG_ERROR("The tdInfo cannot be obtained for %s while stop agent\n", address.c_str());
+    return false;
+  }
+  if ((*found)->agentInfo->started.load()) {
+    (*found)->agentInfo->started = 0;
+    CloseSocketLocked(registry, (*found)->socket);
+    registry.sessions.erase(found);
+    UpdateMaxSocketLocked(registry);
+  }
+  registry.addressTable.erase(address);
+  return true;
+}
+
+bool RestartAgent(std::int32_t index) {
+  LOG_TRACE("\n\t@@@@@ Inside RestartAgent() @@@@@ \n");
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  if (index < 0 || static_cast<std::size_t>(index) >= registry.sessions.size()) return false;
+  AgentSession& session = *registry.sessions[static_cast<std::size_t>(index)];
+  if (session.agentInfo->started.load()) return true;
+  std::int64_t socket = OpenSessionLocked(registry, session);
+  if (socket != 0) {
+    session.socket = socket;
+    session.transport.socket = socket;
+    session.agentInfo->started = 1;
+    UpdateMaxSocketLocked(registry);
+  }
+  return true;
+}
+
+void SetCommunitiesValue(const std::string& address, const std::vector<std::string>& read,
+                         const std::vector<std::string>& write, std::int32_t mode) {
+  LOG_TRACE("\n\t@@@@@ Inside setCommunitiesValue() @@@@@ \n");
+  std::shared_ptr<AgentInfo> info;
+  {
+    Registry& registry = TheRegistry();
+    std::lock_guard<std::mutex> lock(registry.mutex);
+    auto found = registry.addressTable.find(address);
+    if (found == registry.addressTable.end()) return;
+    info = found->second.agentInfo;
+  }
+  try {
+    if (mode == 1 || mode == 3) AppendSplit(info->readCommunities, read);
+    if (mode == 2 || mode == 3) AppendSplit(info->writeCommunities, write);
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("Unable to assign the readCommunity ...\n");
+  }
+}
+
+std::optional<AgentSession> LookupAgentByAddress(const std::string& address) {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  auto found = registry.addressTable.find(address);
+  if (found == registry.addressTable.end()) return std::nullopt;
+  return CopyAgentSession(found->second);
+}
+
+std::optional<AgentSession> FindAgentSession(const std::string& address, std::int32_t port) {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  auto found = FindSessionLocked(registry, address, port);
+  if (found == registry.sessions.end()) return std::nullopt;
+  return CopyAgentSession(**found);
+}
+
+std::int32_t RegisteredAgentCount() {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  return static_cast<std::int32_t>(registry.sessions.size());
+}
+
+std::vector<AgentSession> RegisteredAgents() {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  std::vector<AgentSession> copies;
+  copies.reserve(registry.sessions.size());
+  for (const auto& session : registry.sessions) copies.push_back(CopyAgentSession(*session));
+  return copies;
+}
+
+std::int64_t MaxSocket() {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  return registry.maxSocket;
+}
+
+std::optional<std::string> GetModeInfo(const std::string& address, const std::string& port) {
+  std::optional<AgentSession> session = LookupAgentByAddress(address);
+  if (!session || session->transport.localAddress != address ||
+      session->transport.localPort != StoredPort(TextToInt(port))) {
+    return std::nullopt;
+  }
+  return session->agentInfo->databaseName + ":" + session->agentInfo->tableName;
+}
+
+std::int32_t GetAgentID(const std::string& address) {
+  std::optional<AgentSession> session = LookupAgentByAddress(address);
+  return session ? session->agentInfo->agentId : -1;
+}
+
+void FreeSimulatorResources() {
+  LOG_TRACE("\n\t@@@@@ Inside FreeSimulatorResources() @@@@@ \n");
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  for (const auto& session : registry.sessions) {
+    if (session->agentInfo->started.load()) {
+      session->agentInfo->started = 0;
+      CloseSocketLocked(registry, session->socket);
+    }
+  }
+  registry.sessions.clear();
+  registry.addressTable.clear();
+}
+
+}  // namespace tessel

@@ -1,0 +1,134 @@
+#include "engine/engine.h"
+
+#include <mutex>
+
+#include "base/stop_signal.h"
+#include "engine/engine_state.h"
+#include "engine/log.h"
+#include "snmp/mib_tree.h"
+#include "snmp/service.h"
+
+namespace tessel {
+namespace {
+
+struct Lifecycle {
+  std::mutex mutex;              // serialises the lifecycle calls
+  bool servicesRunning = false;  // InitSnmpGeneralServices ran and was not stopped since
+  StopSignal baseLoopStop;
+};
+
+Lifecycle& TheLifecycle() {
+  static Lifecycle lifecycle;
+  return lifecycle;
+}
+
+// The service may already run: startSnmpNetwork marks it started before initSnmpThread.
+bool StartServicesLocked(Lifecycle& lifecycle) {
+  if (!lifecycle.servicesRunning) {
+    if (!InitSnmpGeneralServices()) return false;
+    lifecycle.servicesRunning = true;
+  }
+  StoreTreeCellsRefInArray();
+  gv_snmpServiceStarted = 1;
+  return true;
+}
+
+void StopSnmpLocked(Lifecycle& lifecycle) {
+  if (lifecycle.servicesRunning) {
+    StopSnmpGeneralServices();
+    lifecycle.servicesRunning = false;
+  }
+  if (gv_snmpServiceStarted.load() == 0) return;
+  FreeSimulatorResources();
+  FreeTreeCells();
+}
+
+}  // namespace
+
+// Status lines are printed outside the lifecycle lock: the host's printStatus may call back.
+bool InitAgentParams(const EngineParams& params) {
+  Lifecycle& lifecycle = TheLifecycle();
+  bool opened = false;
+  {
+    std::lock_guard<std::mutex> lock(lifecycle.mutex);
+    SetConsoleMode(params.consoleMode);
+    lifecycle.baseLoopStop.Arm();
+    gv_snmpv3Configured = false;
+    opened = OpenEngineLog({params.debugLevel, params.logFilePath, params.maxLogFileSize});
+  }
+  if (!opened) {
+    PrintStatus("Error in opening the Log file : " + params.logFilePath);
+    return false;
+  }
+  LOG_TRACE("\n\t@@@@@ Inside nativeInitAgentParams() @@@@@ \n");
+  return true;
+}
+
+void InitAgentRegistry() {
+  LOG_TRACE("\n\t@@@@@ Inside jniJVMparams() @@@@@ \n");
+  FreeSimulatorResources();
+}
+
+bool InitSnmpThread() {
+  LOG_TRACE("\n\t@@@@@ Inside initSnmpThread() @@@@@ \n");
+  Lifecycle& lifecycle = TheLifecycle();
+  std::lock_guard<std::mutex> lock(lifecycle.mutex);
+  return StartServicesLocked(lifecycle);
+}
+
+std::vector<std::int64_t> StartSnmpNetwork(const std::vector<AgentRegistration>& agents) {
+  LOG_TRACE("\n\t@@@@@ Inside startSnmpNetwork() @@@@@ \n");
+  std::vector<std::int64_t> sockets;
+  sockets.reserve(agents.size());
+  for (const AgentRegistration& agent : agents)
+    sockets.push_back(FillAgentInfoAndStartAgent(agent));
+  gv_snmpServiceStarted = 1;
+  return sockets;
+}
+
+bool StartAgentAndService(const std::string& address, std::int32_t port,
+                          std::uint32_t engineBoots) {
+  if (!StartAgent(address, port, engineBoots)) return false;
+  Lifecycle& lifecycle = TheLifecycle();
+  std::lock_guard<std::mutex> lock(lifecycle.mutex);
+  if (gv_snmpServiceStarted.load() == 0) StartServicesLocked(lifecycle);
+  return true;
+}
+
+void BaseLoop() {
+  LOG_TRACE("\n\t@@@@@ Inside BaseLoop() @@@@@ \n");
+  TheLifecycle().baseLoopStop.Wait();
+}
+
+bool AdapterJniStopSnmp() {
+  LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopSnmp() @@@@@ \n");
+  Lifecycle& lifecycle = TheLifecycle();
+  {
+    std::lock_guard<std::mutex> lock(lifecycle.mutex);
+    StopSnmpLocked(lifecycle);
+    gv_virtualIpBase = 100;
+    gv_snmpServiceStarted = 0;
+  }
+  LOG_TRACE("SNMP resources cleared Successfully\n");
+  PrintStatus("SNMP resources cleared Successfully");
+  return true;
+}
+
+bool AdapterJniStopNetwork() {
+  LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopNetwork() @@@@@ \n");
+  Lifecycle& lifecycle = TheLifecycle();
+  {
+    std::lock_guard<std::mutex> lock(lifecycle.mutex);
+    StopSnmpLocked(lifecycle);
+    gv_virtualIpBase = 100;
+    gv_snmpServiceStarted = 0;
+  }
+  LOG_TRACE("Network resources cleared Successfully\n");
+  PrintStatus("Network resources cleared Successfully");
+  std::lock_guard<std::mutex> lock(lifecycle.mutex);
+  CloseEngineLog();
+  lifecycle.baseLoopStop.Stop();
+  return true;
+}
+
+}  // namespace tessel

@@ -1,0 +1,529 @@
+#include "engine/jni_host.h"
+
+#include <algorithm>
+#include <new>
+
+#include "engine/log.h"
+
+namespace tessel {
+namespace {
+
+constexpr jint kJniVersion = JNI_VERSION_1_8;
+constexpr jsize kMaxArrayElements = 65535;
+constexpr jint kFrameCapacity = 64;
+
+// Detaches, when the thread ends, a thread that AttachedEnv attached; threads the host attached
+// itself are left alone.
+struct AttachGuard {
+  JavaVM* attachedTo = nullptr;
+  ~AttachGuard() {
+    if (attachedTo != nullptr) attachedTo->DetachCurrentThread();
+  }
+};
+thread_local AttachGuard attachGuard;
+
+// True when the host raised an exception, which is then described (debug levels 2 and 3) and
+// cleared.
+bool ClearException(JNIEnv* env, const char* where) {
+  if (!env->ExceptionCheck()) return false;
+  LOG_ERROR("Exception occured in %s ...\n", where);
+  if (LogEnabled(kLogError)) env->ExceptionDescribe();
+  env->ExceptionClear();
+  return true;
+}
+
+class LocalFrame {
+ public:
+  explicit LocalFrame(JNIEnv* env) : env_(env), pushed_(env->PushLocalFrame(kFrameCapacity) == 0) {
+    if (!pushed_) env_->ExceptionClear();
+  }
+  ~LocalFrame() {
+    if (pushed_) env_->PopLocalFrame(nullptr);
+  }
+  LocalFrame(const LocalFrame&) = delete;
+  LocalFrame& operator=(const LocalFrame&) = delete;
+  bool Pushed() const { return pushed_; }
+
+ private:
+  JNIEnv* env_;
+  bool pushed_;
+};
+
+// A global reference, released in the thread that drops the last binding holding it.
+class GlobalRef {
+ public:
+  GlobalRef(JavaVM* vm, JNIEnv* env, jobject object)
+      : vm_(vm), object_(env->NewGlobalRef(object)) {}
+  ~GlobalRef() {
+    if (object_ == nullptr) return;
+    if (JNIEnv* env = AttachedEnv(vm_)) env->DeleteGlobalRef(object_);
+  }
+  GlobalRef(const GlobalRef&) = delete;
+  GlobalRef& operator=(const GlobalRef&) = delete;
+  jobject Get() const { return object_; }
+
+ private:
+  JavaVM* vm_;
+  jobject object_;
+};
+
+jmethodID LookUpMethod(JNIEnv* env, jclass type, const char* name, const char* signature) {
+  jmethodID method = env->GetMethodID(type, name, signature);
+  if (method == nullptr) {
+    env->ExceptionClear();
+    LOG_ERROR("unable to find method:%s\n", name);
+  }
+  return method;
+}
+
+// java.lang.String's UTF-8 encoder and decoder. The class never unloads, so they are looked up
+// once for the life of the process.
+struct JavaStrings {
+  jclass stringClass = nullptr;
+  jmethodID fromBytes = nullptr;  // String(byte[], String charsetName)
+  jmethodID toBytes = nullptr;    // String.getBytes(String charsetName)
+  jstring utf8 = nullptr;
+};
+
+const JavaStrings* LoadJavaStrings(JNIEnv* env) {
+  static std::mutex mutex;
+  static JavaStrings strings;
+  static bool loaded = false;
+  std::lock_guard<std::mutex> lock(mutex);
+  if (loaded) return &strings;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return nullptr;
+  jclass type = env->FindClass("java/lang/String");
+  if (type == nullptr) {
+    env->ExceptionClear();
+    LOG_ERROR("unable to find class String \n");
+    return nullptr;
+  }
+  jmethodID fromBytes = LookUpMethod(env, type, "<init>", "([BLjava/lang/String;)V");
+  jmethodID toBytes = LookUpMethod(env, type, "getBytes", "(Ljava/lang/String;)[B");
+  jstring utf8 = env->NewStringUTF("UTF-8");
+  if (fromBytes == nullptr || toBytes == nullptr || utf8 == nullptr) {
+    env->ExceptionClear();
+    return nullptr;
+  }
+  strings = {static_cast<jclass>(env->NewGlobalRef(type)), fromBytes, toBytes,
+             static_cast<jstring>(env->NewGlobalRef(utf8))};
+  loaded = strings.stringClass != nullptr && strings.utf8 != nullptr;
+  return loaded ? &strings : nullptr;
+}
+
+bool IsPlainAscii(const std::string& text) {
+  return std::all_of(text.begin(), text.end(), [](char c) { return c > 0; });
+}
+
+// Copies a byte[] (local reference, deleted here) into a string.
+std::optional<std::string> BytesFromJava(JNIEnv* env, jbyteArray bytes) {
+  if (bytes == nullptr) return std::nullopt;
+  std::string text(static_cast<std::size_t>(env->GetArrayLength(bytes)), '\0');
+  env->GetByteArrayRegion(bytes, 0, static_cast<jsize>(text.size()),
+                          reinterpret_cast<jbyte*>(text.data()));
+  env->DeleteLocalRef(bytes);
+  return text;
+}
+
+// Runs body with element i of array as a local reference that is dropped afterwards.
+template <typename Body>
+bool ForEachElement(JNIEnv* env, jobjectArray array, Body body) {
+  jsize count = std::min(env->GetArrayLength(array), kMaxArrayElements);
+  for (jsize i = 0; i < count; ++i) {
+    jobject element = env->GetObjectArrayElement(array, i);
+    bool ok = body(element);
+    if (element != nullptr) env->DeleteLocalRef(element);
+    if (!ok) return false;
+  }
+  return true;
+}
+
+template <typename T>
+class NoDestructor {
+ public:
+  NoDestructor() { new (storage_) T(); }
+  T& Get() { return *std::launder(reinterpret_cast<T*>(storage_)); }
+
+ private:
+  alignas(T) unsigned char storage_[sizeof(T)];
+};
+
+// Value methods of the SNMP handler, in the order of kValueMethods.
+enum ValueMethod : int {
+  kScalarGet,
+  kScalarGetNext,
+  kScalarSet,
+  kTableGet,
+  kTableGetNext,
+  kTableSet,
+  kValueMethodCount
+};
+
+struct MethodName {
+  const char* name;
+  const char* signature;
+};
+
+constexpr MethodName kValueMethods[kValueMethodCount] = {
+    {"ScalarGetOidVal",
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
+     "String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
+    {"ScalarGetNextOidVal",
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
+     "String;Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
+    {"SetOidVal",
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
+     "String;Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
+    {"TableGetOidVal",
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
+     "String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
+    {"TableGetNextOidVal",
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;IIIILjava/lang/String;Ljava/lang/"
+     "String;IILjava/"
+     "lang/String;ILjava/lang/String;)[Ljava/lang/String;"},
+    {"TableSetOidVal",
+     "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/"
+     "String;Ljava/lang/"
+     "String;Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/String;[Ljava/lang/String;[Ljava/"
+     "lang/"
+     "String;[Ljava/lang/String;[Ljava/lang/String;IIILjava/lang/String;ILjava/lang/String;)[Ljava/"
+     "lang/"
+     "String;"},
+};
+
+// Status methods the handler must have although the engine does not call them.
+constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"},
+                                         {"setProgressValue", "(I)V"}};
+
+}  // namespace
+
+struct SimulatorBinding {
+  SimulatorBinding(JavaVM* vm, JNIEnv* env, jobject simulator)
+      : vm(vm), object(vm, env, simulator) {}
+  JavaVM* vm;
+  GlobalRef object;
+  jmethodID getBytes = nullptr;
+  jmethodID printStatus = nullptr;
+};
+
+struct HandlerBinding {
+  HandlerBinding(JavaVM* vm, JNIEnv* env, jobject handler) : vm(vm), object(vm, env, handler) {}
+  JavaVM* vm;
+  GlobalRef object;
+  jmethodID methods[kValueMethodCount] = {};
+};
+
+// The arguments of one value call, converted in the caller's local frame.
+class JavaArguments {
+ public:
+  explicit JavaArguments(JNIEnv* env) : env_(env) {}
+  JavaArguments& Text(const std::string& text) {
+    jvalue value;
+    value.l = StringToJava(env_, text);
+    failed_ = failed_ || value.l == nullptr;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Text(const std::optional<std::string>& text) {
+    return text ? Text(*text) : Null();
+  }
+  JavaArguments& Int(std::int32_t number) {
+    jvalue value;
+    value.i = number;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Null() {
+    jvalue value;
+    value.l = nullptr;
+    values_.push_back(value);
+    return *this;
+  }
+  // The trailing arguments every value method ends with.
+  JavaArguments& AgentTail(const HostValueQuery& query) {
+    return Int(query.agentId)
+        .Int(query.rowStatusColumn)
+        .Text(query.agentAddress)
+        .Int(query.agentPort)
+        .Text(query.syntax);
+  }
+  bool Failed() const { return failed_; }
+  const jvalue* Values() const { return values_.data(); }
+
+ private:
+  JNIEnv* env_;
+  std::vector<jvalue> values_;
+  bool failed_ = false;
+};
+
+JNIEnv* AttachedEnv(JavaVM* vm) {
+  void* env = nullptr;
+  jint status = vm->GetEnv(&env, kJniVersion);
+  if (status == JNI_OK) return static_cast<JNIEnv*>(env);
+  if (status != JNI_EDETACHED) return nullptr;
+  char name[] = "tessel-engine";
+  JavaVMAttachArgs args{kJniVersion, name, nullptr};
+  if (vm->AttachCurrentThreadAsDaemon(&env, &args) != JNI_OK) return nullptr;
+  attachGuard.attachedTo = vm;
+  return static_cast<JNIEnv*>(env);
+}
+
+jstring StringToJava(JNIEnv* env, const std::string& text) {
+  if (IsPlainAscii(text)) {
+    jstring result = env->NewStringUTF(text.c_str());
+    if (result == nullptr) env->ExceptionClear();
+    return result;
+  }
+  const JavaStrings* strings = LoadJavaStrings(env);
+  if (strings == nullptr) return nullptr;
+  jbyteArray bytes = env->NewByteArray(static_cast<jsize>(text.size()));
+  if (bytes == nullptr) {
+    env->ExceptionClear();
+    return nullptr;
+  }
+  env->SetByteArrayRegion(bytes, 0, static_cast<jsize>(text.size()),
+                          reinterpret_cast<const jbyte*>(text.data()));
+  auto result = static_cast<jstring>(
+      env->NewObject(strings->stringClass, strings->fromBytes, bytes, strings->utf8));
+  env->DeleteLocalRef(bytes);
+  if (ClearException(env, "StringToJava")) return nullptr;
+  return result;
+}
+
+std::optional<std::vector<std::string>> StringsFromJava(JNIEnv* env, jobjectArray array) {
+  if (array == nullptr) return std::nullopt;
+  std::vector<std::string> texts;
+  bool ok = ForEachElement(env, array, [&](jobject element) {
+    if (element == nullptr) {
+      texts.emplace_back();
+      return true;
+    }
+    std::optional<std::string> text = JniHost::Instance().ToCpp(env, static_cast<jstring>(element));
+    if (text) texts.push_back(std::move(*text));
+    return text.has_value();
+  });
+  if (!ok) return std::nullopt;
+  return texts;
+}
+
+std::optional<std::vector<std::int32_t>> IntsFromJava(JNIEnv* env, jintArray array) {
+  if (array == nullptr) return std::nullopt;
+  std::vector<std::int32_t> values(
+      static_cast<std::size_t>(std::min(env->GetArrayLength(array), kMaxArrayElements)));
+  env->GetIntArrayRegion(array, 0, static_cast<jsize>(values.size()),
+                         reinterpret_cast<jint*>(values.data()));
+  return values;
+}
+
+jintArray IntsToJava(JNIEnv* env, std::span<const std::int32_t> values) {
+  jintArray array = env->NewIntArray(static_cast<jsize>(values.size()));
+  if (array == nullptr) {
+    env->ExceptionClear();
+    LOG_ERROR("unable to alloc memory \n");
+    return nullptr;
+  }
+  env->SetIntArrayRegion(array, 0, static_cast<jsize>(values.size()),
+                         reinterpret_cast<const jint*>(values.data()));
+  return array;
+}
+
+jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size) {
+  const JavaStrings* strings = LoadJavaStrings(env);
+  if (strings == nullptr) return nullptr;
+  jobjectArray array = env->NewObjectArray(static_cast<jsize>(size), strings->stringClass, nullptr);
+  if (array == nullptr) {
+    env->ExceptionClear();
+    LOG_ERROR("unable to alloc memory \n");
+    return nullptr;
+  }
+  for (std::size_t i = 0; i < texts.size() && i < size; ++i) {
+    jstring text = StringToJava(env, texts[i]);
+    if (text == nullptr) return nullptr;
+    env->SetObjectArrayElement(array, static_cast<jsize>(i), text);
+    env->DeleteLocalRef(text);
+  }
+  return array;
+}
+
+JniHost& JniHost::Instance() {
+  static NoDestructor<JniHost> instance;
+  return instance.Get();
+}
+
+bool JniHost::BindNetworkSimulator(JNIEnv* env, jobject simulator) {
+  JavaVM* vm = nullptr;
+  if (simulator == nullptr || env->GetJavaVM(&vm) != JNI_OK) return false;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return false;
+  jclass type = env->GetObjectClass(simulator);
+  jmethodID getBytes = LookUpMethod(env, type, "getBytes", "(Ljava/lang/String;)[B");
+  jmethodID printStatus = LookUpMethod(env, type, "printStatus", "(Ljava/lang/String;)V");
+  if (getBytes == nullptr || printStatus == nullptr || LoadJavaStrings(env) == nullptr)
+    return false;
+  auto binding = std::make_shared<SimulatorBinding>(vm, env, simulator);
+  binding->getBytes = getBytes;
+  binding->printStatus = printStatus;
+  std::lock_guard<std::mutex> lock(mutex_);
+  simulator_ = std::move(binding);
+  return true;
+}
+
+bool JniHost::BindSnmpHandler(JNIEnv* env, jobject handler) {
+  JavaVM* vm = nullptr;
+  if (handler == nullptr || env->GetJavaVM(&vm) != JNI_OK) {
+    LOG_ERROR("error on getting JNIEnv \n");
+    return false;
+  }
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return false;
+  jclass type = env->GetObjectClass(handler);
+  auto binding = std::make_shared<HandlerBinding>(vm, env, handler);
+  for (int i = 0; i < kValueMethodCount; ++i) {
+    binding->methods[i] =
+        LookUpMethod(env, type, kValueMethods[i].name, kValueMethods[i].signature);
+    if (binding->methods[i] == nullptr) return false;
+  }
+  for (const MethodName& method : kStatusMethods) {
+    if (LookUpMethod(env, type, method.name, method.signature) == nullptr) return false;
+  }
+  if (LoadJavaStrings(env) == nullptr) return false;
+  std::lock_guard<std::mutex> lock(mutex_);
+  handler_ = std::move(binding);
+  return true;
+}
+
+std::shared_ptr<const SimulatorBinding> JniHost::Simulator() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return simulator_;
+}
+
+std::shared_ptr<const HandlerBinding> JniHost::Handler() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return handler_;
+}
+
+std::optional<std::string> JniHost::ToCpp(JNIEnv* env, jstring text) {
+  if (text == nullptr) return std::nullopt;
+  jobject bytes = nullptr;
+  if (std::shared_ptr<const SimulatorBinding> simulator = Simulator()) {
+    bytes = env->CallObjectMethod(simulator->object.Get(), simulator->getBytes, text);
+  } else if (const JavaStrings* strings = LoadJavaStrings(env)) {
+    bytes = env->CallObjectMethod(text, strings->toBytes, strings->utf8);
+  }
+  if (ClearException(env, "getBytes")) return std::nullopt;
+  return BytesFromJava(env, static_cast<jbyteArray>(bytes));
+}
+
+void JniHost::PrintStatus(const std::string& text) {
+  std::shared_ptr<const SimulatorBinding> simulator = Simulator();
+  if (!simulator) return;
+  JNIEnv* env = AttachedEnv(simulator->vm);
+  if (env == nullptr) return;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return;
+  jstring line = StringToJava(env, text);
+  if (line == nullptr) return;
+  env->CallVoidMethod(simulator->object.Get(), simulator->printStatus, line);
+  ClearException(env, "printStatus");
+}
+
+template <typename Fill>
+HostAnswer JniHost::CallValueMethod(int method, Fill fill) {
+  std::shared_ptr<const HandlerBinding> handler = Handler();
+  if (!handler) return std::nullopt;
+  JNIEnv* env = AttachedEnv(handler->vm);
+  if (env == nullptr) return std::nullopt;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return std::nullopt;
+  try {
+    JavaArguments arguments(env);
+    fill(arguments);
+    if (arguments.Failed()) return std::nullopt;
+    jobject answer =
+        env->CallObjectMethodA(handler->object.Get(), handler->methods[method], arguments.Values());
+    if (ClearException(env, kValueMethods[method].name)) return std::nullopt;
+    return AnswerFromJava(env, static_cast<jobjectArray>(answer));
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("unable to alloc memory \n");
+    return std::nullopt;
+  }
+}
+
+HostAnswer JniHost::AnswerFromJava(JNIEnv* env, jobjectArray answer) {
+  if (answer == nullptr) return std::nullopt;
+  std::vector<std::optional<std::string>> texts;
+  bool ok = ForEachElement(env, answer, [&](jobject element) {
+    if (element == nullptr) {
+      texts.emplace_back();
+      return true;
+    }
+    texts.push_back(ToCpp(env, static_cast<jstring>(element)));
+    return true;
+  });
+  if (!ok) return std::nullopt;
+  return texts;
+}
+
+namespace {
+
+// Scalar and table Get pass the same arguments.
+void FillGetArguments(JavaArguments& a, const HostValueQuery& query) {
+  a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
+  a.Text(query.databaseName).Text(query.tableName).Int(query.dataType).AgentTail(query);
+}
+
+}  // namespace
+
+HostAnswer JniHost::ScalarGetOidVal(const HostValueQuery& query) {
+  return CallValueMethod(kScalarGet, [&](JavaArguments& a) { FillGetArguments(a, query); });
+}
+
+HostAnswer JniHost::ScalarGetNextOidVal(const HostValueQuery& query) {
+  return CallValueMethod(kScalarGetNext, [&](JavaArguments& a) {
+    a.Text(query.label)
+        .Text(query.objectOid)
+        .Text(query.subId)
+        .Text(query.instance)
+        .Text(query.previousSubId);
+    a.Text(query.databaseName).Text(query.tableName).Int(query.dataType).AgentTail(query);
+  });
+}
+
+HostAnswer JniHost::SetOidVal(const HostValueQuery& query) {
+  return CallValueMethod(kScalarSet, [&](JavaArguments& a) {
+    a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
+    a.Text(query.databaseName)
+        .Text(query.tableName)
+        .Text(query.valueText)
+        .Int(query.dataType)
+        .AgentTail(query);
+  });
+}
+
+HostAnswer JniHost::TableGetOidVal(const HostValueQuery& query) {
+  return CallValueMethod(kTableGet, [&](JavaArguments& a) { FillGetArguments(a, query); });
+}
+
+HostAnswer JniHost::TableGetNextOidVal(const HostValueQuery& query) {
+  return CallValueMethod(kTableGetNext, [&](JavaArguments& a) {
+    a.Text(query.label).Text(query.objectOid).Text(query.instance);
+    a.Int(query.column).Int(query.nextColumn).Int(query.dataType).Int(query.nextDataType);
+    a.Text(query.databaseName).Text(query.tableName).AgentTail(query);
+  });
+}
+
+HostAnswer JniHost::TableSetOidVal(const HostValueQuery& query) {
+  return CallValueMethod(kTableSet, [&](JavaArguments& a) {
+    a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
+    a.Text(query.databaseName).Text(query.tableName).Text(query.valueText);
+    for (int i = 0; i < 6; ++i) a.Null();  // the host's row arrays, which the engine never fills
+    a.Int(query.dataType).AgentTail(query);
+  });
+}
+
+}  // namespace tessel
