@@ -5,6 +5,7 @@
 #include "base/stop_signal.h"
 #include "engine/engine_state.h"
 #include "engine/log.h"
+#include "snmp/handlers.h"
 #include "snmp/mib_tree.h"
 #include "snmp/service.h"
 
@@ -52,6 +53,8 @@ bool InitAgentParams(const EngineParams& params) {
   {
     std::lock_guard<std::mutex> lock(lifecycle.mutex);
     SetConsoleMode(params.consoleMode);
+    SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
+                           TableProcessWriteReq);
     lifecycle.baseLoopStop.Arm();
     gv_snmpv3Configured = false;
     opened = OpenEngineLog({params.debugLevel, params.logFilePath, params.maxLogFileSize});
