@@ -11,6 +11,7 @@
 #include "engine/jni_host.h"
 #include "engine/log.h"
 #include "snmp/mib_tree.h"
+#include "snmp/service.h"
 #include "snmp/statistics.h"
 
 namespace tessel {
@@ -178,6 +179,7 @@ Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_jniJVMparams(JNIEnv* env, j
     JniHost& host = JniHost::Instance();
     if (!host.BindSnmpHandler(env, self)) return JNI_FALSE;
     InstallHost(&host);
+    InitSnmpParams();
     InitAgentRegistry();
     return JNI_TRUE;
   });

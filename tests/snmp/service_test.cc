@@ -1,0 +1,156 @@
+#include "snmp/service.h"
+
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include "engine/agent_registry.h"
+#include "engine/engine_state.h"
+#include "snmp/message.h"
+#include "support/snmp_agent_fixture.h"
+
+namespace tessel {
+namespace {
+
+// Ports of this suite: distinct per test so that suites running in parallel do not meet.
+constexpr std::uint16_t kBasePort = 23161;
+
+sockaddr_in Address(const char* text, std::uint16_t port) {
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_port = htons(port);
+  inet_pton(AF_INET, text, &address.sin_addr);
+  return address;
+}
+
+// A manager's socket on loopback.
+class Manager {
+ public:
+  Manager() : socket_(::socket(AF_INET, SOCK_DGRAM, 0)) {
+    sockaddr_in local = Address("127.0.0.1", 0);
+    bind(socket_, reinterpret_cast<sockaddr*>(&local), sizeof local);
+  }
+  ~Manager() { close(socket_); }
+
+  // Sends the datagram and waits (at most two seconds) for one answer; its source in *from.
+  std::optional<SnmpPdu> Ask(const std::vector<std::uint8_t>& datagram, const char* agent, std::uint16_t port,
+                             std::string* from = nullptr) {
+    sockaddr_in to = Address(agent, port);
+    sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to), sizeof to);
+    pollfd ready{socket_, POLLIN, 0};
+    if (poll(&ready, 1, 2000) != 1) return std::nullopt;
+    std::vector<std::uint8_t> reply(kMaxSnmpMessage);
+    sockaddr_in source{};
+    socklen_t sourceLength = sizeof source;
+    ssize_t length = recvfrom(socket_, reply.data(), reply.size(), 0, reinterpret_cast<sockaddr*>(&source),
+                              &sourceLength);
+    if (length <= 0) return std::nullopt;
+    char text[INET_ADDRSTRLEN] = {};
+    inet_ntop(AF_INET, &source.sin_addr, text, sizeof text);
+    if (from) *from = std::string(text) + ":" + std::to_string(ntohs(source.sin_port));
+    SnmpPdu pdu;
+    if (ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1) return std::nullopt;
+    return pdu;
+  }
+
+ private:
+  int socket_;
+};
+
+class ServiceTest : public SnmpAgentTest {
+ protected:
+  void SetUp() override {
+    SnmpAgentTest::SetUp();
+    InitSnmpParams();
+  }
+  void TearDown() override {
+    StopSnmpGeneralServices();
+    FreeSimulatorResources();
+    InstallSessionTransport(nullptr, nullptr);
+    SnmpAgentTest::TearDown();
+  }
+
+  static AgentRegistration Agent(const char* address, std::uint16_t port) {
+    AgentRegistration agent;
+    agent.agentId = 1;
+    agent.address = address;
+    agent.port = port;
+    agent.readCommunities = {"public"};
+    agent.writeCommunities = {"private"};
+    return agent;
+  }
+
+  static std::vector<std::uint8_t> GetSysName() {
+    Request request;
+    request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
+    return EncodeRequest(request);
+  }
+};
+
+TEST_F(ServiceTest, EveryAgentAnswersFromItsOwnAddressAndPort) {
+  ASSERT_GT(FillAgentInfoAndStartAgent(Agent("127.77.0.1", kBasePort)), 0);
+  ASSERT_GT(FillAgentInfoAndStartAgent(Agent("127.77.0.2", kBasePort + 1)), 0);
+  ASSERT_TRUE(InitSnmpGeneralServices());
+  Manager manager;
+  std::string from;
+  for (int round = 0; round < 3; ++round) {  // spread over several queues
+    auto first = manager.Ask(GetSysName(), "127.77.0.1", kBasePort, &from);
+    ASSERT_TRUE(first);
+    EXPECT_EQ(first->requestVarBinds.at(0).value, VarValue::Octets(kAsnOctetString, "r1"));
+    EXPECT_EQ(from, "127.77.0.1:" + std::to_string(kBasePort));
+    ASSERT_TRUE(manager.Ask(GetSysName(), "127.77.0.2", kBasePort + 1, &from));
+    EXPECT_EQ(from, "127.77.0.2:" + std::to_string(kBasePort + 1));
+  }
+  // A stopped agent no longer answers; the others do.
+  EXPECT_TRUE(StopAgent("127.77.0.1", kBasePort));
+  EXPECT_FALSE(manager.Ask(GetSysName(), "127.77.0.1", kBasePort));
+  EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.2", kBasePort + 1));
+  StopSnmpGeneralServices();
+  for (int live : LiveWorkerCounts()) EXPECT_EQ(live, 0);
+}
+
+TEST_F(ServiceTest, WildcardSocketAnswersRegisteredAgentsFromTheirAddress) {
+  ASSERT_EQ(RegisterAgentInfo(Agent("127.77.0.9", kBasePort + 10)), 1);
+  ASSERT_TRUE(InitSnmpGeneralServices());
+  Manager manager;
+  std::string from;
+  auto reply = manager.Ask(GetSysName(), "127.77.0.9", kBasePort + 10, &from);
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(from, "127.77.0.9:" + std::to_string(kBasePort + 10));
+  // An address no agent owns is dropped, and the loop goes on.
+  EXPECT_FALSE(manager.Ask(GetSysName(), "127.77.0.10", kBasePort + 10));
+  EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.9", kBasePort + 10));
+  // Starting the agent takes the port over from the wildcard socket.
+  EXPECT_TRUE(StartAgent("127.77.0.9", kBasePort + 10, 1));
+  EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.9", kBasePort + 10, &from));
+  EXPECT_EQ(from, "127.77.0.9:" + std::to_string(kBasePort + 10));
+}
+
+TEST_F(ServiceTest, PortServedByAnotherSocketIsRefused) {
+  int other = socket(AF_INET, SOCK_DGRAM, 0);
+  sockaddr_in taken = Address("127.77.0.5", kBasePort + 20);
+  ASSERT_EQ(bind(other, reinterpret_cast<sockaddr*>(&taken), sizeof taken), 0);
+  EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.77.0.5", kBasePort + 20)), 0);
+  EXPECT_EQ(host_.StatusLines().back(),
+            "Unable to start SNMP Agent at Port : " + std::to_string(kBasePort + 20) + " and at IpAddress : 127.77.0.5 ");
+  close(other);
+}
+
+TEST_F(ServiceTest, StopEndsEveryThreadAndTheServiceStartsAgain) {
+  ASSERT_GT(FillAgentInfoAndStartAgent(Agent("127.77.0.3", kBasePort + 30)), 0);
+  for (int cycle = 0; cycle < 2; ++cycle) {
+    ASSERT_TRUE(InitSnmpGeneralServices());
+    for (int live : LiveWorkerCounts()) EXPECT_EQ(live, kWorkersPerQueue);
+    Manager manager;
+    EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.3", kBasePort + 30));
+    StopSnmpGeneralServices();
+    for (int live : LiveWorkerCounts()) EXPECT_EQ(live, 0);
+  }
+}
+
+}  // namespace
+}  // namespace tessel
