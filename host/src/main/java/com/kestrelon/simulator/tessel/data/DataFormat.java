@@ -3,12 +3,16 @@ package com.kestrelon.simulator.tessel.data;
 import java.util.List;
 import java.util.regex.Pattern;
 
-/** The two data file formats, told apart by the first line that carries data. */
+/**
+ * The two data file formats, told apart by the first line that carries data: a line starting
+ * with a digit or dot whose first '|' comes before any '=' is snmprec, {@code OID = ...} is
+ * snmpwalk output.
+ */
 enum DataFormat {
     SNMPREC,
     SNMPWALK;
 
-    private static final Pattern SNMPREC_LINE = Pattern.compile("\\.?[0-9]+(\\.[0-9]+)*\\|.*");
+    private static final Pattern SNMPREC_LINE = Pattern.compile("[.0-9][^=|]*\\|.*");
     private static final Pattern SNMPWALK_LINE = Pattern.compile("\\s*\\.?[0-9]+(\\.[0-9]+)*\\s*=.*");
 
     static DataFormat detect(String source, List<String> lines) throws DeviceDataException {

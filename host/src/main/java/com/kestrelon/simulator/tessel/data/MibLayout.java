@@ -14,10 +14,11 @@ import java.util.Set;
  * <ol>
  *   <li><b>Tables.</b> A prefix T is a table when every object under T reads {@code T.1.c.inst}
  *       with a non-empty instance, there are at least two columns c, each column's objects share
- *       one type, every column's instances are among those of the column with the most, and those
- *       are not just the single instance {@code 0} (a scalar group looks like that). The shortest
- *       such T wins; nothing under it is looked at again. This rejects whole groups such as
- *       mib-2, whose sub-trees reuse the same suffixes but never all fall into the largest one.</li>
+ *       one type, every column's instances are among those of the column with the most, and not all
+ *       of those read {@code 0} or {@code k.0} (that is a scalar group, or groups of scalars one
+ *       level down, such as the system and interfaces groups seen from mgmt). The shortest such T
+ *       wins; nothing under it is looked at again. Whole groups such as mib-2, whose sub-trees
+ *       reuse the same suffixes, fail these tests.</li>
  *   <li><b>Leftovers.</b> Each object outside the tables that is not of the form {@code P.k.0}
  *       becomes part of a table with entry E, where the object reads {@code E.c.inst}: among the
  *       prefixes E that work, the longest ending in sub-identifier 1 (the usual entry), else the
@@ -94,7 +95,7 @@ public final class MibLayout {
             return false;
         }
         Column largest = Collections.max(columns, Comparator.comparingInt(c -> c.instances.size()));
-        if (largest.instances.equals(Set.of("0"))) {
+        if (largest.instances.stream().allMatch(MibLayout::isScalarLeaf)) {
             return false;
         }
         for (Column column : columns) {
@@ -104,6 +105,11 @@ public final class MibLayout {
         }
         addTable(oid(lo).prefix(depth + 1), columns, lo, hi);
         return true;
+    }
+
+    /** True for the instances {@code 0} and {@code k.0}: scalars of a group at T.1.c or one level below. */
+    private static boolean isScalarLeaf(String instance) {
+        return instance.equals("0") || instance.matches("[0-9]+\\.0");
     }
 
     /** A column: its sub-identifier, its objects' type and their instance texts. */

@@ -3,6 +3,8 @@ package com.kestrelon.simulator.tessel.data;
 import java.io.ByteArrayOutputStream;
 import java.math.BigInteger;
 import java.nio.charset.StandardCharsets;
+import java.util.ArrayList;
+import java.util.List;
 import java.util.regex.Pattern;
 
 /**
@@ -30,7 +32,6 @@ public final class ValueText {
     private static final Pattern SIGNED = Pattern.compile("-?[0-9]{1,20}");
     private static final Pattern UNSIGNED = Pattern.compile("[0-9]{1,20}");
     private static final Pattern HEX_TEXT = Pattern.compile("'((?:[0-9a-fA-F]{2})*)'[hH]");
-    private static final BigInteger TWO_POW_64 = BigInteger.ONE.shiftLeft(64);
 
     private ValueText() {
     }
@@ -105,13 +106,18 @@ public final class ValueText {
 
     /** The canonical engine text of a value text of the given type (e.g. a set value). */
     public static String canonical(BerType type, String text) {
-        return fromContents(type, toContents(type, text));
+        return switch (type) {
+            case INTEGER -> Integer.toString(parseInteger(text));
+            case COUNTER32, GAUGE32, TIME_TICKS, UINTEGER32 -> Long.toString(parseUnsigned32(text));
+            case COUNTER64 -> Long.toUnsignedString(parseUnsigned64(text));
+            default -> fromContents(type, toContents(type, text));
+        };
     }
 
     /** Signed 32-bit decimal text to its value. */
     public static int parseInteger(String text) {
         require(SIGNED.matcher(text).matches(), "not a decimal integer: '" + text + "'");
-        long value = Long.parseLong(text);
+        long value = text.length() <= 12 ? Long.parseLong(text) : Long.MAX_VALUE;
         require(value >= Integer.MIN_VALUE && value <= Integer.MAX_VALUE, "out of the INTEGER range: " + text);
         return (int) value;
     }
@@ -119,9 +125,8 @@ public final class ValueText {
     /** Unsigned 32-bit decimal text to its value. */
     public static long parseUnsigned32(String text) {
         require(UNSIGNED.matcher(text).matches(), "not an unsigned decimal number: '" + text + "'");
-        BigInteger value = new BigInteger(text);
-        require(value.bitLength() <= 32, "exceeds 4294967295: " + text);
-        return value.longValue();
+        require(text.length() <= 18 && Long.parseLong(text) <= 0xFFFF_FFFFL, "exceeds 4294967295: " + text);
+        return Long.parseLong(text);
     }
 
     /** Unsigned 64-bit decimal text to its value (as the bits of a long). */
@@ -212,7 +217,7 @@ public final class ValueText {
 
     private static Oid decodeOid(byte[] contents) {
         require(contents.length >= 1, "an OID value has content octets");
-        java.util.List<Long> ids = new java.util.ArrayList<>();
+        List<Long> ids = new ArrayList<>();
         long value = 0;
         int septets = 0;
         for (int i = 0; i < contents.length; i++) {
