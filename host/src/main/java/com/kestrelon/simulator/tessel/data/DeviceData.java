@@ -1,0 +1,111 @@
+package com.kestrelon.simulator.tessel.data;
+
+import java.io.IOException;
+import java.nio.charset.StandardCharsets;
+import java.nio.file.Files;
+import java.nio.file.Path;
+import java.util.ArrayList;
+import java.util.Arrays;
+import java.util.Collections;
+import java.util.Comparator;
+import java.util.List;
+import java.util.Optional;
+
+/**
+ * The recorded objects of one device, sorted by OID, each OID once.
+ *
+ * <p>Loads {@code .snmprec} files ({@code OID|TAG|VALUE} lines) and {@code snmpwalk -On} output;
+ * the format is told from the content, never from the file name. Values are held as engine
+ * texts (see {@link ValueText}). Faults in the data raise a {@link DeviceDataException} naming
+ * the file and line. Immutable and thread-safe.
+ */
+public final class DeviceData {
+    private final String source;
+    private final List<DeviceObject> objects;
+    private final Oid[] oids;
+
+    private DeviceData(String source, List<DeviceObject> sorted) {
+        this.source = source;
+        this.objects = Collections.unmodifiableList(sorted);
+        this.oids = sorted.stream().map(DeviceObject::oid).toArray(Oid[]::new);
+    }
+
+    /** Reads and parses a data file; errors name the file as {@code file.toString()}. */
+    public static DeviceData load(Path file) throws IOException, DeviceDataException {
+        return parse(file.toString(), Files.readAllBytes(file));
+    }
+
+    /**
+     * Parses the bytes of a data file. String values keep their octets exactly as written; the
+     * file's text is not re-encoded.
+     *
+     * @param source the name errors and {@link #source()} give for the data
+     */
+    public static DeviceData parse(String source, byte[] content) throws DeviceDataException {
+        List<String> lines = splitLines(new String(content, StandardCharsets.ISO_8859_1));
+        List<DeviceObject> parsed = switch (DataFormat.detect(source, lines)) {
+            case SNMPREC -> SnmprecParser.parse(source, lines);
+            case SNMPWALK -> SnmpwalkParser.parse(source, lines);
+        };
+        return of(source, parsed);
+    }
+
+    /** Parses data given as text (encoded as UTF-8 first). */
+    public static DeviceData parse(String source, String content) throws DeviceDataException {
+        return parse(source, content.getBytes(StandardCharsets.UTF_8));
+    }
+
+    /** Sorts objects into OID order; a second object with the same OID is a fault at its line. */
+    static DeviceData of(String source, List<DeviceObject> objects) throws DeviceDataException {
+        if (objects.isEmpty()) {
+            throw new DeviceDataException(source, 1, "no objects in the data");
+        }
+        List<DeviceObject> sorted = new ArrayList<>(objects);
+        sorted.sort(Comparator.comparing(DeviceObject::oid).thenComparingInt(DeviceObject::line));
+        for (int i = 1; i < sorted.size(); i++) {
+            DeviceObject first = sorted.get(i - 1);
+            DeviceObject second = sorted.get(i);
+            if (first.oid().equals(second.oid())) {
+                throw new DeviceDataException(source, second.line(),
+                        "duplicate OID " + second.oid() + " (first on line " + first.line() + ")");
+            }
+        }
+        return new DeviceData(source, sorted);
+    }
+
+    private static List<String> splitLines(String text) {
+        List<String> lines = new ArrayList<>(Arrays.asList(text.split("\n", -1)));
+        if (!lines.isEmpty() && lines.get(lines.size() - 1).isEmpty()) {
+            lines.remove(lines.size() - 1);
+        }
+        lines.replaceAll(line -> line.endsWith("\r") ? line.substring(0, line.length() - 1) : line);
+        return lines;
+    }
+
+    /** The name the data was loaded under. */
+    public String source() {
+        return source;
+    }
+
+    /** All objects in OID order (unmodifiable). */
+    public List<DeviceObject> objects() {
+        return objects;
+    }
+
+    public int size() {
+        return objects.size();
+    }
+
+    /** The object with exactly this OID. */
+    public Optional<DeviceObject> get(Oid oid) {
+        int index = Arrays.binarySearch(oids, oid);
+        return index >= 0 ? Optional.of(objects.get(index)) : Optional.empty();
+    }
+
+    /** The first object whose OID follows {@code oid} (the GetNext answer over the whole data). */
+    public Optional<DeviceObject> next(Oid oid) {
+        int index = Arrays.binarySearch(oids, oid);
+        int next = index >= 0 ? index + 1 : -index - 1;
+        return next < objects.size() ? Optional.of(objects.get(next)) : Optional.empty();
+    }
+}

@@ -1,0 +1,149 @@
+package com.kestrelon.simulator.tessel.data;
+
+import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertThrows;
+import static org.junit.jupiter.api.Assertions.fail;
+
+import java.io.InputStream;
+import java.nio.file.Files;
+import java.nio.file.Path;
+import java.util.ArrayList;
+import java.util.List;
+import org.junit.jupiter.api.Test;
+import org.junit.jupiter.params.ParameterizedTest;
+import org.junit.jupiter.params.provider.ValueSource;
+
+class MibLayoutTest {
+
+    /** A corpus file: from -Dtessel.data.dir, the class path (/data/NAME) or the source tree. */
+    static DeviceData corpus(String name) throws Exception {
+        String dir = System.getProperty("tessel.data.dir");
+        if (dir != null) {
+            return DeviceData.load(Path.of(dir, name));
+        }
+        try (InputStream in = MibLayoutTest.class.getResourceAsStream("/data/" + name)) {
+            if (in != null) {
+                return DeviceData.parse(name, in.readAllBytes());
+            }
+        }
+        Path inTree = Path.of("host/src/test/resources/data", name);
+        if (Files.exists(inTree)) {
+            return DeviceData.load(inTree);
+        }
+        return fail("corpus file " + name + " not found");
+    }
+
+    /**
+     * The OIDs a GetNext walk over the registered cells answers, the host serving values from the
+     * data: cells in order of their registered OIDs; a scalar group answers P.k.0 for each of its
+     * k; a table answers column by column each column's instances in order. Also checks that each
+     * answered object has the type registered for its sub-identifier.
+     */
+    static List<Oid> walk(List<CellDefinition> cells, DeviceData data) {
+        List<CellDefinition> ordered = new ArrayList<>(cells);
+        ordered.sort((a, b) -> a.registeredOid().compareTo(b.registeredOid()));
+        List<Oid> answered = new ArrayList<>();
+        for (CellDefinition cell : ordered) {
+            Oid registered = cell.registeredOid();
+            for (int i = 0; i < cell.subIds().size(); i++) {
+                long subId = Long.parseLong(cell.subIds().get(i));
+                String type = cell.dataTypes().get(i);
+                List<DeviceObject> objects = cell.isTable()
+                        ? data.objects().stream().filter(o -> o.oid().startsWith(registered.append(subId))
+                                && o.oid().length() > registered.length() + 1).toList()
+                        : data.get(registered.prefix(registered.length() - 1).append(subId, 0)).stream().toList();
+                for (DeviceObject object : objects) {
+                    assertEquals(type, String.valueOf(object.typeNumber()), "type of " + object.oid());
+                    answered.add(object.oid());
+                }
+            }
+        }
+        return answered;
+    }
+
+    private static String describe(List<CellDefinition> cells) {
+        StringBuilder text = new StringBuilder();
+        for (CellDefinition cell : cells) {
+            text.append(cell.isTable() ? "table " : "scalars ").append(cell.oid()).append(' ')
+                    .append(String.join(",", cell.subIds())).append('\n');
+        }
+        return text.toString();
+    }
+
+    @ParameterizedTest
+    @ValueSource(strings = {"linux-host.walk", "branch-router.snmprec"})
+    void servingTheLayoutAnswersExactlyTheRecordedObjectsInOrder(String name) throws Exception {
+        DeviceData data = corpus(name);
+        List<CellDefinition> cells = MibLayout.infer(data);
+        assertEquals(data.objects().stream().map(DeviceObject::oid).toList(), walk(cells, data));
+        for (int i = 0; i < cells.size(); i++) {
+            assertEquals("cell" + (i + 1), cells.get(i).label());
+            assertEquals(0, cells.get(i).rowStatusColumn());
+        }
+    }
+
+    @Test
+    void findsTheMib2TablesAndSplitsScalarGroupsAroundThem() throws Exception {
+        assertEquals("""
+                scalars 1.3.6.1.2.1.1.1 1,2,3,4,5,6,7,8
+                table 1.3.6.1.2.1.1.9.1 2,3,4
+                scalars 1.3.6.1.2.1.2.1 1
+                table 1.3.6.1.2.1.2.2.1 1,2,3,4,5,6,7,8,9,10,14,16,19,21,22
+                table 1.3.6.1.2.1.3.1.1 1,2,3
+                scalars 1.3.6.1.2.1.4.1 1,2,3,4,5,6,7,8,9,10,11,12,13,14,15,16,17,18,19
+                table 1.3.6.1.2.1.4.20.1 1,2,3,4
+                table 1.3.6.1.2.1.4.21.1 1,2,3,7,8,11
+                table 1.3.6.1.2.1.4.22.1 1,2,3,4
+                scalars 1.3.6.1.2.1.4.23 23
+                scalars 1.3.6.1.2.1.4.24.3 3
+                table 1.3.6.1.2.1.4.24.4.1 1,2,3,4,5,6,7,8,9,10,11,16
+                scalars 1.3.6.1.2.1.4.31.2 2
+                table 1.3.6.1.2.1.4.31.3.1 3,4,46,47
+                scalars 1.3.6.1.2.1.5.1 1,2,3,8,14,15,16,22
+                scalars 1.3.6.1.2.1.6.1 1,2,3,4,5,6,7,8,9,10,11,12
+                table 1.3.6.1.2.1.6.13.1 1,2,3,4,5
+                scalars 1.3.6.1.2.1.6.14 14,15,17,18
+                scalars 1.3.6.1.2.1.7.1 1,2,3,4
+                table 1.3.6.1.2.1.7.5.1 1,2
+                scalars 1.3.6.1.2.1.7.8 8,9
+                scalars 1.3.6.1.2.1.11.1 1,3,4,30,31,32
+                table 1.3.6.1.2.1.31.1.1.1 1,2,6,10,15,18
+                table 1.3.6.1.2.1.31.1.2.1 3
+                scalars 1.3.6.1.2.1.31.1.5 5,6
+                scalars 1.3.6.1.4.1.8072.1.3.2.1 1
+                table 1.3.6.1.4.1.8072.1.3.2.2.1 2,3,5,6,21
+                table 1.3.6.1.4.1.8072.1.3.2.3.1 1,2,3,4
+                """, describe(MibLayout.infer(corpus("linux-host.walk"))));
+        CellDefinition ifTable = MibLayout.infer(corpus("linux-host.walk")).get(3);
+        assertEquals(List.of("2", "4", "2", "2", "66", "4", "2", "2", "67", "65", "65", "65", "65", "66", "6"),
+                ifTable.dataTypes());
+        assertEquals(List.of("43706"), ifTable.accessTexts().stream().distinct().toList());
+    }
+
+    @Test
+    void doesNotTakeWholeGroupsForTables() throws Exception {
+        // Seen from mgmt, system and interfaces look like two columns with shared instances 1.0;
+        // seen from 32473, the two tables of group 32473.1 look like two columns of one table.
+        DeviceData data = DeviceData.parse("d", String.join("\n",
+                "1.3.6.1.2.1.1.1.0|4|router", "1.3.6.1.2.1.1.4.0|4|noc", "1.3.6.1.2.1.1.5.0|4|r1",
+                "1.3.6.1.2.1.2.1.0|2|2", "1.3.6.1.4.1.32473.1.1.0|2|1", "1.3.6.1.4.1.32473.1.2.0|2|1",
+                "1.3.6.1.4.1.32474.1.1.1.2.1|65|1", "1.3.6.1.4.1.32474.1.1.1.2.2|65|2",
+                "1.3.6.1.4.1.32474.1.1.1.3.1|65|3", "1.3.6.1.4.1.32474.1.1.1.3.2|65|4",
+                "1.3.6.1.4.1.32474.1.2.1.2.7|65|5", "1.3.6.1.4.1.32474.1.2.1.3.7|65|6"));
+        assertEquals("""
+                scalars 1.3.6.1.2.1.1.1 1,4,5
+                scalars 1.3.6.1.2.1.2.1 1
+                scalars 1.3.6.1.4.1.32473.1.1 1,2
+                table 1.3.6.1.4.1.32474.1.1.1 2,3
+                table 1.3.6.1.4.1.32474.1.2.1 2,3
+                """, describe(MibLayout.infer(data)));
+    }
+
+    @Test
+    void refusesAnObjectNoCellCanServe() throws Exception {
+        DeviceData data = DeviceData.parse("d", "1.3.6.1.4.1.32473.1.0|2|1\n1.3.6.1.4.1.32473.1.0.5|4|x\n");
+        var error = assertThrows(DeviceDataException.class, () -> MibLayout.infer(data));
+        assertEquals("d:2: object 1.3.6.1.4.1.32473.1.0.5 fits neither a table nor a scalar group:"
+                + " its sub-tree is shared with other cells", error.getMessage());
+    }
+}
