@@ -69,8 +69,8 @@ bool IsValidViewName(std::string_view viewName, const char* column) {
 }
 
 bool IsValidMask(std::string_view maskHex) {
-  bool hex = std::all_of(maskHex.begin(), maskHex.end(),
-                         [](char c) { return HexDigitValue(c) >= 0; });
+  bool hex =
+      std::all_of(maskHex.begin(), maskHex.end(), [](char c) { return HexDigitValue(c) >= 0; });
   return CheckColumn(hex && maskHex.size() <= kMaxMaskDigits, "Mask");
 }
 
@@ -292,8 +292,8 @@ int CreateAndAddSnmpVacmSecurityToGroupTableEntry(int securityModel, std::string
                                                   int rowStatus) {
   if (!IsValidRowStatus(rowStatus) || !IsValidGroupName(groupName)) return kVacmRefused;
   return ChangeTables([&](VacmTables& t) {
-    t.groups.push_back({securityModel, std::string(securityName), std::string(groupName),
-                        storageType, rowStatus});
+    t.groups.push_back(
+        {securityModel, std::string(securityName), std::string(groupName), storageType, rowStatus});
   });
 }
 
@@ -304,8 +304,8 @@ int CreateAndAddNewSnmpVacmAccessTableEntry(std::string_view groupName,
                                             std::string_view notifyView, int storageType,
                                             int rowStatus) {
   bool valid = IsValidRowStatus(rowStatus) && IsValidGroupName(groupName) &&
-               CheckColumn(securityLevel == kVacmNoAuthNoPriv ||
-                               securityLevel == kVacmAuthNoPriv || securityLevel == kVacmAuthPriv,
+               CheckColumn(securityLevel == kVacmNoAuthNoPriv || securityLevel == kVacmAuthNoPriv ||
+                               securityLevel == kVacmAuthPriv,
                            "SecurityLevel") &&
                CheckColumn(contextMatch == kVacmContextExact || contextMatch == kVacmContextPrefix,
                            "ContextMatch") &&
@@ -314,10 +314,10 @@ int CreateAndAddNewSnmpVacmAccessTableEntry(std::string_view groupName,
                IsValidViewName(notifyView, "NotifyViewName");
   if (!valid) return kVacmRefused;
   return ChangeTables([&](VacmTables& t) {
-    t.access.push_back(std::make_unique<VacmAccessEntry>(VacmAccessEntry{
-        std::string(groupName), std::string(contextPrefix), securityModel, securityLevel,
-        contextMatch, std::string(readView), std::string(writeView), std::string(notifyView),
-        storageType, rowStatus}));
+    t.access.push_back(std::make_unique<VacmAccessEntry>(
+        VacmAccessEntry{std::string(groupName), std::string(contextPrefix), securityModel,
+                        securityLevel, contextMatch, std::string(readView), std::string(writeView),
+                        std::string(notifyView), storageType, rowStatus}));
   });
 }
 
@@ -357,9 +357,9 @@ void CreateLCDVacmViewTreeFamilyTable() {
   RebuildList(&VacmTables::views, &VacmTables::viewList, ViewFamilyGoesAfter, "view");
 }
 
-int IsAccessAllowed(std::string_view contextName, std::string_view securityName,
-                    int securityModel, int securityLevel, std::uint8_t pduType,
-                    std::span<const std::uint32_t> oid, std::string* viewCache) {
+int IsAccessAllowed(std::string_view contextName, std::string_view securityName, int securityModel,
+                    int securityLevel, std::uint8_t pduType, std::span<const std::uint32_t> oid,
+                    std::string* viewCache) {
   try {
     std::shared_lock lock(g_vacmMutex);
     const VacmTables& tables = TablesForReading();

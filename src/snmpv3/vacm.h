@@ -123,9 +123,9 @@ void CreateLCDVacmViewTreeFamilyTable();
 // non-empty on entry, the context, group, access and view-name steps are skipped and that view
 // alone decides; otherwise the chosen view name is stored there (even when the view then
 // refuses the OID). nullptr means no cache.
-int IsAccessAllowed(std::string_view contextName, std::string_view securityName,
-                    int securityModel, int securityLevel, std::uint8_t pduType,
-                    std::span<const std::uint32_t> oid, std::string* viewCache);
+int IsAccessAllowed(std::string_view contextName, std::string_view securityName, int securityModel,
+                    int securityLevel, std::uint8_t pduType, std::span<const std::uint32_t> oid,
+                    std::string* viewCache);
 
 // True when the context table holds exactly this name.
 bool IsValidContext(std::string_view contextName);

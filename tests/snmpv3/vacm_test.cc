@@ -53,8 +53,9 @@ TEST_F(VacmTest, RefusesBadRowValues) {
   EXPECT_EQ(CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, "u", std::string(32, 'g'), 3, 5), 1);
   EXPECT_EQ(CreateAndAddNewSnmpVacmAccessTableEntry("g", "", 3, 2, 1, "r", "", "", 3), 0);
   EXPECT_EQ(CreateAndAddNewSnmpVacmAccessTableEntry("g", "", 3, 3, 3, "r", "", "", 3), 0);
-  EXPECT_EQ(CreateAndAddNewSnmpVacmAccessTableEntry("g", "", 3, 3, 2, std::string(33, 'r'), "",
-                                                    "", 3), 0);
+  EXPECT_EQ(
+      CreateAndAddNewSnmpVacmAccessTableEntry("g", "", 3, 3, 2, std::string(33, 'r'), "", "", 3),
+      0);
   EXPECT_EQ(CreateAndAddNewSnmpVacmAccessTableEntry("g", "", 3, 3, 2, "r", "", "", 3, 0), 0);
   for (const char* subtree : {"", ".", "1..3", "1.3.", "1.x.6"})
     EXPECT_EQ(CreateAndAddSnmpVacmViewTreeFamilyTableEntry("v", subtree, "", 1, 3), 0) << subtree;
