@@ -26,13 +26,15 @@ Lifecycle& TheLifecycle() {
 }
 
 // The service may already run: startSnmpNetwork marks it started before initSnmpThread.
+// The search array is rebuilt before the threads start: a request already waiting in a socket
+// must find every registered cell.
 bool StartServicesLocked(Lifecycle& lifecycle) {
+  if (!lifecycle.servicesRunning) InitSnmpV3Params();
+  StoreTreeCellsRefInArray();
   if (!lifecycle.servicesRunning) {
-    InitSnmpV3Params();
     if (!InitSnmpGeneralServices()) return false;
     lifecycle.servicesRunning = true;
   }
-  StoreTreeCellsRefInArray();
   gv_snmpServiceStarted = 1;
   return true;
 }

@@ -40,6 +40,7 @@ ValueForm FormOf(std::uint8_t type) {
     case kAsnOctetString:
     case kAsnOpaque:
     case kAsnNsapAddress:
+    case kAsnBitString:
       return ValueForm::kOctets;
     case kAsnObjectId:
       return ValueForm::kObjectId;
@@ -473,6 +474,12 @@ std::optional<VarValue> TextToVarValue(std::uint8_t dataType, const std::string&
     case kAsnOpaque:
     case kAsnNsapAddress:
       return VarValue::Octets(dataType, OctetsAsText(dataType, text));
+    case kAsnBitString: {
+      // The contents as sent: the count of unused bits (0-7), then the bits.
+      std::string bits = OctetsAsText(dataType, text);
+      if (bits.empty() || static_cast<unsigned char>(bits[0]) >= 8) return std::nullopt;
+      return VarValue::Octets(kAsnBitString, std::move(bits));
+    }
     case kAsnObjectId:
       return ParseObjectId(text);
     case kAsnIpAddress:
@@ -503,6 +510,7 @@ std::optional<std::string> VarValueToText(std::uint8_t dataType, const VarValue&
     case kAsnOctetString:
     case kAsnOpaque:
     case kAsnNsapAddress:
+    case kAsnBitString:
       return OctetsToText(value.octets);
     case kAsnObjectId:
       return OidToText(value.oid);

@@ -328,6 +328,15 @@ void AppendCandidate(const TreeCell& cell, std::uint32_t subId, bool next, Oid* 
   if (!cell.isTable && !next) candidate->push_back(0);
 }
 
+// Whether oid lies under one of the cell's objects (a scalar, or a column of the table).
+bool NamesObjectOf(const TreeCell& cell, std::span<const std::uint32_t> oid) {
+  std::span<const std::uint32_t> base = cell.Base();
+  std::size_t at = base.size() + (cell.isTable ? 1 : 0);
+  if (oid.size() <= at || !std::equal(base.begin(), base.end(), oid.begin())) return false;
+  if (cell.isTable && oid[base.size()] != 1) return false;
+  return cell.ColumnPosition(oid[at]) >= 0;
+}
+
 // A Get met a candidate that is not below the requested OID (order is CompareKey(oid, candidate)).
 bool AnswersGet(const TreeCell& cell, int order, std::uint8_t* errorCode) {
   if (order == 0 && !cell.isTable) {
@@ -471,8 +480,10 @@ TreeCell* GetTreeCell(std::uint8_t pduType, std::span<const std::uint32_t> oid,
   if (CompareSubIdLists(pduType, *start, oid, &startCode)) return start;
   std::uint8_t endCode = 0;
   if (end != nullptr && CompareSubIdLists(pduType, *end, oid, &endCode)) return end;
-  // The start cell's verdict comes first: it is the cell whose range the OID falls into.
-  *errorCode = startCode != 0 ? startCode : (endCode != 0 ? endCode : kNoSuchObject);
+  // An object that exists without the requested instance is noSuchInstance; an OID under no
+  // registered object is noSuchObject, whichever neighbour cell was asked.
+  bool objectExists = NamesObjectOf(*start, oid) || (end != nullptr && NamesObjectOf(*end, oid));
+  *errorCode = objectExists ? kNoSuchInstance : kNoSuchObject;
   return nullptr;
 }
 

@@ -165,7 +165,10 @@ TEST(TextToVarValueTest, OtherTypes) {
   EXPECT_EQ(TextToVarValue(kAsnOpaque, "", "00:1a:2b:3c:4d:5e"), VarValue::Octets(kAsnOpaque, "00:1a:2b:3c:4d:5e"));
   EXPECT_EQ(TextToVarValue(kAsnNull, "", "anything"), VarValue::Empty(kAsnNull));
   EXPECT_EQ(TextToVarValue(0x99, "", "2024-5-6,7:8:9.1"), VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01"s));
-  EXPECT_EQ(TextToVarValue(kAsnBitString, "", "1"), std::nullopt);
+  // A BIT STRING's contents start with its count of unused bits, 0 to 7.
+  EXPECT_EQ(TextToVarValue(kAsnBitString, "", "'0380'h"), VarValue::Octets(kAsnBitString, "\x03\x80"s));
+  EXPECT_EQ(TextToVarValue(kAsnBitString, "", "'08ff'h"), std::nullopt);
+  EXPECT_EQ(TextToVarValue(kAsnBitString, "", ""), std::nullopt);
 }
 
 TEST_F(HandlersTest, TableGetNextFollowsTheHostAnswer) {

@@ -81,6 +81,12 @@ TEST_F(MibTreeTest, GetFindsTableAndScalarCells) {
   EXPECT_EQ(code, kNoSuchInstance);
   EXPECT_EQ(Lookup(kGetRequest, Append(kSystem, {9, 0}), &code), nullptr);
   EXPECT_EQ(code, kNoSuchObject);
+
+  // A scalar group that follows does not make an unknown object a missing instance.
+  ASSERT_TRUE(CreateAndRegisterCell(Cell("interfaces", "1.3.6.1.2.1.2.1", Range(1, 1), false)));
+  StoreTreeCellsRefInArray();
+  EXPECT_EQ(Lookup(kGetRequest, Append(kSystem, {99, 0}), &code), nullptr);
+  EXPECT_EQ(code, kNoSuchObject);
 }
 
 TEST_F(MibTreeTest, GetNextFindsTheCellAtOrAfterTheOid) {

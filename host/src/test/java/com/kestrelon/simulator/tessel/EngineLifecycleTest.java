@@ -72,14 +72,14 @@ class EngineLifecycleTest {
     assertEquals(-1, modeInfo.GetAgentID("127.0.0.6", "161"));
 
     // A short port is unsigned: (short) 65535 is port 65535.
-    assertEquals(8, handler.nativePassOneAgentInfo("db", "t", null, "192.0.2.8", (short) -1, none, none,
+    assertEquals(8, handler.nativePassOneAgentInfo("db", "t", null, "300.0.2.8", (short) -1, none, none,
         null, 8, 0));
-    assertEquals("db:t", modeInfo.GetModeInfo("192.0.2.8", "65535"));
+    assertEquals("db:t", modeInfo.GetModeInfo("300.0.2.8", "65535"));
 
-    // An address this machine does not have cannot be bound: the start fails and the host is told.
+    // An address that is no IPv4 address cannot be bound: the start fails and the host is told.
     simulator.clearStatusLines();
-    assertFalse(handler.startAgent("192.0.2.8", 65535, 1));
-    assertTrue(simulator.statusLines().contains(String.format(NOT_STARTED, 65535, "192.0.2.8")));
+    assertFalse(handler.startAgent("300.0.2.8", 65535, 1));
+    assertTrue(simulator.statusLines().contains(String.format(NOT_STARTED, 65535, "300.0.2.8")));
 
     assertTrue(handler.stopAgent("127.0.0.5", 161));
     assertEquals(-1, modeInfo.GetAgentID("127.0.0.5", "161"));
@@ -92,13 +92,13 @@ class EngineLifecycleTest {
   void startSnmpNetworkReportsEveryAgentItCannotOpen() {
     simulator.clearStatusLines();
     int[] sockets = handler.startSnmpNetwork(new int[] {1, 2}, strings("t1", "t2"),
-        strings("192.0.2.1", "192.0.2.2"), new int[] {161, 65536 + 162}, strings("public,,x", "public"),
+        strings("300.0.2.1", "300.0.2.2"), new int[] {161, 65536 + 162}, strings("public,,x", "public"),
         strings("private", "private"), new int[] {0, 0}, "db", new int[] {0, 0});
     assertArrayEquals(new int[] {0, 0}, sockets);
-    assertTrue(simulator.statusLines().contains(String.format(NOT_STARTED, 161, "192.0.2.1")));
-    assertTrue(simulator.statusLines().contains(String.format(NOT_STARTED, 162, "192.0.2.2")),
+    assertTrue(simulator.statusLines().contains(String.format(NOT_STARTED, 161, "300.0.2.1")));
+    assertTrue(simulator.statusLines().contains(String.format(NOT_STARTED, 162, "300.0.2.2")),
         "ports are 16-bit");
-    assertEquals(-1, modeInfo.GetAgentID("192.0.2.1", "161"), "an agent that did not open is dropped");
+    assertEquals(-1, modeInfo.GetAgentID("300.0.2.1", "161"), "an agent that did not open is dropped");
 
     int[] opened = handler.startSnmpNetwork(new int[] {3}, strings("t3"), strings("127.0.0.3"),
         new int[] {65536 + 17161}, strings("public"), strings("private"), new int[] {1}, "db",
