@@ -15,7 +15,18 @@ struct Context {
   std::uint8_t pduType;  // kGetRequest, kGetNextRequest or kSetRequest
   std::int32_t version;
   const AgentSession& agent;
+  const SecurityAccess* access = nullptr;
+  std::string* viewCache = nullptr;  // the view chosen for this request (SNMPv3)
 };
+
+// The SNMPv3 view check for one object: 1 allowed, else the error status.
+std::int32_t CheckAccess(const Context& context, std::uint8_t pduType, const Oid& oid) {
+  if (context.access == nullptr || context.access->isAccessAllowed == nullptr) return 1;
+  int result = context.access->isAccessAllowed(*context.access, pduType, oid, context.viewCache);
+  if (result == 1) return 1;
+  LOG_TRACE("Access is denied in VACM !!!\n");
+  return result == kAuthorizationError ? kAuthorizationError : kGenErr;
+}
 
 // A binding's outcome: an answer, or an error status for the whole request.
 struct Answer {
@@ -97,7 +108,9 @@ Answer EndOfMib(const Context& context, const Oid& requested) {
   return Answered(requested, VarValue::Empty(kEndOfMibView));
 }
 
-enum class Step { kAnswered, kMoveOn, kFailed };
+// kAgain: the object answered lies outside the manager's view; the walk goes on after it in the
+// same column.
+enum class Step { kAnswered, kMoveOn, kAgain, kFailed };
 
 // Reads one column for a GetNext: the answer, a reason to move to the next column, or an error.
 Step ReadNextInColumn(const TreeCell& cell, int position, Oid* oid, const Context& context, Answer* answer) {
@@ -109,6 +122,7 @@ Step ReadNextInColumn(const TreeCell& cell, int position, Oid* oid, const Contex
   std::optional<VarValue> value = cell.readHandler(kGetNextRequest, oid, &error, Target(cell, context));
   if (value) {
     if (HiddenFromV1(context, *value)) return Step::kMoveOn;
+    if (CheckAccess(context, kGetNextRequest, *oid) != 1) return cell.isTable ? Step::kAgain : Step::kMoveOn;
     *answer = Answered(*oid, std::move(*value));
     return Step::kAnswered;
   }
@@ -126,6 +140,7 @@ Answer WalkNext(const TreeCell* cell, const Oid& requested, const Context& conte
     while (position >= 0) {
       Answer answer;
       Step step = ReadNextInColumn(*cell, position, &oid, context, &answer);
+      if (step == Step::kAgain) continue;
       if (step != Step::kMoveOn) return answer;
       if (static_cast<std::size_t>(++position) == cell->subIds.size()) break;
       SetColumn(*cell, cell->subIds[static_cast<std::size_t>(position)], &oid);
@@ -182,6 +197,9 @@ Answer ReadExact(const TreeCell& cell, const VarBind& binding, const Context& co
 
 // Get and Set of exactly the named instance.
 Answer AnswerExact(const Holder& holder, const VarBind& binding, const Context& context) {
+  if (std::int32_t allowed = CheckAccess(context, context.pduType, binding.name); allowed != 1) {
+    return Failed(allowed);
+  }
   const TreeCell* cell = holder.cell;
   std::size_t at = cell ? cell->Base().size() + (cell->isTable ? 1 : 0) : 0;
   int position = cell && at < binding.name.size() ? cell->ColumnPosition(binding.name[at]) : -1;
@@ -294,25 +312,27 @@ bool GetNextOid(const TreeCell& cell, Oid* oid) {
   return true;
 }
 
-std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent) {
+std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access) {
   pdu->errorStatus = kNoError;
   pdu->errorIndex = 0;
   MibTreeReadLock tree;
-  Context context{pdu->type, pdu->version, agent};
+  std::string viewCache;
+  Context context{pdu->type, pdu->version, agent, access, &viewCache};
   VarBindList answers;
   pdu->errorStatus = ProcessVarBinds(pdu->requestVarBinds, context, &answers, &pdu->errorIndex);
   if (pdu->errorStatus == kNoError) pdu->responseVarBinds = std::move(answers);
   return pdu->errorStatus;
 }
 
-std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent) {
+std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access) {
   std::size_t count = pdu->requestVarBinds.size();
   std::size_t nonRepeaters = std::min<std::size_t>(static_cast<std::size_t>(std::max(pdu->errorStatus, 0)), count);
   std::int64_t maxRepetitions = std::max(pdu->errorIndex, 0);
   pdu->errorStatus = kNoError;
   pdu->errorIndex = 0;
   MibTreeReadLock tree;
-  Context context{kGetNextRequest, pdu->version, agent};
+  std::string viewCache;
+  Context context{kGetNextRequest, pdu->version, agent, access, &viewCache};
   VarBindList request = pdu->requestVarBinds;
   if (maxRepetitions == 0) request.resize(nonRepeaters);
   std::size_t repeaters = request.size() - nonRepeaters;
