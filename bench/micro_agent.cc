@@ -38,13 +38,14 @@ MicroAgent::MicroAgent() {
            {{{"1", "4"}}, {{"2", "6"}}, {{"3", "67"}}, {{"4", "4"}}, {{"5", "4"}}, {{"6", "4"}}, {{"7", "2"}}});
   Register("ifEntry", "1.3.6.1.2.1.2.2.1", true, {{{"1", "2"}}, {{"2", "4"}}, {{"10", "65"}}});
   StoreTreeCellsRefInArray();
-  host_.SetValue("1.3.6.1.2.1.1.1.0", "Tessel router");
-  host_.SetValue("1.3.6.1.2.1.1.2.0", ".1.3.6.1.4.1.99999");
-  host_.SetValue("1.3.6.1.2.1.1.3.0", "12345");
-  host_.SetValue("1.3.6.1.2.1.1.4.0", "ops");
-  host_.SetValue("1.3.6.1.2.1.1.5.0", "r1");
-  host_.SetValue("1.3.6.1.2.1.1.6.0", "lab");
-  host_.SetValue("1.3.6.1.2.1.1.7.0", "72");
+  constexpr std::array<std::array<const char*, 2>, 7> kSystem{{{"1", "Tessel router"},
+                                                              {"2", ".1.3.6.1.4.1.99999"},
+                                                              {"3", "12345"},
+                                                              {"4", "ops"},
+                                                              {"5", "r1"},
+                                                              {"6", "lab"},
+                                                              {"7", "72"}}};
+  for (const auto& [column, value] : kSystem) host_.SetValue(std::string("1.3.6.1.2.1.1.") + column + ".0", value);
   for (int i = 1; i <= 4; ++i) {
     const std::string n = std::to_string(i);
     host_.SetValue("1.3.6.1.2.1.2.2.1.1." + n, n);
