@@ -42,14 +42,17 @@ WORK=$(mktemp -d /tmp/tessel-bench.XXXXXX)
 log() { printf 'bench: %s\n' "$*" >&2; }
 skipped() { [[ " $SKIP " == *" $1 "* ]]; }
 
-# Stops every server this script started (each leads its own process group) and removes the
-# temporary directory.
+# Stops the load generator and every server this script started (each server leads its own
+# process group) and removes the temporary directory.
+LOADGEN_PID=
 cleanup() {
   local group
+  [ -n "$LOADGEN_PID" ] && kill -TERM "$LOADGEN_PID" 2>/dev/null
   for group in "${SERVER_GROUPS[@]}"; do stop_group "$group"; done
   rm -rf "$WORK"
 }
 trap cleanup EXIT
+trap 'exit 130' INT TERM
 
 # stop_group PGID: SIGTERM, then SIGKILL after 10 s for whatever is left of the group.
 stop_group() {
@@ -98,8 +101,13 @@ wait_for_answer() {
 measure() {
   local server=$1 workload=$2 targets=$3 port=$4 line
   # shellcheck disable=SC2086  # REQUEST holds several words on purpose
-  line=$("$LOADGEN" --targets "$targets" --port "$port" ${REQUEST[$workload]} --window "$WINDOW" \
-    --warmup "$WARMUP" --duration "$DURATION" --cpu "$LOADGEN_CPU" --quiet | grep '^RESULT' || true)
+  # In the background, so that a signal to this script is handled at once, not after the run.
+  "$LOADGEN" --targets "$targets" --port "$port" ${REQUEST[$workload]} --window "$WINDOW" \
+    --warmup "$WARMUP" --duration "$DURATION" --cpu "$LOADGEN_CPU" --quiet >"$WORK/result" &
+  LOADGEN_PID=$!
+  wait "$LOADGEN_PID" || true
+  LOADGEN_PID=
+  line=$(grep '^RESULT' "$WORK/result" || true)
   RESULT["$server $workload"]=$line
   log "$server $workload: ${line:-no result}"
 }
