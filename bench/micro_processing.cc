@@ -29,6 +29,10 @@ void RunRequest(benchmark::State& state, const std::vector<std::uint8_t>& reques
   if (!DecodeReply(reply.data(), replyBytes, &summary) || summary.errorStatus != 0) {
     state.SkipWithError("the reply carries an error status");
   }
+  SnmpPdu parsed;
+  if (ParseSnmpMessage(reply.data(), replyBytes, &parsed) == 1) {
+    state.counters["bindings"] = static_cast<double>(parsed.requestVarBinds.size());
+  }
   state.counters["reply_bytes"] = static_cast<double>(replyBytes);
 }
 
