@@ -1,15 +1,17 @@
 #!/usr/bin/env bash
-# ./tessel bench: the same SNMP workloads, in one run, against Tessel, net-snmp snmpd and a UDP
-# echo server (the machine's ceiling), all on loopback, the server pinned to one CPU and the
-# load generator to another. Prints one table of responses/s, ratios and latency.
+# ./tessel bench: the same SNMP workloads, in one run, against Tessel, net-snmp snmpd, snmpsim
+# (serving a recording of that snmpd) and a UDP echo server (the machine's ceiling), all on
+# loopback, the server pinned to one CPU and the load generator to another. Prints one table of
+# responses/s, ratios and latency.
 #
 # Environment (defaults in brackets):
 #   BENCH_WARMUP [3]  BENCH_DURATION [10]  seconds of warm-up and of measurement per figure
 #   BENCH_WINDOW [64]  outstanding requests       BENCH_DEVICES [100]  Tessel agents
 #   BENCH_SERVER_CPU [0]  BENCH_LOADGEN_CPU [1]
-#   BENCH_SNMPD_PORT [11161]  BENCH_TESSEL_PORT [11171]  BENCH_ECHO_PORT [12000]
+#   BENCH_SNMPD_PORT [11161]  BENCH_TESSEL_PORT [11171]  BENCH_SNMPSIM_PORT [11181]
+#   BENCH_ECHO_PORT [12000]
 #   BENCH_TESSEL_ADDRESS [127.0.1.1]  BENCH_TESSEL_START_TIMEOUT [300] seconds
-#   BENCH_SKIP [""]  any of "tessel snmpd echo" to leave out
+#   BENCH_SKIP [""]  any of "tessel snmpd snmpsim echo" to leave out (snmpsim needs snmpd)
 set -euo pipefail
 
 ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
@@ -23,6 +25,7 @@ LOADGEN_CPU=${BENCH_LOADGEN_CPU:-1}
 SNMPD_PORT=${BENCH_SNMPD_PORT:-11161}
 TESSEL_PORT=${BENCH_TESSEL_PORT:-11171}
 ECHO_PORT=${BENCH_ECHO_PORT:-12000}
+SNMPSIM_PORT=${BENCH_SNMPSIM_PORT:-11181}
 TESSEL_ADDRESS=${BENCH_TESSEL_ADDRESS:-127.0.1.1}
 TESSEL_START_TIMEOUT=${BENCH_TESSEL_START_TIMEOUT:-300}
 SKIP=${BENCH_SKIP:-}
@@ -38,6 +41,7 @@ declare -A REQUEST=(
 declare -A RESULT=()  # "server workload" -> RESULT line of the load generator
 declare -a SERVER_GROUPS=()
 WORK=$(mktemp -d /tmp/tessel-bench.XXXXXX)
+chmod 711 "$WORK"  # servers that drop to nobody reach their own subdirectories
 
 log() { printf 'bench: %s\n' "$*" >&2; }
 skipped() { [[ " $SKIP " == *" $1 "* ]]; }
@@ -116,12 +120,13 @@ field() {  # field "RESULT line" KEY
   sed -nE "s/.* $2=([^ ]+).*/\1/p" <<<"$1"
 }
 
-ensure_snmpd() {
-  command -v snmpd >/dev/null 2>&1 || [ -x /usr/sbin/snmpd ] && return 0
-  if [ "$(id -u)" -ne 0 ]; then log "snmpd is missing (install the Debian package snmpd)"; return 1; fi
-  log "installing snmpd"
+# ensure_package PACKAGE PROGRAM
+ensure_package() {
+  [ -x "$2" ] && return 0
+  if [ "$(id -u)" -ne 0 ]; then log "$2 is missing (install the Debian package $1)"; return 1; fi
+  log "installing $1"
   apt-get update -qq
-  DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends snmpd >/dev/null
+  DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends "$1" >/dev/null
 }
 
 build_tools() {
@@ -132,7 +137,7 @@ build_tools() {
 }
 
 run_snmpd() {
-  ensure_snmpd || return 0
+  ensure_package snmpd /usr/sbin/snmpd || return 0
   mkdir -p "$WORK/snmpd"
   chmod 777 "$WORK/snmpd"
   printf 'agentAddress udp:127.0.0.1:%s\nrocommunity public 127.0.0.1\n' "$SNMPD_PORT" >"$WORK/snmpd/snmpd.conf"
@@ -146,6 +151,33 @@ run_snmpd() {
     finish_server "$group"; return 0
   fi
   for workload in "${WORKLOADS[@]}"; do measure snmpd "$workload" 127.0.0.1 "$SNMPD_PORT"; done
+  skipped snmpsim || record_snmpd
+  finish_server "$group"
+}
+
+# The system group and ifTable of the running snmpd, as snmpsim's data file for community public.
+record_snmpd() {
+  ensure_package snmpsim /usr/bin/snmprec || return 0
+  mkdir -p "$WORK/snmpsim" "$WORK/snmpsim-cache"
+  chmod 755 "$WORK/snmpsim"
+  chmod 777 "$WORK/snmpsim-cache"
+  snmprec --agent-udpv4-endpoint=127.0.0.1:"$SNMPD_PORT" --community=public --start-object=1.3.6.1.2.1.1 \
+    --stop-object=1.3.6.1.2.1.3 --output-file="$WORK/snmpsim/public.snmprec" >"$WORK/snmprec.log" 2>&1 ||
+    { log "snmprec failed:"; tail -n 5 "$WORK/snmprec.log" >&2; rm -f "$WORK/snmpsim/public.snmprec"; }
+}
+
+run_snmpsim() {
+  [ -s "$WORK/snmpsim/public.snmprec" ] || { log "no recording of snmpd: snmpsim left out"; return 0; }
+  local user=()
+  [ "$(id -u)" -eq 0 ] && user=(--process-user=nobody --process-group=nogroup)
+  start_server snmpsim snmpsimd --data-dir="$WORK/snmpsim" --agent-udpv4-endpoint=127.0.0.1:"$SNMPSIM_PORT" \
+    --cache-dir="$WORK/snmpsim-cache" "${user[@]}"
+  local group=$SERVER_GROUP workload
+  if ! wait_for_answer 127.0.0.1 "$SNMPSIM_PORT" 60 "$group"; then
+    log "snmpsim did not answer; its log:"; tail -n 20 "$WORK/snmpsim.log" >&2
+    finish_server "$group"; return 0
+  fi
+  for workload in "${WORKLOADS[@]}"; do measure snmpsim "$workload" 127.0.0.1 "$SNMPSIM_PORT"; done
   finish_server "$group"
 }
 
@@ -199,8 +231,8 @@ latency() {
 
 print_table() {
   local workload ratio tessel snmpd
-  printf '\n%-8s %12s %12s %12s %13s %18s %18s %18s\n' workload tessel/s snmpd/s echo/s tessel/snmpd \
-    'tessel p50/p99 us' 'snmpd p50/p99 us' 'echo p50/p99 us'
+  printf '\n%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' workload tessel/s snmpd/s snmpsim/s echo/s \
+    tessel/snmpd 'tessel p50/p99 us' 'snmpd p50/p99 us' 'snmpsim p50/p99 us' 'echo p50/p99 us'
   for workload in "${WORKLOADS[@]}"; do
     tessel=$(cell tessel "$workload" rate)
     snmpd=$(cell snmpd "$workload" rate)
@@ -208,9 +240,10 @@ print_table() {
     if [ "$tessel" != - ] && [ "$snmpd" != - ] && [ "$snmpd" != 0 ]; then
       ratio=$(awk -v t="$tessel" -v s="$snmpd" 'BEGIN { printf "%.2f", t / s }')
     fi
-    printf '%-8s %12s %12s %12s %13s %18s %18s %18s\n' "$workload" "$tessel" "$snmpd" \
-      "$(cell echo "$workload" rate)" "$ratio" "$(latency tessel "$workload")" \
-      "$(latency snmpd "$workload")" "$(latency echo "$workload")"
+    printf '%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' "$workload" "$tessel" "$snmpd" \
+      "$(cell snmpsim "$workload" rate)" "$(cell echo "$workload" rate)" "$ratio" \
+      "$(latency tessel "$workload")" "$(latency snmpd "$workload")" "$(latency snmpsim "$workload")" \
+      "$(latency echo "$workload")"
   done
   printf '\nwindow %s, %s s warm-up + %s s measured, server on CPU %s, load generator on CPU %s, %s Tessel agents\n' \
     "$WINDOW" "$WARMUP" "$DURATION" "$SERVER_CPU" "$LOADGEN_CPU" "$DEVICES"
@@ -234,6 +267,7 @@ main() {
   build_tools
   skipped echo || run_echo
   skipped snmpd || run_snmpd
+  skipped snmpsim || run_snmpsim
   skipped tessel || run_tessel
   print_table
 }
