@@ -8,6 +8,8 @@
 #include "snmp/handlers.h"
 #include "snmp/mib_tree.h"
 #include "snmp/service.h"
+#include "snmpv3/engine_id.h"
+#include "snmpv3/v3_config.h"
 
 namespace tessel {
 namespace {
@@ -26,6 +28,7 @@ Lifecycle& TheLifecycle() {
 // The service may already run: startSnmpNetwork marks it started before initSnmpThread.
 bool StartServicesLocked(Lifecycle& lifecycle) {
   if (!lifecycle.servicesRunning) {
+    InitSnmpV3Params();
     if (!InitSnmpGeneralServices()) return false;
     lifecycle.servicesRunning = true;
   }
@@ -39,6 +42,7 @@ void StopSnmpLocked(Lifecycle& lifecycle) {
     StopSnmpGeneralServices();
     lifecycle.servicesRunning = false;
   }
+  FreeSnmpV3Resources();
   if (gv_snmpServiceStarted.load() == 0) return;
   FreeSimulatorResources();
   FreeTreeCells();
@@ -70,6 +74,8 @@ bool InitAgentParams(const EngineParams& params) {
 void InitAgentRegistry() {
   LOG_TRACE("\n\t@@@@@ Inside jniJVMparams() @@@@@ \n");
   FreeSimulatorResources();
+  // SNMPv3 rows may arrive before the service starts; they are kept under this engine ID.
+  ReadFromSnmpV3ConfFile();
 }
 
 bool InitSnmpThread() {

@@ -19,6 +19,9 @@ inline std::atomic<std::uint32_t> gv_engineBoots{0};
 inline std::atomic<std::int32_t> gv_ipv6InterfaceIndex{0};
 // Set once an SNMPv3 user is configured: the engine then speaks SNMPv3.
 inline std::atomic<bool> gv_snmpv3Configured{false};
+// SNMPv3 Reports and unauthenticated replies carry the agent's boots and time (so that a manager
+// can synchronise at discovery) while set; 0 and 0 otherwise. Given with every USM user.
+inline std::atomic<bool> gv_discoveryTimeFlag{true};
 // Authentication-failure traps on a bad community.
 inline std::atomic<bool> gv_authenticationTraps{false};
 

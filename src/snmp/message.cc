@@ -8,6 +8,7 @@
 #include "snmp/ber.h"
 #include "snmp/pdu_codec.h"
 #include "snmp/statistics.h"
+#include "snmpv3/v3_message.h"
 
 namespace tessel {
 namespace {
@@ -174,6 +175,34 @@ bool CreateSnmpMessage(const std::uint8_t* requestBindings, std::size_t requestB
 
 namespace {
 
+// The version of a message, or -1 when it cannot be read.
+std::int32_t MessageVersion(const std::uint8_t* message, std::size_t length) {
+  std::int32_t remaining = static_cast<std::int32_t>(length);
+  std::uint8_t type = 0;
+  const std::uint8_t* cursor = length > 0 ? AsnParseHeader(message, &remaining, &type) : nullptr;
+  std::int32_t version = -1;
+  if (cursor == nullptr || type != kAsnSequence) return -1;
+  if (AsnParseInt(cursor, &remaining, &type, &version) == nullptr || type != kAsnInteger) return -1;
+  return version;
+}
+
+// An SNMPv1 or SNMPv2c message.
+int ProcessCommunityMessage(const std::uint8_t* message, std::size_t length, std::uint8_t* reply,
+                            std::size_t* replyLength, const AgentSession& agent) {
+  SnmpPdu pdu;
+  PduLayout layout;
+  switch (ParseMessage(message, length, &pdu, &layout, true)) {
+    case ParseResult::kParsed:
+      return ProcessParsedRequest(message, length, layout, &pdu, reply, replyLength, agent);
+    case ParseResult::kMalformed:
+      CountSnmp(SnmpCounter::kAsnParseErrors);
+      return kMessageDrop;
+    case ParseResult::kDropped:
+      return kMessageDrop;
+  }
+  return kMessageDrop;
+}
+
 int ProcessDatagram(const std::uint8_t* message, std::size_t length, std::uint8_t* reply,
                     std::size_t* replyLength, const AgentSession& agent) {
   if (length >= kMaxRequestSize) {
@@ -183,19 +212,9 @@ int ProcessDatagram(const std::uint8_t* message, std::size_t length, std::uint8_
     return kMessageDrop;
   }
   CountSnmp(SnmpCounter::kInMessages);
-  SnmpPdu pdu;
-  PduLayout layout;
-  int result = kMessageDrop;
-  switch (ParseMessage(message, length, &pdu, &layout, true)) {
-    case ParseResult::kParsed:
-      result = ProcessParsedRequest(message, length, layout, &pdu, reply, replyLength, agent);
-      break;
-    case ParseResult::kMalformed:
-      CountSnmp(SnmpCounter::kAsnParseErrors);
-      break;
-    case ParseResult::kDropped:
-      break;
-  }
+  bool v3 = gv_snmpv3Configured.load() && MessageVersion(message, length) == kSnmpV3;
+  int result = v3 ? ProcessSnmpV3Message(message, length, reply, replyLength, agent)
+                  : ProcessCommunityMessage(message, length, reply, replyLength, agent);
   if (result == kMessageDrop) {
     LOG_ERROR("PACKET DROPPED !!! \n");
     CountSnmp(SnmpCounter::kDroppedRequests);

@@ -77,7 +77,7 @@ class JniHostTest : public ::testing::Test {
   }
 
   using Texts = std::vector<std::optional<std::string>>;
-  static constexpr const char* kHandler = "com/kestrelon/simulator/tessel/snmp/SnmpHandler";
+  static constexpr const char* kHandler = "com/kestrelon/simulator/tessel/NativeProbe$MemoryHandler";
   static inline JavaVM* vm_ = nullptr;
   static inline JNIEnv* env_ = nullptr;
   static inline jobject simulator_ = nullptr;

@@ -1,20 +1,36 @@
 package com.kestrelon.simulator.tessel;
 
+import java.io.PrintStream;
 import java.nio.charset.StandardCharsets;
+import java.util.ArrayDeque;
 import java.util.ArrayList;
 import java.util.List;
 
 /**
  * The engine's front door: initialisation, the base loop, the stop calls and the request filters.
  * The engine calls back {@link #getBytes} to read Java texts and {@link #printStatus} to report
- * status lines; both may be called from any thread.
+ * status lines; both may be called from any thread. Status lines are written to the status
+ * stream, each flushed as it is written, and the most recent {@value #KEPT_STATUS_LINES} are kept
+ * for {@link #statusLines()}.
  */
 public class NetworkSimulator {
   static {
     NativeLibrary.load();
   }
 
-  private final List<String> statusLines = new ArrayList<>();
+  private static final int KEPT_STATUS_LINES = 4096;
+
+  private final ArrayDeque<String> statusLines = new ArrayDeque<>();
+  private final PrintStream statusStream;
+
+  /** Status lines go to standard output. */
+  public NetworkSimulator() {
+    this(System.out);
+  }
+
+  public NetworkSimulator(PrintStream statusStream) {
+    this.statusStream = statusStream;
+  }
 
   public native boolean nativeInitAgentParams(
       boolean consoleMode, byte debugLevel, String logFile, int reserved, int maxLogFileSize);
@@ -46,12 +62,18 @@ public class NetworkSimulator {
 
   public void printStatus(String line) {
     synchronized (statusLines) {
-      statusLines.add(line);
+      if (statusLines.size() == KEPT_STATUS_LINES) {
+        statusLines.removeFirst();
+      }
+      statusLines.addLast(line);
     }
-    System.out.println(line);
+    synchronized (statusStream) {
+      statusStream.println(line);
+      statusStream.flush();
+    }
   }
 
-  /** The status lines reported so far, oldest first. */
+  /** The most recent status lines, oldest first. */
   public List<String> statusLines() {
     synchronized (statusLines) {
       return new ArrayList<>(statusLines);

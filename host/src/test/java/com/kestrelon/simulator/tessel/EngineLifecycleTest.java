@@ -117,6 +117,7 @@ class EngineLifecycleTest {
   @Test
   void registeredCellsAnswerGetNextGroupOid() {
     SnmpRegister register = new SnmpRegister();
+    int before = handler.jnistoreTreeCellReferences();
     assertTrue(register.JniCreateTreeCell("system", null, "V2", ".1.3.6.1.2.1.1.1", 3,
         strings("1", "2", "3"), strings("4", "6", "67"), strings("43690", "43690", "43690"), false, 0,
         null));
@@ -125,9 +126,11 @@ class EngineLifecycleTest {
         strings("InterfaceIndex", "DisplayString")));
     assertFalse(register.JniCreateTreeCell("short", null, "V2", ".1.3.6.1.4.1.1", 3,
         strings("1"), strings("2"), strings("43690"), false, 0, null));
-    assertEquals(2, handler.jnistoreTreeCellReferences());
+    assertTrue(register.JniCreateTreeCell("last", null, "V2", ".1.3.6.1.9.9.9.1", 1,
+        strings("1"), strings("2"), strings("43690"), false, 0, null));
+    assertEquals(before + 3, handler.jnistoreTreeCellReferences());
     assertEquals(".1.3.6.1.2.1.2.2.1", handler.GetNextGroupOid(".1.3.6.1.2.1.1.1.0"));
-    assertNull(handler.GetNextGroupOid(".1.3.6.1.2.1.2.2.1.1.1"), "the last cell has no next");
+    assertNull(handler.GetNextGroupOid(".1.3.6.1.9.9.9.1.0"), "the last cell has no next");
   }
 
   @Test

@@ -4,8 +4,28 @@ import com.kestrelon.simulator.tessel.NativeLibrary;
 
 /**
  * The SNMP side of the engine: agent registration and lifecycle, and the value methods the engine
- * calls (concurrently, from its request threads) for every Get, GetNext and Set. Values are kept
- * in a {@link ValueStore}; an answer is {value, error} ("-1" no error), null when there is none.
+ * calls, concurrently from its request threads, for every Get, GetNext and Set. Values come from
+ * a {@link DeviceStore}: the recorded data every device shares plus each agent's own Sets.
+ *
+ * <p>What the engine can rely on:
+ * <ul>
+ *   <li>An answer is {value, error}, with error "-1" when there is none; a table GetNext answers
+ *       {value, "column.instance" relative to the entry OID, error}. A null answer means no such
+ *       instance.</li>
+ *   <li>Values are engine texts: every octet-typed value (OCTET STRING, BIT STRING, Opaque,
+ *       NsapAddress) as {@code 'hex'h}, OID values with a leading dot, IpAddress dotted, numbers
+ *       decimal.</li>
+ *   <li>{@link #ScalarGetNextOidVal} answers the object its sub-identifier names: the engine has
+ *       already chosen the next object.</li>
+ *   <li>{@link #TableGetNextOidVal} answers the next instance of the same column in OID order
+ *       (numerically, sub-identifier by sub-identifier), or null when the column is exhausted.</li>
+ *   <li>A Set changes the one agent it is for, keyed by agent id (the port the engine passes with
+ *       a Set is the stored one, not the configured one). Set texts of the form {@code '...'h} are
+ *       read as hex octets. An object the data does not have answers error "17" (notWritable); a
+ *       text that is not a value of the object's type answers "10" (wrongValue). A successful Set
+ *       answers the canonical text stored.</li>
+ * </ul>
+ * The engine reads texts from the host as UTF-8 ({@code NetworkSimulator.getBytes}).
  */
 public class SnmpHandler {
   static {
@@ -13,13 +33,24 @@ public class SnmpHandler {
   }
 
   private static final String NO_ERROR = "-1";
+  private static final String WRONG_VALUE = "10";
+  private static final String NOT_WRITABLE = "17";
 
-  private final ValueStore values = new ValueStore();
+  private final DeviceStore store;
   private volatile String status = "";
   private volatile int progress;
 
-  public ValueStore values() {
-    return values;
+  /** A handler without objects: every Get finds nothing and every Set is refused. */
+  public SnmpHandler() {
+    this(DeviceStore.empty());
+  }
+
+  public SnmpHandler(DeviceStore store) {
+    this.store = store;
+  }
+
+  public DeviceStore store() {
+    return store;
   }
 
   public String status() {
@@ -77,39 +108,43 @@ public class SnmpHandler {
     return value == null ? null : new String[] {value, NO_ERROR};
   }
 
-  private String[] store(String oid, String value) {
-    values.put(oid, value);
-    return new String[] {value, NO_ERROR};
+  private String[] store(int agentId, String oidText, String value) {
+    try {
+      String stored = store.set(agentId, oidText, value);
+      return stored == null ? new String[] {value, NOT_WRITABLE} : new String[] {stored, NO_ERROR};
+    } catch (IllegalArgumentException e) {
+      return new String[] {value, WRONG_VALUE};
+    }
   }
 
   public String[] ScalarGetOidVal(String label, String groupOid, String subId, String instance,
       String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
       String address, int port, String syntax) {
-    return answer(values.get(groupOid + "." + subId + instance));
+    return answer(store.get(agentId, groupOid + "." + subId + instance));
   }
 
   public String[] ScalarGetNextOidVal(String label, String groupOid, String subId, String instance,
       String previousSubId, String databaseName, String tableName, int dataType, int agentId,
       int rowStatusColumn, String address, int port, String syntax) {
-    return answer(values.get(groupOid + "." + subId + instance));
+    return answer(store.get(agentId, groupOid + "." + subId + instance));
   }
 
   public String[] SetOidVal(String label, String groupOid, String subId, String instance,
       String databaseName, String tableName, String value, int dataType, int agentId,
       int rowStatusColumn, String address, int port, String syntax) {
-    return store(groupOid + "." + subId + instance, value);
+    return store(agentId, groupOid + "." + subId + instance, value);
   }
 
   public String[] TableGetOidVal(String label, String entryOid, String column, String instance,
       String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
       String address, int port, String syntax) {
-    return answer(values.get(entryOid + "." + column + instance));
+    return instance == null ? null : answer(store.get(agentId, entryOid + "." + column + instance));
   }
 
   public String[] TableGetNextOidVal(String label, String entryOid, String instance, int column,
       int nextColumn, int dataType, int nextDataType, String databaseName, String tableName,
       int agentId, int rowStatusColumn, String address, int port, String syntax) {
-    String[] next = values.nextInColumn(entryOid, column, instance);
+    String[] next = store.nextInColumn(agentId, entryOid, column, instance);
     return next == null ? null : new String[] {next[0], next[1], NO_ERROR};
   }
 
@@ -117,7 +152,10 @@ public class SnmpHandler {
       String databaseName, String tableName, String value, String[] rowColumns, String[] rowValues,
       String[] rowTypes, String[] extraColumns, String[] extraValues, String[] extraTypes,
       int dataType, int agentId, int rowStatusColumn, String address, int port, String syntax) {
-    return store(entryOid + "." + column + instance, value);
+    if (instance == null) {
+      return new String[] {value, NOT_WRITABLE};
+    }
+    return store(agentId, entryOid + "." + column + instance, value);
   }
 
   public void setStatus(String text) {

@@ -4,7 +4,10 @@ import java.util.Arrays;
 import java.util.Map;
 import java.util.concurrent.ConcurrentSkipListMap;
 
-/** Object values by OID, in OID order. Thread-safe: the engine reads it from many threads. */
+/**
+ * Object values by OID, in OID order, stored as given: the memory of the handler the host-bridge
+ * tests bind. Thread-safe: the engine reads it from many threads.
+ */
 public final class ValueStore {
   private final ConcurrentSkipListMap<int[], String> values =
       new ConcurrentSkipListMap<>(Arrays::compareUnsigned);

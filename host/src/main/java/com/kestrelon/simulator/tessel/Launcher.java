@@ -1,0 +1,209 @@
+package com.kestrelon.simulator.tessel;
+
+import com.kestrelon.simulator.tessel.LaunchOptions.UsageException;
+import com.kestrelon.simulator.tessel.data.CellDefinition;
+import com.kestrelon.simulator.tessel.data.DeviceData;
+import com.kestrelon.simulator.tessel.data.DeviceDataException;
+import com.kestrelon.simulator.tessel.data.MibLayout;
+import com.kestrelon.simulator.tessel.snmp.DeviceStore;
+import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
+import com.kestrelon.simulator.tessel.snmp.SnmpRegister;
+import java.io.IOException;
+import java.io.PrintStream;
+import java.nio.file.NoSuchFileException;
+import java.nio.file.Path;
+import java.util.Arrays;
+import java.util.List;
+
+/**
+ * {@code ./tessel run}: loads the device data, registers its objects and the devices with the
+ * engine, and serves them on the calling thread until {@link #requestStop()} (SIGINT or SIGTERM
+ * when started from {@link #main}).
+ *
+ * <p>Exit statuses: 0 after a stop, 1 when the engine refuses the network or no device starts,
+ * 2 for a usage error or faulty data (the message on the error stream; a data fault reads
+ * {@code FILE:LINE: reason}). The engine's status lines go to the output stream; nothing else
+ * does. A stop that comes while the network is starting ends the start-up before the next step.
+ */
+public final class Launcher {
+  /** The most agents one startSnmpNetwork call takes. */
+  static final int AGENTS_PER_CALL = 32_767;
+
+  private static final String DEFAULT_PROFILE = "router.snmprec";
+  private static final int MAX_LOG_FILE_SIZE = 100 << 20;
+  private static final int ENGINE_BOOTS = 1;
+
+  private final Object lifecycle = new Object();
+  private boolean stopRequested; // guarded by lifecycle
+  private NetworkSimulator engine; // guarded by lifecycle: set once the engine is initialised
+
+  public static void main(String[] args) {
+    Launcher launcher = new Launcher();
+    launcher.stopOnSignals();
+    int status = launcher.run(args, System.out, System.err);
+    if (status != 0) {
+      System.exit(status);
+    }
+  }
+
+  /** The data file used without --snmp-data: the router profile of the profiles directory. */
+  static Path defaultData() {
+    return Path.of(System.getProperty("tessel.profiles.dir", "profiles"), DEFAULT_PROFILE);
+  }
+
+  /** Starts the network of the command line and serves it until a stop; returns the exit status. */
+  public int run(String[] args, PrintStream out, PrintStream err) {
+    LaunchOptions options;
+    try {
+      options = LaunchOptions.parse(args, defaultData());
+    } catch (UsageException e) {
+      err.println("tessel: " + e.getMessage());
+      err.println("usage: ./tessel run [options]   (--help lists them)");
+      return 2;
+    }
+    if (options.help()) {
+      out.print(LaunchOptions.USAGE);
+      return 0;
+    }
+    DeviceData data;
+    List<CellDefinition> cells;
+    try {
+      data = DeviceData.load(options.dataFile());
+      cells = MibLayout.infer(data);
+    } catch (DeviceDataException e) {
+      err.println(e.getMessage());
+      return 2;
+    } catch (NoSuchFileException e) {
+      err.println(options.dataFile() + ": no such file");
+      return 2;
+    } catch (IOException e) {
+      err.println(options.dataFile() + ": cannot be read: " + e.getMessage());
+      return 2;
+    }
+    return serve(options, data, cells, out, err);
+  }
+
+  /** Stops the network, or the start-up in progress; later calls do nothing. Any thread. */
+  public void requestStop() {
+    synchronized (lifecycle) {
+      if (stopRequested) {
+        return;
+      }
+      stopRequested = true;
+      if (engine != null) {
+        engine.AdapterJniStopNetwork();
+      }
+    }
+  }
+
+  /** SIGINT and SIGTERM stop the network; the process then ends with status 0. */
+  private void stopOnSignals() {
+    sun.misc.SignalHandler handler = signal -> requestStop();
+    sun.misc.Signal.handle(new sun.misc.Signal("INT"), handler);
+    sun.misc.Signal.handle(new sun.misc.Signal("TERM"), handler);
+  }
+
+  private int serve(LaunchOptions options, DeviceData data, List<CellDefinition> cells,
+      PrintStream out, PrintStream err) {
+    NetworkSimulator simulator = new NetworkSimulator(out);
+    SnmpHandler handler = new SnmpHandler(new DeviceStore(data));
+    synchronized (lifecycle) {
+      if (stopRequested) {
+        return 0;
+      }
+      String logFile = Path.of(options.logFile()).toAbsolutePath().toString();
+      if (!simulator.nativeInitAgentParams(false, (byte) options.logLevel(), logFile, 0,
+          MAX_LOG_FILE_SIZE)) {
+        err.println("tessel: the engine cannot open its log file " + logFile);
+        return 2;
+      }
+      engine = simulator;
+      if (!handler.jniJVMparams()) {
+        return fail(err, "the engine did not accept the host");
+      }
+      String refused = registerCells(cells);
+      if (refused != null) {
+        return fail(err, "the engine refused the objects registered at " + refused);
+      }
+    }
+    int started = 0;
+    String databaseName = String.valueOf(options.dataFile().getFileName());
+    for (int first = 0; first < options.devices(); first += AGENTS_PER_CALL) {
+      synchronized (lifecycle) {
+        if (stopRequested) {
+          return 0;
+        }
+        started += startAgents(handler, options, databaseName, first,
+            Math.min(AGENTS_PER_CALL, options.devices() - first));
+      }
+    }
+    synchronized (lifecycle) {
+      if (stopRequested) {
+        return 0;
+      }
+      if (started == 0) {
+        return fail(err, "no device started");
+      }
+      if (!handler.initSnmpThread()) {
+        return fail(err, "the engine's SNMP service did not start");
+      }
+    }
+    simulator.jniBaseLoop();
+    return 0;
+  }
+
+  /** Reports a failed start-up and stops the engine; the caller holds the lifecycle lock. */
+  private int fail(PrintStream err, String reason) {
+    err.println("tessel: " + reason);
+    stopRequested = true;
+    engine.AdapterJniStopNetwork();
+    return 1;
+  }
+
+  /** Registers every cell; returns the OID of the first the engine refuses, or null. */
+  private static String registerCells(List<CellDefinition> cells) {
+    SnmpRegister register = new SnmpRegister();
+    for (CellDefinition cell : cells) {
+      int count = cell.subIds().size();
+      if (!register.JniCreateTreeCell(cell.label(), null, "V2", "." + cell.oid(), count,
+          cell.subIds().toArray(String[]::new), cell.dataTypes().toArray(String[]::new),
+          cell.accessTexts().toArray(String[]::new), cell.isTable(), cell.rowStatusColumn(),
+          null)) {
+        return cell.oid();
+      }
+    }
+    return null;
+  }
+
+  /** Registers and opens devices [first, first + count); returns how many opened. */
+  private static int startAgents(SnmpHandler handler, LaunchOptions options, String databaseName,
+      int first, int count) {
+    int[] agentIds = new int[count];
+    String[] tableNames = new String[count];
+    String[] addresses = new String[count];
+    for (int i = 0; i < count; i++) {
+      agentIds[i] = first + i;
+      tableNames[i] = "device" + (first + i);
+      addresses[i] = options.address(first + i);
+    }
+    int[] ports = filled(count, options.port());
+    // The engine splits a community text at ',': the write community also reads.
+    String[] reads = filled(count, options.readCommunity() + "," + options.writeCommunity());
+    String[] writes = filled(count, options.writeCommunity());
+    int[] sockets = handler.startSnmpNetwork(agentIds, tableNames, addresses, ports, reads, writes,
+        filled(count, ENGINE_BOOTS), databaseName, new int[count]);
+    return sockets == null ? 0 : (int) Arrays.stream(sockets).filter(socket -> socket > 0).count();
+  }
+
+  private static int[] filled(int count, int value) {
+    int[] array = new int[count];
+    Arrays.fill(array, value);
+    return array;
+  }
+
+  private static String[] filled(int count, String value) {
+    String[] array = new String[count];
+    Arrays.fill(array, value);
+    return array;
+  }
+}

@@ -1,0 +1,561 @@
+#include "snmpv3/v3_message.h"
+
+#include <algorithm>
+#include <array>
+#include <atomic>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "engine/engine_state.h"
+#include "engine/log.h"
+#include "snmp/ber.h"
+#include "snmp/message.h"
+#include "snmp/pdu_codec.h"
+#include "snmp/statistics.h"
+#include "snmpv3/engine_id.h"
+#include "snmpv3/usm_crypto.h"
+#include "snmpv3/usm_users.h"
+#include "snmpv3/vacm.h"
+
+namespace tessel {
+namespace {
+
+constexpr std::int32_t kUsmSecurityModel = 3;
+constexpr std::int32_t kMinimumMessageSize = 484;  // RFC 3412: smaller msgMaxSize is invalid
+constexpr std::uint32_t kTimeWindow = 150;
+constexpr std::size_t kDigestLength = kUsmDigestLength;
+constexpr std::size_t kSaltLength = kUsmSaltLength;
+constexpr std::uint8_t kAuthFlag = 0x01;
+constexpr std::uint8_t kPrivFlag = 0x02;
+
+
+std::array<std::atomic<std::uint32_t>, static_cast<std::size_t>(V3Counter::kCount)> v3Counters{};
+
+std::uint32_t CountV3(V3Counter counter) {
+  return v3Counters[static_cast<std::size_t>(counter)].fetch_add(1) + 1;
+}
+
+// The USM errors that are answered with a Report: which counter, and at which level.
+struct UsmError {
+  V3Counter counter;
+  std::uint32_t statsColumn;  // usmStats.<column>.0
+  std::uint8_t reportLevel;
+};
+constexpr UsmError kUnknownEngineId{V3Counter::kUnknownEngineIds, 4, kNoAuthNoPriv};
+constexpr UsmError kNotInTimeWindow{V3Counter::kNotInTimeWindows, 2, kAuthNoPriv};
+constexpr UsmError kUnknownUserName{V3Counter::kUnknownUserNames, 3, kNoAuthNoPriv};
+constexpr UsmError kUnsupportedSecLevel{V3Counter::kUnsupportedSecLevels, 1, kNoAuthNoPriv};
+constexpr UsmError kWrongDigest{V3Counter::kWrongDigests, 5, kNoAuthNoPriv};
+constexpr UsmError kDecryptionError{V3Counter::kDecryptionErrors, 6, kAuthNoPriv};
+
+// Appends TLVs to a buffer of fixed capacity; constructed headers take AsnBuildSequence's fixed
+// four-octet form and are closed once their contents are written.
+class Builder {
+ public:
+  explicit Builder(std::size_t capacity) : buffer_(capacity), remaining_(static_cast<std::int32_t>(capacity)) {}
+
+  std::size_t Open(std::uint8_t type) {
+    std::size_t at = Offset();
+    Advance(AsnBuildSequence(Cursor(), &remaining_, type, 0));
+    return at;
+  }
+  void Close(std::size_t header) {
+    if (ok_) ok_ = FillHeader(buffer_.data() + header, buffer_[header], Cursor());
+  }
+  void Integer(std::int32_t value) { Advance(AsnBuildInt(Cursor(), &remaining_, kAsnInteger, value)); }
+  std::size_t Octets(std::string_view octets) {
+    Advance(AsnBuildString(Cursor(), &remaining_, kAsnOctetString,
+                           reinterpret_cast<const std::uint8_t*>(octets.data()), octets.size()));
+    return Offset() - octets.size();
+  }
+  void Raw(const std::uint8_t* data, std::size_t length) {
+    if (!ok_ || length > static_cast<std::size_t>(remaining_)) {
+      ok_ = false;
+      return;
+    }
+    std::copy(data, data + length, Cursor());
+    remaining_ -= static_cast<std::int32_t>(length);
+    used_ += length;
+  }
+  // Lets a primitive write at the cursor with the remaining room.
+  template <typename Write>
+  void Append(Write write) {
+    if (ok_) Advance(write(Cursor(), &remaining_));
+  }
+
+  bool ok() const { return ok_; }
+  std::size_t Offset() const { return used_; }
+  std::uint8_t* Data() { return buffer_.data(); }
+
+ private:
+  std::uint8_t* Cursor() { return buffer_.data() + used_; }
+  void Advance(std::uint8_t* end) {
+    if (!ok_ || end == nullptr) {
+      ok_ = false;
+      return;
+    }
+    used_ = static_cast<std::size_t>(end - buffer_.data());
+  }
+
+  std::vector<std::uint8_t> buffer_;
+  std::int32_t remaining_;
+  std::size_t used_ = 0;
+  bool ok_ = true;
+};
+
+// ---- Parsing ----
+
+struct Reader {
+  const std::uint8_t* cursor;
+  std::int32_t remaining;
+
+  bool Header(std::uint8_t expected, std::int32_t* contents) {
+    std::int32_t length = remaining;
+    std::uint8_t type = 0;
+    const std::uint8_t* inside = AsnParseHeader(cursor, &length, &type);
+    if (inside == nullptr || type != expected) return false;
+    remaining -= static_cast<std::int32_t>(inside - cursor);
+    cursor = inside;
+    *contents = length;
+    return true;
+  }
+  bool Integer(std::int32_t* value) {
+    std::uint8_t type = 0;
+    const std::uint8_t* next = AsnParseInt(cursor, &remaining, &type, value);
+    if (next == nullptr || type != kAsnInteger) return false;
+    cursor = next;
+    return true;
+  }
+  bool Octets(std::string* out, std::size_t capacity) {
+    std::vector<std::uint8_t> buffer(capacity);
+    std::size_t length = capacity;
+    std::uint8_t type = 0;
+    const std::uint8_t* next = AsnParseString(cursor, &remaining, &type, buffer.data(), &length);
+    if (next == nullptr || type != kAsnOctetString) return false;
+    out->assign(reinterpret_cast<const char*>(buffer.data()), length);
+    cursor = next;
+    return true;
+  }
+};
+
+struct MessageHeader {
+  std::int32_t msgId = 0;
+  std::int32_t msgMaxSize = 0;
+  std::uint8_t flags = 0;
+  std::int32_t securityModel = 0;
+};
+
+struct SecurityParameters {
+  std::string engineId;
+  std::int32_t boots = 0;
+  std::int32_t time = 0;
+  std::string userName;
+  std::string authParameters;
+  std::size_t authOffset = 0;  // where the digest lies in the message
+  std::string privParameters;
+};
+
+// The scoped PDU: its context and the PDU, parsed from plaintext that this record keeps alive.
+struct ScopedPdu {
+  std::vector<std::uint8_t> plaintext;
+  std::string contextEngineId;
+  std::string contextName;
+  SnmpPdu pdu;
+  PduLayout layout;
+};
+
+// One received v3 message while it is checked.
+struct V3Request {
+  std::vector<std::uint8_t> message;  // a copy: the digest is zeroed in it before it is checked
+  MessageHeader header;
+  std::uint8_t level = kNoAuthNoPriv;
+  SecurityParameters security;
+  std::size_t scopedOffset = 0;
+  std::optional<UsmUser> user;
+  std::string agentEngineId;
+  std::uint32_t agentBoots = 0;
+  std::uint32_t agentTime = 0;
+};
+
+bool ParseHeader(Reader* reader, MessageHeader* header) {
+  std::int32_t contents = 0;
+  std::int32_t version = 0;
+  std::string flags;
+  if (!reader->Integer(&version) || version != 3 || !reader->Header(kAsnSequence, &contents) ||
+      !reader->Integer(&header->msgId) || !reader->Integer(&header->msgMaxSize) || !reader->Octets(&flags, 10) ||
+      flags.size() != 1 || !reader->Integer(&header->securityModel)) {
+    LOG_ERROR("Unable to parse SNMPV3 Message header...\n");
+    return false;
+  }
+  header->flags = static_cast<std::uint8_t>(flags[0]);
+  return true;
+}
+
+// msgFlags to a level; false for a combination that no message may carry.
+bool LevelFromFlags(std::uint8_t flags, std::uint8_t* level) {
+  if (flags >= 8 || ((flags & kPrivFlag) && !(flags & kAuthFlag))) {
+    LOG_ERROR("Invalid Security Level !!!\n");
+    return false;
+  }
+  *level = (flags & kPrivFlag) ? kAuthPriv : (flags & kAuthFlag) ? kAuthNoPriv : kNoAuthNoPriv;
+  return true;
+}
+
+bool ParseSecurityParameters(Reader* reader, const std::uint8_t* start, std::uint8_t level,
+                             SecurityParameters* security) {
+  std::int32_t contents = 0;
+  if (!reader->Header(kAsnOctetString, &contents) || !reader->Header(kAsnSequence, &contents) ||
+      !reader->Octets(&security->engineId, 255) || !reader->Integer(&security->boots) ||
+      !reader->Integer(&security->time) || !reader->Octets(&security->userName, 255)) {
+    LOG_ERROR("Parsing failed in Security parameters. \n");
+    return false;
+  }
+  if (!reader->Octets(&security->authParameters, kDigestLength)) {
+    LOG_ERROR("Unable to decode authParams (digest) !!!\n");
+    return false;
+  }
+  // The contents of an OCTET STRING end at the cursor.
+  security->authOffset = static_cast<std::size_t>(reader->cursor - start) - security->authParameters.size();
+  if (!reader->Octets(&security->privParameters, kSaltLength)) {
+    LOG_ERROR("Unable to parse the priv params %d .\n", 0);
+    return false;
+  }
+  if (level != kNoAuthNoPriv && security->authParameters.size() != kDigestLength) {
+    LOG_ERROR("Invalid authParamLen is received !!!\n");
+    return false;
+  }
+  if (level == kAuthPriv && security->privParameters.size() != kSaltLength) {
+    LOG_ERROR("Invalid privParamLen is received !!!\n");
+    return false;
+  }
+  return true;
+}
+
+// The scoped PDU from its plaintext: contextEngineID, contextName and the PDU.
+bool ParseScopedPdu(ScopedPdu* scoped, bool countIncoming) {
+  Reader reader{scoped->plaintext.data(), static_cast<std::int32_t>(scoped->plaintext.size())};
+  std::int32_t contents = 0;
+  if (!reader.Header(kAsnSequence, &contents) || !reader.Octets(&scoped->contextEngineId, 255) ||
+      !reader.Octets(&scoped->contextName, 255)) {
+    LOG_ERROR("Error in Parsing  Scoped pdu\n");
+    return false;
+  }
+  scoped->pdu.version = kSnmpV3;
+  return ParseSnmpPdu(scoped->plaintext.data(), reader.cursor, reader.remaining, &scoped->pdu, &scoped->layout,
+                      countIncoming) == ParseResult::kParsed;
+}
+
+// ---- Building ----
+
+std::string AuthKey(const V3Request& request) {
+  return GetLocalKeyValue(request.user->authPassword, request.user->auth, request.agentEngineId);
+}
+
+std::string PrivKey(const V3Request& request) {
+  return GetLocalKeyValue(request.user->privPassword, request.user->auth, request.agentEngineId);
+}
+
+struct OutgoingSecurity {
+  std::uint8_t level = kNoAuthNoPriv;
+  std::uint32_t boots = 0;
+  std::uint32_t time = 0;
+  std::string salt;
+};
+
+// The whole message around an already encoded scoped PDU field (plaintext SEQUENCE or the
+// encrypted OCTET STRING); authenticated when the level asks for it.
+bool WrapMessage(const V3Request& request, const OutgoingSecurity& out, const std::vector<std::uint8_t>& scopedField,
+                 std::uint8_t* reply, std::size_t* replyLength) {
+  Builder message(*replyLength);
+  std::size_t outer = message.Open(kAsnSequence);
+  message.Integer(3);
+  std::size_t global = message.Open(kAsnSequence);
+  message.Integer(request.header.msgId);
+  message.Integer(request.header.msgMaxSize);
+  message.Octets(std::string(1, static_cast<char>(out.level)));
+  message.Integer(kUsmSecurityModel);
+  message.Close(global);
+  std::size_t wrapper = message.Open(kAsnOctetString);
+  std::size_t parameters = message.Open(kAsnSequence);
+  message.Octets(request.agentEngineId);
+  message.Integer(static_cast<std::int32_t>(out.boots));
+  message.Integer(static_cast<std::int32_t>(out.time));
+  message.Octets(request.security.userName);
+  std::size_t digestAt = message.Octets(out.level == kNoAuthNoPriv ? std::string() : std::string(kDigestLength, '\0'));
+  message.Octets(out.salt);
+  message.Close(parameters);
+  message.Close(wrapper);
+  message.Raw(scopedField.data(), scopedField.size());
+  message.Close(outer);
+  if (!message.ok()) {
+    LOG_ERROR("Unable to encode message header.\n");
+    return false;
+  }
+  if (out.level != kNoAuthNoPriv) {
+    std::uint8_t digest[kDigestLength];
+    if (!CalculateDigest(request.user->auth, AuthKey(request), message.Data(), message.Offset(), digest)) {
+      LOG_ERROR("Digest failed, when creating respons message.\n");
+      return false;
+    }
+    std::copy(digest, digest + kDigestLength, message.Data() + digestAt);
+  }
+  std::copy(message.Data(), message.Data() + message.Offset(), reply);
+  *replyLength = message.Offset();
+  return true;
+}
+
+std::vector<std::uint8_t> EncodeScoped(std::string_view contextEngineId, std::string_view contextName,
+                                       const std::uint8_t* pdu, std::size_t pduLength) {
+  Builder scoped(pduLength + 16 + contextEngineId.size() + contextName.size() + 8);
+  std::size_t header = scoped.Open(kAsnSequence);
+  scoped.Octets(contextEngineId);
+  scoped.Octets(contextName);
+  scoped.Raw(pdu, pduLength);
+  scoped.Close(header);
+  if (!scoped.ok()) return {};
+  return {scoped.Data(), scoped.Data() + scoped.Offset()};
+}
+
+// A Report PDU with one usmStats counter: identifier 0xA8 and a one-octet length.
+std::vector<std::uint8_t> EncodeReportPdu(std::int32_t requestId, const UsmError& error) {
+  Builder pdu(128);
+  pdu.Raw(std::array<std::uint8_t, 2>{kReport, 0}.data(), 2);
+  pdu.Integer(requestId);
+  pdu.Integer(0);
+  pdu.Integer(0);
+  std::size_t list = pdu.Open(kAsnSequence);
+  Oid name = {1, 3, 6, 1, 6, 3, 15, 1, 1, error.statsColumn, 0};
+  VarValue value = VarValue::Unsigned(kAsnCounter, CountV3(error.counter));
+  pdu.Append([&](std::uint8_t* cursor, std::int32_t* remaining) {
+    return BuildVarOp(cursor, name.data(), name.size(), value, remaining);
+  });
+  pdu.Close(list);
+  if (!pdu.ok()) return {};
+  pdu.Data()[1] = static_cast<std::uint8_t>(pdu.Offset() - 2);
+  return {pdu.Data(), pdu.Data() + pdu.Offset()};
+}
+
+// Answers a security error. The request-id and context come from the scoped PDU when it can be
+// read as plaintext; a manager matches Reports by msgID in any case.
+int SendReport(V3Request& request, const UsmError& error, std::uint8_t* reply, std::size_t* replyLength) {
+  ScopedPdu scoped;
+  scoped.plaintext.assign(request.message.begin() + static_cast<std::ptrdiff_t>(request.scopedOffset),
+                          request.message.end());
+  std::int32_t requestId = ParseScopedPdu(&scoped, false) ? scoped.pdu.requestId : 0;
+  std::vector<std::uint8_t> pdu = EncodeReportPdu(requestId, error);
+  OutgoingSecurity out;
+  out.level = request.user && error.reportLevel == kAuthNoPriv ? kAuthNoPriv : kNoAuthNoPriv;
+  if (out.level != kNoAuthNoPriv || gv_discoveryTimeFlag.load()) {
+    out.boots = request.agentBoots;
+    out.time = request.agentTime;
+  }
+  std::vector<std::uint8_t> field = EncodeScoped(request.agentEngineId, scoped.contextName, pdu.data(), pdu.size());
+  CountSnmp(SnmpCounter::kV3SecurityErrors);
+  LOG_TRACE("Returning Snmpv3 error like unknown engine Id, etc.\n");
+  if (pdu.empty() || field.empty() || !WrapMessage(request, out, field, reply, replyLength)) return kMessageDrop;
+  return kMessageReply;
+}
+
+// ---- Checking ----
+
+enum class Verdict { kAccepted, kReport, kDrop };
+
+struct Check {
+  Verdict verdict;
+  UsmError error{};
+};
+
+bool IsForDiscovery(const V3Request& request) {
+  const std::string& user = request.security.userName;
+  return request.security.engineId.empty() || request.security.engineId != request.agentEngineId || user.empty() ||
+         user == "initial";
+}
+
+bool Authentic(V3Request& request) {
+  std::uint8_t* digestAt = request.message.data() + request.security.authOffset;
+  std::fill(digestAt, digestAt + kDigestLength, 0);
+  std::uint8_t digest[kDigestLength];
+  if (!CalculateDigest(request.user->auth, AuthKey(request), request.message.data(), request.message.size(), digest)) {
+    return false;
+  }
+  return DigestsEqual(digest, reinterpret_cast<const std::uint8_t*>(request.security.authParameters.data()));
+}
+
+bool InTimeWindow(const V3Request& request) {
+  if (request.security.boots == 0 && request.security.time == 0) return false;
+  std::int64_t difference = static_cast<std::int64_t>(request.agentTime) - request.security.time;
+  return (difference < 0 ? -difference : difference) <= kTimeWindow;
+}
+
+Check CheckSecurity(V3Request& request) {
+  if (IsForDiscovery(request)) {
+    LOG_TRACE("Request for Discovery !!!\n");
+    return {Verdict::kReport, kUnknownEngineId};
+  }
+  request.user = GetUsmEntry(EngineId(), request.security.userName);
+  if (!request.user) {
+    LOG_ERROR("User is  not configured in the USM table\n");
+    return {Verdict::kReport, kUnknownUserName};
+  }
+  if (request.level > request.user->securityLevel) {
+    LOG_ERROR("Unsupported Security Level. !!!\n");
+    return {Verdict::kReport, kUnsupportedSecLevel};
+  }
+  if (request.level == kNoAuthNoPriv) return {Verdict::kAccepted};
+  if (!Authentic(request)) {
+    LOG_ERROR("Authentication is failed. \n");
+    request.user.reset();  // a Report for a wrong digest is not authenticated
+    return {Verdict::kReport, kWrongDigest};
+  }
+  if (!InTimeWindow(request)) {
+    LOG_ERROR("Received msg not in time window\n");
+    return {Verdict::kReport, kNotInTimeWindow};
+  }
+  return {Verdict::kAccepted};
+}
+
+// The scoped PDU's plaintext: as received, or decrypted for authPriv.
+bool ScopedPlaintext(const V3Request& request, std::vector<std::uint8_t>* plaintext) {
+  const std::uint8_t* at = request.message.data() + request.scopedOffset;
+  std::size_t length = request.message.size() - request.scopedOffset;
+  if (request.level != kAuthPriv) {
+    plaintext->assign(at, at + length);
+    return true;
+  }
+  Reader reader{at, static_cast<std::int32_t>(length)};
+  std::int32_t contents = 0;
+  if (!reader.Header(kAsnOctetString, &contents)) return false;
+  return DecryptScopedPdu(request.user->priv, PrivKey(request), static_cast<std::uint32_t>(request.security.boots),
+                          static_cast<std::uint32_t>(request.security.time),
+                          reinterpret_cast<const std::uint8_t*>(request.security.privParameters.data()),
+                          reader.cursor, static_cast<std::size_t>(contents), plaintext);
+}
+
+// ---- The request ----
+
+int VacmCheck(const SecurityAccess& access, std::uint8_t pduType, std::span<const std::uint32_t> oid,
+              std::string* viewCache) {
+  return IsAccessAllowed(access.contextName, access.securityName, access.securityModel, access.securityLevel,
+                         pduType, oid, viewCache);
+}
+
+// Room the wrapper, the security parameters, the scoped PDU header and the cipher padding take.
+std::size_t WrapperOverhead(const V3Request& request, const ScopedPdu& scoped) {
+  return 64 + request.agentEngineId.size() + request.security.userName.size() + scoped.contextEngineId.size() +
+         scoped.contextName.size();
+}
+
+int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::size_t* replyLength) {
+  std::size_t limit = std::min({static_cast<std::size_t>(request.header.msgMaxSize), kMaxSnmpMessage, *replyLength});
+  std::size_t overhead = WrapperOverhead(request, scoped);
+  if (limit <= overhead) return kMessageDrop;
+  std::vector<std::uint8_t> pdu(limit - overhead);
+  std::int32_t remaining = static_cast<std::int32_t>(pdu.size());
+  std::uint8_t* end = BuildResponsePdu(pdu.data(), &remaining, &scoped.pdu, scoped.layout);
+  if (end == nullptr) return kMessageDrop;
+  std::vector<std::uint8_t> field = EncodeScoped(scoped.contextEngineId, scoped.contextName, pdu.data(),
+                                                 static_cast<std::size_t>(end - pdu.data()));
+  OutgoingSecurity out;
+  out.level = request.level;
+  out.boots = request.agentBoots;
+  out.time = request.agentTime;
+  if (request.level == kAuthPriv) {
+    std::vector<std::uint8_t> cipher;
+    std::uint8_t salt[kSaltLength];
+    if (!EncryptScopedPdu(request.user->priv, PrivKey(request), out.boots, out.time, field.data(), field.size(),
+                          &cipher, salt)) {
+      LOG_ERROR("Encryption Failed  !!!\n");
+      return kMessageDrop;
+    }
+    out.salt.assign(reinterpret_cast<const char*>(salt), kSaltLength);
+    Builder encrypted(cipher.size() + 8);
+    encrypted.Append([&](std::uint8_t* cursor, std::int32_t* room) {
+      return AsnBuildString(cursor, room, kAsnOctetString, cipher.data(), cipher.size());
+    });
+    field.assign(encrypted.Data(), encrypted.Data() + encrypted.Offset());
+  }
+  *replyLength = limit;
+  if (!WrapMessage(request, out, field, reply, replyLength)) return kMessageDrop;
+  CountErrorStatus(scoped.pdu.errorStatus);
+  return kMessageReply;
+}
+
+int ProcessScopedPdu(V3Request& request, std::uint8_t* reply, std::size_t* replyLength, const AgentSession& agent) {
+  ScopedPdu scoped;
+  if (!ScopedPlaintext(request, &scoped.plaintext) || !ParseScopedPdu(&scoped, true)) {
+    if (request.level == kAuthPriv) return SendReport(request, kDecryptionError, reply, replyLength);
+    CountSnmp(SnmpCounter::kAsnParseErrors);
+    return kMessageDrop;
+  }
+  SecurityAccess access;
+  access.contextName = scoped.contextName;
+  access.securityName = request.user->securityName;
+  access.securityModel = kUsmSecurityModel;
+  access.securityLevel = request.level;
+  access.isAccessAllowed = VacmCheck;
+  switch (ProcessRequestPdu(&scoped.pdu, agent, &access)) {
+    case RequestOutcome::kEchoInform:
+      scoped.pdu.responseVarBinds = scoped.pdu.requestVarBinds;
+      scoped.pdu.type = kGetResponse;
+      break;
+    case RequestOutcome::kDrop:
+      return kMessageDrop;
+    case RequestOutcome::kResourceFailure:
+      return kResourceFailure;
+    case RequestOutcome::kReply:
+      break;
+  }
+  return Respond(request, scoped, reply, replyLength);
+}
+
+// Header and security parameters; false when the message is dropped (counted).
+bool ParseRequest(V3Request& request) {
+  Reader reader{request.message.data(), static_cast<std::int32_t>(request.message.size())};
+  std::int32_t contents = 0;
+  if (!reader.Header(kAsnSequence, &contents) || !ParseHeader(&reader, &request.header)) {
+    CountSnmp(SnmpCounter::kAsnParseErrors);
+    return false;
+  }
+  if (request.header.msgMaxSize < kMinimumMessageSize || !LevelFromFlags(request.header.flags, &request.level)) {
+    CountV3(V3Counter::kInvalidMsgs);
+    return false;
+  }
+  if (request.header.securityModel != kUsmSecurityModel) {
+    LOG_ERROR("Unsupported Security Model. !!!\n");
+    CountV3(V3Counter::kUnknownSecurityModels);
+    return false;
+  }
+  if (!ParseSecurityParameters(&reader, request.message.data(), request.level, &request.security)) {
+    CountV3(V3Counter::kInvalidMsgs);
+    CountSnmp(SnmpCounter::kAsnParseErrors);
+    return false;
+  }
+  request.scopedOffset = static_cast<std::size_t>(reader.cursor - request.message.data());
+  return true;
+}
+
+}  // namespace
+
+std::uint32_t V3Count(V3Counter counter) { return v3Counters[static_cast<std::size_t>(counter)].load(); }
+
+void ResetV3Statistics() {
+  for (auto& counter : v3Counters) counter.store(0);
+}
+
+int ProcessSnmpV3Message(const std::uint8_t* message, std::size_t length, std::uint8_t* reply,
+                         std::size_t* replyLength, const AgentSession& agent) {
+  V3Request request;
+  request.message.assign(message, message + length);
+  if (!ParseRequest(request)) return kMessageDrop;
+  request.agentEngineId = AgentEngineId(agent);
+  request.agentBoots = agent.agentInfo ? agent.agentInfo->engineBoots.load() : 0;
+  request.agentTime = AgentEngineTime(agent);
+  Check check = CheckSecurity(request);
+  if (check.verdict == Verdict::kReport) return SendReport(request, check.error, reply, replyLength);
+  if (check.verdict == Verdict::kDrop) return kMessageDrop;
+  return ProcessScopedPdu(request, reply, replyLength, agent);
+}
+
+}  // namespace tessel

@@ -1,0 +1,267 @@
+#include "snmpv3/v3_message.h"
+
+#include <gtest/gtest.h>
+
+#include "base/clock.h"
+#include "engine/engine_state.h"
+#include "snmp/ber.h"
+#include "snmp/message.h"
+#include "snmp/pdu_codec.h"
+#include "snmp/statistics.h"
+#include "snmpv3/engine_id.h"
+#include "snmpv3/usm_crypto.h"
+#include "snmpv3/usm_users.h"
+#include "snmpv3/v3_config.h"
+#include "snmpv3/vacm.h"
+#include "support/snmp_agent_fixture.h"
+
+namespace tessel {
+namespace {
+
+// Appends TLVs; constructed ones are closed with their final length.
+class Encoder {
+ public:
+  std::size_t Open(std::uint8_t type) {
+    std::size_t at = bytes.size();
+    bytes.insert(bytes.end(), {type, 0x82, 0, 0});
+    return at;
+  }
+  void Close(std::size_t at) {
+    std::size_t length = bytes.size() - at - 4;
+    bytes[at + 2] = static_cast<std::uint8_t>(length >> 8);
+    bytes[at + 3] = static_cast<std::uint8_t>(length);
+  }
+  void Integer(std::int32_t value) {
+    std::uint8_t buffer[8];
+    std::int32_t room = sizeof buffer;
+    std::uint8_t* end = AsnBuildInt(buffer, &room, kAsnInteger, value);
+    bytes.insert(bytes.end(), buffer, end);
+  }
+  std::size_t Octets(const std::string& value) {
+    bytes.push_back(kAsnOctetString);
+    bytes.push_back(static_cast<std::uint8_t>(value.size()));
+    bytes.insert(bytes.end(), value.begin(), value.end());
+    return bytes.size() - value.size();
+  }
+  void Raw(const std::vector<std::uint8_t>& raw) { bytes.insert(bytes.end(), raw.begin(), raw.end()); }
+  std::vector<std::uint8_t> bytes;
+};
+
+struct V3Request {
+  std::int32_t msgId = 77;
+  std::int32_t maxSize = 1500;
+  std::uint8_t flags = 0x04;
+  std::int32_t securityModel = 3;
+  std::string engineId;
+  std::int32_t boots = 0;
+  std::int32_t time = 0;
+  std::string user;
+  std::string authKey;  // set: authenticate with it
+  std::string context;
+  Oid name;
+};
+
+// An SNMPv3 GetRequest for one name, authenticated when the request says so.
+std::vector<std::uint8_t> Encode(const V3Request& r) {
+  Encoder pdu;
+  std::size_t header = pdu.Open(kGetRequest);
+  pdu.Integer(4242);
+  pdu.Integer(0);
+  pdu.Integer(0);
+  std::size_t list = pdu.Open(kAsnSequence);
+  std::vector<std::uint8_t> binding(64);
+  std::int32_t room = 64;
+  std::uint8_t* end = BuildVarOp(binding.data(), r.name.data(), r.name.size(), VarValue::Empty(kAsnNull), &room);
+  binding.resize(static_cast<std::size_t>(end - binding.data()));
+  pdu.Raw(binding);
+  pdu.Close(list);
+  pdu.Close(header);
+
+  Encoder m;
+  std::size_t outer = m.Open(kAsnSequence);
+  m.Integer(3);
+  std::size_t global = m.Open(kAsnSequence);
+  m.Integer(r.msgId);
+  m.Integer(r.maxSize);
+  m.Octets(std::string(1, static_cast<char>(r.flags)));
+  m.Integer(r.securityModel);
+  m.Close(global);
+  std::size_t wrapper = m.Open(kAsnOctetString);
+  std::size_t parameters = m.Open(kAsnSequence);
+  m.Octets(r.engineId);
+  m.Integer(r.boots);
+  m.Integer(r.time);
+  m.Octets(r.user);
+  std::size_t digestAt = m.Octets(r.authKey.empty() ? "" : std::string(12, '\0'));
+  m.Octets((r.flags & 0x02) ? std::string(8, '\0') : "");
+  m.Close(parameters);
+  m.Close(wrapper);
+  std::size_t scoped = m.Open(kAsnSequence);
+  m.Octets(r.engineId);
+  m.Octets(r.context);
+  m.Raw(pdu.bytes);
+  m.Close(scoped);
+  m.Close(outer);
+  if (!r.authKey.empty()) {
+    std::uint8_t digest[12];
+    EXPECT_TRUE(CalculateDigest(AuthProtocol::kMd5, r.authKey, m.bytes.data(), m.bytes.size(), digest));
+    std::copy(digest, digest + 12, m.bytes.begin() + static_cast<std::ptrdiff_t>(digestAt));
+  }
+  return m.bytes;
+}
+
+class V3MessageTest : public SnmpAgentTest {
+ protected:
+  void SetUp() override {
+    SnmpAgentTest::SetUp();
+    ResetV3Statistics();
+    ClearEngineId();
+    ASSERT_EQ(AddUsmUserFromHost("alice", "MD5_AUTH", "alicepassword", "NO_PRIV", "", 1), 1);
+    CreateAndAddSnmpVacmContextTableEntry("");
+    CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, "alice", "staff", 3);
+    CreateAndAddNewSnmpVacmAccessTableEntry("staff", "", 3, 1, 1, "system", "system", "", 3);
+    CreateAndAddSnmpVacmViewTreeFamilyTableEntry("system", "1.3.6.1.2.1.1", "", 1, 3);
+    CreateLCDVacmAccessTable();
+    CreateLCDVacmViewTreeFamilyTable();
+    agent_.agentInfo->engineBoots = 3;
+    agent_.agentInfo->startTime = GetCurrentSeconds() - 1000;  // its engine time is 1000 s
+    engineId_ = AgentEngineId(agent_);
+  }
+  void TearDown() override {
+    FreeSnmpV3Resources();
+    gv_dropV1V2Requests = 0;
+    SnmpAgentTest::TearDown();
+  }
+
+  V3Request Authenticated() {
+    V3Request r;
+    r.flags = 0x05;
+    r.engineId = engineId_;
+    r.boots = 3;
+    r.time = 1000;
+    r.user = "alice";
+    r.authKey = GetLocalKeyValue("alicepassword", AuthProtocol::kMd5, engineId_);
+    r.name = O("1.3.6.1.2.1.1.5.0");
+    return r;
+  }
+
+  // Processes a v3 message; the reply's scoped PDU parsed (only for unencrypted replies).
+  std::optional<SnmpPdu> Exchange3(const std::vector<std::uint8_t>& datagram) {
+    std::vector<std::uint8_t> reply(kMaxSnmpMessage);
+    std::size_t length = reply.size();
+    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply.data(), &length, agent_) != kMessageReply) {
+      return std::nullopt;
+    }
+    reply.resize(length);
+    reply_ = reply;
+    // The scoped PDU is the last SEQUENCE: find contextName then the PDU by walking the message.
+    std::int32_t remaining = static_cast<std::int32_t>(length);
+    std::uint8_t type = 0;
+    const std::uint8_t* cursor = AsnParseHeader(reply.data(), &remaining, &type);
+    for (int skip = 0; skip < 3 && cursor; ++skip) {  // version, global data, security parameters
+      std::int32_t inner = static_cast<std::int32_t>(reply.data() + length - cursor);
+      const std::uint8_t* contents = AsnParseHeader(cursor, &inner, &type);
+      if (contents == nullptr) return std::nullopt;
+      cursor = contents + inner;
+      remaining = static_cast<std::int32_t>(reply.data() + length - cursor);
+    }
+    std::int32_t scopedLength = remaining;
+    const std::uint8_t* scoped = AsnParseHeader(cursor, &scopedLength, &type);
+    if (scoped == nullptr || type != kAsnSequence) return std::nullopt;
+    for (int skip = 0; skip < 2; ++skip) {
+      std::int32_t inner = static_cast<std::int32_t>(reply.data() + length - scoped);
+      const std::uint8_t* contents = AsnParseHeader(scoped, &inner, &type);
+      scoped = contents + inner;
+    }
+    SnmpPdu pdu;
+    PduLayout layout;
+    std::int32_t rest = static_cast<std::int32_t>(reply.data() + length - scoped);
+    if (ParseSnmpPdu(reply.data(), scoped, rest, &pdu, &layout, false) != ParseResult::kParsed) return std::nullopt;
+    return pdu;
+  }
+
+  // The name the Report for this request carries, empty when no Report came back.
+  Oid ReportedName(const V3Request& request) {
+    auto report = Exchange3(Encode(request));
+    if (!report || report->type != kReport || report->requestVarBinds.empty()) return {};
+    return report->requestVarBinds[0].name;
+  }
+
+  std::string engineId_;
+  std::vector<std::uint8_t> reply_;
+};
+
+TEST_F(V3MessageTest, DiscoveryIsAnsweredWithTheAgentsEngineId) {
+  V3Request discovery;
+  discovery.name = O("1.3.6.1.2.1.1.5.0");
+  auto report = Exchange3(Encode(discovery));
+  ASSERT_TRUE(report);
+  EXPECT_EQ(report->type, kReport);
+  EXPECT_EQ(report->requestId, 4242);
+  ASSERT_EQ(report->requestVarBinds.size(), 1u);
+  EXPECT_EQ(report->requestVarBinds[0].name, O("1.3.6.1.6.3.15.1.1.4.0"));
+  EXPECT_EQ(report->requestVarBinds[0].value, VarValue::Unsigned(kAsnCounter, 1));
+  std::string text(reply_.begin(), reply_.end());
+  EXPECT_NE(text.find(engineId_), std::string::npos);
+  EXPECT_EQ(V3Count(V3Counter::kUnknownEngineIds), 1u);
+}
+
+TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
+  V3Request unknown = Authenticated();
+  unknown.user = "mallory";
+  EXPECT_EQ(ReportedName(unknown), O("1.3.6.1.6.3.15.1.1.3.0"));
+  V3Request wrongKey = Authenticated();
+  wrongKey.authKey = GetLocalKeyValue("wrongpassword", AuthProtocol::kMd5, engineId_);
+  EXPECT_EQ(ReportedName(wrongKey), O("1.3.6.1.6.3.15.1.1.5.0"));
+  V3Request tooHigh = Authenticated();
+  tooHigh.flags = 0x07;
+  EXPECT_EQ(ReportedName(tooHigh), O("1.3.6.1.6.3.15.1.1.1.0"));
+  V3Request stale = Authenticated();
+  stale.time = 1000 + 152;
+  EXPECT_EQ(ReportedName(stale), O("1.3.6.1.6.3.15.1.1.2.0"));
+  stale.time = 1000 - 149;
+  auto inWindow = Exchange3(Encode(stale));
+  ASSERT_TRUE(inWindow);
+  EXPECT_EQ(inWindow->type, kGetResponse);
+}
+
+TEST_F(V3MessageTest, AuthenticatedRequestsAreAnsweredWithinTheirView) {
+  auto reply = Exchange3(Encode(Authenticated()));
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->type, kGetResponse);
+  EXPECT_EQ(reply->requestVarBinds.at(0).value, VarValue::Octets(kAsnOctetString, "r1"));
+  V3Request outside = Authenticated();
+  outside.name = O("1.3.6.1.2.1.2.2.1.2.1");
+  auto refused = Exchange3(Encode(outside));
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->errorStatus, kAuthorizationError);
+  V3Request unknownContext = Authenticated();
+  unknownContext.context = "other";
+  refused = Exchange3(Encode(unknownContext));
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->errorStatus, kAuthorizationError);
+}
+
+TEST_F(V3MessageTest, InvalidMessagesAreDroppedAndCounted) {
+  V3Request small = Authenticated();
+  small.maxSize = 483;
+  EXPECT_FALSE(Exchange3(Encode(small)));
+  EXPECT_EQ(V3Count(V3Counter::kInvalidMsgs), 1u);
+  V3Request model = Authenticated();
+  model.securityModel = 2;
+  EXPECT_FALSE(Exchange3(Encode(model)));
+  EXPECT_EQ(V3Count(V3Counter::kUnknownSecurityModels), 1u);
+  V3Request privWithoutAuth = Authenticated();
+  privWithoutAuth.flags = 0x06;
+  EXPECT_FALSE(Exchange3(Encode(privWithoutAuth)));
+  EXPECT_EQ(V3Count(V3Counter::kInvalidMsgs), 2u);
+  // A v3 engine still answers v2c unless told to drop it.
+  Request v2c;
+  v2c.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
+  EXPECT_TRUE(Send(v2c));
+  gv_dropV1V2Requests = 1;
+  EXPECT_FALSE(Send(v2c));
+}
+
+}  // namespace
+}  // namespace tessel
