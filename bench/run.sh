@@ -1,0 +1,275 @@
+#!/usr/bin/env bash
+# ./tessel bench: the same SNMP workloads, in one run, against Tessel, net-snmp snmpd, snmpsim
+# (serving a recording of that snmpd) and a UDP echo server (the machine's ceiling), all on
+# loopback, the server pinned to one CPU and the load generator to another. Prints one table of
+# responses/s, ratios and latency.
+#
+# Environment (defaults in brackets):
+#   BENCH_WARMUP [3]  BENCH_DURATION [10]  seconds of warm-up and of measurement per figure
+#   BENCH_WINDOW [64]  outstanding requests       BENCH_DEVICES [100]  Tessel agents
+#   BENCH_SERVER_CPU [0]  BENCH_LOADGEN_CPU [1]
+#   BENCH_SNMPD_PORT [11161]  BENCH_TESSEL_PORT [11171]  BENCH_SNMPSIM_PORT [11181]
+#   BENCH_ECHO_PORT [12000]
+#   BENCH_TESSEL_ADDRESS [127.0.1.1]  BENCH_TESSEL_START_TIMEOUT [300] seconds
+#   BENCH_SKIP [""]  any of "tessel snmpd snmpsim echo" to leave out (snmpsim needs snmpd)
+set -euo pipefail
+
+ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
+BUILD=${TESSEL_BUILD:-$ROOT/build}
+WARMUP=${BENCH_WARMUP:-3}
+DURATION=${BENCH_DURATION:-10}
+WINDOW=${BENCH_WINDOW:-64}
+DEVICES=${BENCH_DEVICES:-100}
+SERVER_CPU=${BENCH_SERVER_CPU:-0}
+LOADGEN_CPU=${BENCH_LOADGEN_CPU:-1}
+SNMPD_PORT=${BENCH_SNMPD_PORT:-11161}
+TESSEL_PORT=${BENCH_TESSEL_PORT:-11171}
+ECHO_PORT=${BENCH_ECHO_PORT:-12000}
+SNMPSIM_PORT=${BENCH_SNMPSIM_PORT:-11181}
+TESSEL_ADDRESS=${BENCH_TESSEL_ADDRESS:-127.0.1.1}
+TESSEL_START_TIMEOUT=${BENCH_TESSEL_START_TIMEOUT:-300}
+SKIP=${BENCH_SKIP:-}
+
+LOADGEN=$BUILD/bench/tessel_loadgen
+ECHO=$BUILD/bench/tessel_echo
+WORKLOADS=(get getnext getbulk)
+declare -A REQUEST=(
+  [get]="--get 1.3.6.1.2.1.1.5.0"
+  [getnext]="--getnext 1.3.6.1.2.1.1"
+  [getbulk]="--getbulk 1.3.6.1.2.1.2.2 --non-repeaters 0 --max-repetitions 10"
+)
+declare -A RESULT=()  # "server workload" -> RESULT line of the load generator
+declare -a SERVER_GROUPS=()
+WORK=$(mktemp -d /tmp/tessel-bench.XXXXXX)
+chmod 711 "$WORK"  # servers that drop to nobody reach their own subdirectories
+
+log() { printf 'bench: %s\n' "$*" >&2; }
+skipped() { [[ " $SKIP " == *" $1 "* ]]; }
+
+# Stops the load generator and every server this script started (each server leads its own
+# process group) and removes the temporary directory.
+LOADGEN_PID=
+cleanup() {
+  local group
+  [ -n "$LOADGEN_PID" ] && kill -TERM "$LOADGEN_PID" 2>/dev/null
+  for group in "${SERVER_GROUPS[@]}"; do stop_group "$group"; done
+  rm -rf "$WORK"
+}
+trap cleanup EXIT
+trap 'exit 130' INT TERM
+
+# stop_group PGID: SIGTERM, then SIGKILL after 10 s for whatever is left of the group.
+stop_group() {
+  local group=$1 i
+  kill -TERM -- "-$group" 2>/dev/null || return 0
+  for ((i = 0; i < 100; i++)); do
+    kill -0 -- "-$group" 2>/dev/null || return 0
+    sleep 0.1
+  done
+  log "process group $group ignored SIGTERM for 10 s; killing it"
+  kill -KILL -- "-$group" 2>/dev/null || true
+}
+
+# start_server NAME COMMAND...: runs COMMAND pinned to the server CPU in a new process group;
+# sets SERVER_GROUP.
+start_server() {
+  local name=$1; shift
+  setsid taskset -c "$SERVER_CPU" "$@" >"$WORK/$name.log" 2>&1 </dev/null &
+  SERVER_GROUP=$!
+  SERVER_GROUPS+=("$SERVER_GROUP")
+}
+
+finish_server() {
+  stop_group "$1"
+  local kept=() group
+  for group in "${SERVER_GROUPS[@]}"; do [ "$group" = "$1" ] || kept+=("$group"); done
+  SERVER_GROUPS=("${kept[@]+"${kept[@]}"}")
+}
+
+# wait_for_answer TARGETS PORT SECONDS GROUP: true once a Get is answered by every address
+# given (comma list), false on time-out or when the server's group has gone.
+wait_for_answer() {
+  local targets=$1 port=$2 seconds=$3 group=$4 deadline target
+  deadline=$((SECONDS + seconds))
+  for target in ${targets//,/ }; do
+    until "$LOADGEN" --targets "$target" --port "$port" --get 1.3.6.1.2.1.1.5.0 --window 1 --warmup 0 \
+        --duration 1 --timeout-ms 200 --until-answer --quiet >/dev/null; do
+      kill -0 -- "-$group" 2>/dev/null || return 1
+      [ "$SECONDS" -lt "$deadline" ] || return 1
+      sleep 0.5
+    done
+  done
+}
+
+# measure SERVER WORKLOAD TARGETS PORT
+measure() {
+  local server=$1 workload=$2 targets=$3 port=$4 line
+  # shellcheck disable=SC2086  # REQUEST holds several words on purpose
+  # In the background, so that a signal to this script is handled at once, not after the run.
+  "$LOADGEN" --targets "$targets" --port "$port" ${REQUEST[$workload]} --window "$WINDOW" \
+    --warmup "$WARMUP" --duration "$DURATION" --cpu "$LOADGEN_CPU" --quiet >"$WORK/result" &
+  LOADGEN_PID=$!
+  wait "$LOADGEN_PID" || true
+  LOADGEN_PID=
+  line=$(grep '^RESULT' "$WORK/result" || true)
+  RESULT["$server $workload"]=$line
+  log "$server $workload: ${line:-no result}"
+}
+
+field() {  # field "RESULT line" KEY
+  sed -nE "s/.* $2=([^ ]+).*/\1/p" <<<"$1"
+}
+
+# ensure_package PACKAGE PROGRAM
+ensure_package() {
+  [ -x "$2" ] && return 0
+  if [ "$(id -u)" -ne 0 ]; then log "$2 is missing (install the Debian package $1)"; return 1; fi
+  log "installing $1"
+  apt-get update -qq
+  DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends "$1" >/dev/null
+}
+
+build_tools() {
+  if [ ! -f "$BUILD/build.ninja" ]; then
+    cmake -S "$ROOT" -B "$BUILD" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
+  fi
+  cmake --build "$BUILD" --target tessel_loadgen tessel_echo -- -j2 >/dev/null
+}
+
+run_snmpd() {
+  ensure_package snmpd /usr/sbin/snmpd || return 0
+  mkdir -p "$WORK/snmpd"
+  chmod 777 "$WORK/snmpd"
+  printf 'agentAddress udp:127.0.0.1:%s\nrocommunity public 127.0.0.1\n' "$SNMPD_PORT" >"$WORK/snmpd/snmpd.conf"
+  local user=()
+  [ "$(id -u)" -eq 0 ] && user=(-u nobody)
+  start_server snmpd env SNMP_PERSISTENT_DIR="$WORK/snmpd" /usr/sbin/snmpd -f -Lo -C -c "$WORK/snmpd/snmpd.conf" \
+    "${user[@]}"
+  local group=$SERVER_GROUP workload
+  if ! wait_for_answer 127.0.0.1 "$SNMPD_PORT" 30 "$group"; then
+    log "snmpd did not answer; its log:"; tail -n 20 "$WORK/snmpd.log" >&2
+    finish_server "$group"; return 0
+  fi
+  for workload in "${WORKLOADS[@]}"; do measure snmpd "$workload" 127.0.0.1 "$SNMPD_PORT"; done
+  skipped snmpsim || record_snmpd
+  finish_server "$group"
+}
+
+# The system group and ifTable of the running snmpd, as snmpsim's data file for community public.
+record_snmpd() {
+  ensure_package snmpsim /usr/bin/snmprec || return 0
+  mkdir -p "$WORK/snmpsim" "$WORK/snmpsim-cache"
+  chmod 755 "$WORK/snmpsim"
+  chmod 777 "$WORK/snmpsim-cache"
+  snmprec --agent-udpv4-endpoint=127.0.0.1:"$SNMPD_PORT" --community=public --start-object=1.3.6.1.2.1.1 \
+    --stop-object=1.3.6.1.2.1.3 --output-file="$WORK/snmpsim/public.snmprec" >"$WORK/snmprec.log" 2>&1 ||
+    { log "snmprec failed:"; tail -n 5 "$WORK/snmprec.log" >&2; rm -f "$WORK/snmpsim/public.snmprec"; }
+}
+
+run_snmpsim() {
+  [ -s "$WORK/snmpsim/public.snmprec" ] || { log "no recording of snmpd: snmpsim left out"; return 0; }
+  local user=()
+  [ "$(id -u)" -eq 0 ] && user=(--process-user=nobody --process-group=nogroup)
+  start_server snmpsim snmpsimd --data-dir="$WORK/snmpsim" --agent-udpv4-endpoint=127.0.0.1:"$SNMPSIM_PORT" \
+    --cache-dir="$WORK/snmpsim-cache" "${user[@]}"
+  local group=$SERVER_GROUP workload
+  if ! wait_for_answer 127.0.0.1 "$SNMPSIM_PORT" 60 "$group"; then
+    log "snmpsim did not answer; its log:"; tail -n 20 "$WORK/snmpsim.log" >&2
+    finish_server "$group"; return 0
+  fi
+  for workload in "${WORKLOADS[@]}"; do measure snmpsim "$workload" 127.0.0.1 "$SNMPSIM_PORT"; done
+  finish_server "$group"
+}
+
+run_echo() {
+  local bound
+  bound=$(awk -v w="$WARMUP" -v d="$DURATION" 'BEGIN { printf "%d", w + d + 30 }')
+  start_server echo "$ECHO" --address 127.0.0.1 --port "$ECHO_PORT" --duration "$bound"
+  local group=$SERVER_GROUP
+  if wait_for_answer 127.0.0.1 "$ECHO_PORT" 10 "$group"; then
+    measure echo get 127.0.0.1 "$ECHO_PORT"
+  else
+    log "the echo server did not answer"
+  fi
+  finish_server "$group"
+}
+
+tessel_available() {
+  ! grep -q 'simulated network is not available yet' "$ROOT/tessel"
+}
+
+run_tessel() {
+  if ! tessel_available; then log "./tessel run is not available yet: Tessel is pending"; return 0; fi
+  # The launcher builds what it runs; doing that now, unpinned, keeps the build out of the
+  # start-up time-out and off the server CPU.
+  log "building Tessel"
+  "$ROOT/tessel" run --help >/dev/null 2>&1 || { log "./tessel run --help failed: Tessel is pending"; return 0; }
+  local last first
+  first=$TESSEL_ADDRESS
+  last=$(python3 -c 'import ipaddress,sys; print(ipaddress.ip_address(sys.argv[1]) + int(sys.argv[2]) - 1)' \
+    "$first" "$DEVICES")
+  start_server tessel "$ROOT/tessel" run --devices "$DEVICES" --address "$first" --snmp-port "$TESSEL_PORT"
+  local group=$SERVER_GROUP workload
+  if ! wait_for_answer "$first,$last" "$TESSEL_PORT" "$TESSEL_START_TIMEOUT" "$group"; then
+    log "Tessel did not answer on $first and $last; its log:"; tail -n 30 "$WORK/tessel.log" >&2
+    finish_server "$group"; return 0
+  fi
+  for workload in "${WORKLOADS[@]}"; do measure tessel "$workload" "$first+$DEVICES" "$TESSEL_PORT"; done
+  finish_server "$group"
+}
+
+# cell SERVER WORKLOAD KEY: a field of a result, or "-".
+cell() {
+  local line=${RESULT["$1 $2"]:-}
+  [ -n "$line" ] && field "$line" "$3" || echo -
+}
+
+latency() {
+  local line=${RESULT["$1 $2"]:-}
+  [ -n "$line" ] && printf '%s/%s' "$(field "$line" p50_us)" "$(field "$line" p99_us)" || echo -
+}
+
+print_table() {
+  local workload ratio tessel snmpd
+  printf '\n%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' workload tessel/s snmpd/s snmpsim/s echo/s \
+    tessel/snmpd 'tessel p50/p99 us' 'snmpd p50/p99 us' 'snmpsim p50/p99 us' 'echo p50/p99 us'
+  for workload in "${WORKLOADS[@]}"; do
+    tessel=$(cell tessel "$workload" rate)
+    snmpd=$(cell snmpd "$workload" rate)
+    ratio=-
+    if [ "$tessel" != - ] && [ "$snmpd" != - ] && [ "$snmpd" != 0 ]; then
+      ratio=$(awk -v t="$tessel" -v s="$snmpd" 'BEGIN { printf "%.2f", t / s }')
+    fi
+    printf '%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' "$workload" "$tessel" "$snmpd" \
+      "$(cell snmpsim "$workload" rate)" "$(cell echo "$workload" rate)" "$ratio" \
+      "$(latency tessel "$workload")" "$(latency snmpd "$workload")" "$(latency snmpsim "$workload")" \
+      "$(latency echo "$workload")"
+  done
+  printf '\nwindow %s, %s s warm-up + %s s measured, server on CPU %s, load generator on CPU %s, %s Tessel agents\n' \
+    "$WINDOW" "$WARMUP" "$DURATION" "$SERVER_CPU" "$LOADGEN_CPU" "$DEVICES"
+  print_anomalies
+}
+
+# Anything other than a clean answer to every request is listed, never hidden in the rate.
+print_anomalies() {
+  local key line k v
+  for key in "${!RESULT[@]}"; do
+    line=${RESULT[$key]}
+    for k in lost errors malformed late wrong_source send_failures; do
+      v=$(field "$line" "$k")
+      [ -n "$v" ] && [ "$v" != 0 ] && printf 'note: %s: %s=%s (of %s sent)\n' "$key" "$k" "$v" "$(field "$line" sent)"
+    done
+  done
+  return 0
+}
+
+main() {
+  build_tools
+  skipped echo || run_echo
+  skipped snmpd || run_snmpd
+  skipped snmpsim || run_snmpsim
+  skipped tessel || run_tessel
+  print_table
+}
+
+main "$@"
