@@ -15,6 +15,7 @@ inline constexpr std::uint8_t kPduGet = 0xA0;
 inline constexpr std::uint8_t kPduGetNext = 0xA1;
 inline constexpr std::uint8_t kPduResponse = 0xA2;
 inline constexpr std::uint8_t kPduGetBulk = 0xA5;
+inline constexpr std::uint8_t kPduReport = 0xA8;
 // A request must fit one unfragmented loopback datagram on any MTU in use.
 inline constexpr std::size_t kMaxRequestSize = 1472;
 
@@ -30,6 +31,10 @@ bool EncodeRequestTemplate(int version, const std::string& community, std::uint8
                            const std::vector<std::uint32_t>& oid, int nonRepeaters, int maxRepetitions,
                            RequestTemplate* out);
 
+// The PDU alone, as the scoped PDU of an SNMPv3 message carries it; requestIdOffset is within it.
+bool EncodePduTemplate(std::uint8_t pduType, const std::vector<std::uint32_t>& oid, int nonRepeaters,
+                       int maxRepetitions, RequestTemplate* out);
+
 // requestId must lie in [2^23, 2^31) so that it takes exactly four octets.
 void PatchRequestId(std::uint8_t* message, const RequestTemplate& request, std::uint32_t requestId);
 
@@ -38,6 +43,9 @@ struct ReplySummary {
   std::uint32_t requestId = 0;  // negative request-ids decode as 0
   std::int64_t errorStatus = 0;
 };
+
+// A PDU (its first TLV) up to its error-status; false when malformed.
+bool DecodePdu(const std::uint8_t* data, std::size_t length, ReplySummary* out);
 
 // False when the datagram is not a well-formed v1/v2c message up to its error-status.
 bool DecodeReply(const std::uint8_t* data, std::size_t length, ReplySummary* out);
