@@ -1,11 +1,14 @@
-// tessel_loadgen: an SNMP v1/v2c load generator for loopback benchmarks. One thread keeps a
+// tessel_loadgen: an SNMP v1/v2c/v3 load generator for loopback benchmarks. One thread keeps a
 // window of requests outstanding over many agent addresses (round robin), on non-blocking UDP
 // sockets driven by epoll with sendmmsg/recvmmsg batches, matches answers by request-id, and
-// reports throughput and latency percentiles for the measured interval. Every run is bounded
-// by its warm-up and measured durations plus one time-out, and stops by itself.
+// reports throughput and latency percentiles for the measured interval. SNMPv3 requests go to
+// each agent after one discovery exchange with it, with keys localised for its engine. Every run
+// is bounded by its discovery (three time-outs), warm-up and measured durations plus one
+// time-out, and stops by itself.
 #include <arpa/inet.h>
 #include <netinet/in.h>
 #include <sched.h>
+#include <poll.h>
 #include <sys/epoll.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
@@ -23,10 +26,12 @@
 #include "latency_histogram.h"
 #include "options.h"
 #include "snmp_wire.h"
+#include "snmpv3_wire.h"
 
 namespace {
 
 using tessel::bench::Histogram;
+namespace v3 = tessel::bench::v3;
 
 constexpr int kMaxBatch = 64;
 constexpr std::size_t kReceiveSize = 65536;
@@ -34,6 +39,9 @@ constexpr std::size_t kReceiveSize = 65536;
 // in place instead of re-encoded.
 constexpr std::uint32_t kFirstRequestId = 1u << 24;
 constexpr std::uint32_t kLastRequestId = 0x7FFFFFFFu;
+// Discovery msgIDs are 1 + the target's index: below every request-id.
+constexpr std::uint32_t kFirstDiscoveryId = 1;
+constexpr int kDiscoveryTries = 3;
 
 std::int64_t NowNs() {
   timespec ts{};
@@ -66,6 +74,10 @@ struct GeneratorOptions {
   int cpu = -1;
   bool quiet = false;
   bool untilAnswer = false;
+  std::string v3User;  // empty: v1/v2c
+  std::string v3AuthPassword;
+  std::string v3PrivPassword;
+  v3::Level v3Level = v3::Level::kAuthPriv;
 };
 
 // One window slot: the request it has outstanding, if any.
@@ -113,12 +125,18 @@ class Generator {
   int Run();
 
  private:
+  bool Discover();
   void Loop();
   void FillWindow(std::int64_t now);
   void Queue(int slotIndex, std::int64_t now);
   void Flush(int socketIndex);
   void Drain(int socketIndex, std::int64_t now);
   void Answer(const std::uint8_t* data, std::size_t length, const sockaddr_in& source, std::int64_t now);
+  void AnswerV3(const std::uint8_t* data, std::size_t length, const sockaddr_in& source, std::int64_t now);
+  int Claim(std::uint32_t requestId);
+  void Release(int slotIndex);
+  void Complete(const Slot& slot, const tessel::bench::ReplySummary& reply, const sockaddr_in& source,
+                std::int64_t now);
   void Expire(std::int64_t now);
   std::int64_t WaitNs(std::int64_t now) const;
   std::uint64_t AllowedByRate(std::int64_t now) const;
@@ -132,7 +150,10 @@ class Generator {
   std::vector<int> freeSlots_;
   std::vector<SendBatch> batches_;
   ReceiveBatch receive_;
-  tessel::bench::RequestTemplate template_;
+  tessel::bench::RequestTemplate template_;  // the whole message, or for SNMPv3 the PDU
+  std::vector<v3::Peer> peers_;              // SNMPv3: one per target
+  std::uint64_t salt_ = 0;
+  bool reportShown_ = false;
   Histogram histogram_;
   Counters counters_;
   std::uint64_t totalSent_ = 0;
@@ -147,8 +168,14 @@ class Generator {
 };
 
 bool Generator::Open() {
-  if (!tessel::bench::EncodeRequestTemplate(options_.version, options_.community, options_.pduType, options_.oid,
-                                            options_.nonRepeaters, options_.maxRepetitions, &template_)) {
+  const bool encoded =
+      options_.v3User.empty()
+          ? tessel::bench::EncodeRequestTemplate(options_.version, options_.community, options_.pduType,
+                                                 options_.oid, options_.nonRepeaters, options_.maxRepetitions,
+                                                 &template_)
+          : tessel::bench::EncodePduTemplate(options_.pduType, options_.oid, options_.nonRepeaters,
+                                             options_.maxRepetitions, &template_);
+  if (!encoded) {
     std::fprintf(stderr, "loadgen: the request does not fit one datagram\n");
     return false;
   }
@@ -203,9 +230,15 @@ void Generator::Queue(int slotIndex, std::int64_t now) {
   const int socketIndex = slotIndex % options_.sockets;
   SendBatch& batch = batches_[static_cast<std::size_t>(socketIndex)];
   const int n = batch.count++;
-  std::memcpy(batch.payload[n], template_.bytes.data(), template_.bytes.size());
-  tessel::bench::PatchRequestId(batch.payload[n], template_, slot.requestId);
-  batch.vectors[n] = {batch.payload[n], template_.bytes.size()};
+  std::size_t size = template_.bytes.size();
+  if (peers_.empty()) {
+    std::memcpy(batch.payload[n], template_.bytes.data(), size);
+    tessel::bench::PatchRequestId(batch.payload[n], template_, slot.requestId);
+  } else {
+    // A request that cannot be encoded goes out empty and is counted lost.
+    size = peers_[slot.target].Encode(slot.requestId, now, salt_++, batch.payload[n], tessel::bench::kMaxRequestSize);
+  }
+  batch.vectors[n] = {batch.payload[n], size};
   msghdr& header = batch.headers[n].msg_hdr;
   header = {};
   header.msg_name = &options_.targets[slot.target];
@@ -259,27 +292,30 @@ void Generator::FillWindow(std::int64_t now) {
   }
 }
 
-void Generator::Answer(const std::uint8_t* data, std::size_t length, const sockaddr_in& source,
-                       std::int64_t now) {
-  tessel::bench::ReplySummary reply;
-  if (!tessel::bench::DecodeReply(data, length, &reply)) {
-    ++counters_.malformed;
-    return;
-  }
-  if (reply.requestId < kFirstRequestId) {
+// The slot whose request has this id, or -1 (counted late) when none is outstanding.
+int Generator::Claim(std::uint32_t requestId) {
+  if (requestId < kFirstRequestId) {
     ++counters_.late;
-    return;
+    return -1;
   }
   const std::uint32_t window = static_cast<std::uint32_t>(options_.window);
-  const std::uint32_t slotIndex = (reply.requestId - kFirstRequestId) % window;
-  Slot& slot = slots_[slotIndex];
-  if (!slot.busy || slot.requestId != reply.requestId) {
+  const std::uint32_t slotIndex = (requestId - kFirstRequestId) % window;
+  const Slot& slot = slots_[slotIndex];
+  if (!slot.busy || slot.requestId != requestId) {
     ++counters_.late;
-    return;
+    return -1;
   }
-  slot.busy = false;
+  return static_cast<int>(slotIndex);
+}
+
+void Generator::Release(int slotIndex) {
+  slots_[static_cast<std::size_t>(slotIndex)].busy = false;
   --busy_;
-  freeSlots_.push_back(static_cast<int>(slotIndex));
+  freeSlots_.push_back(slotIndex);
+}
+
+void Generator::Complete(const Slot& slot, const tessel::bench::ReplySummary& reply, const sockaddr_in& source,
+                         std::int64_t now) {
   answered_ = true;
   if (!slot.measured) return;
   const sockaddr_in& target = options_.targets[slot.target];
@@ -292,6 +328,47 @@ void Generator::Answer(const std::uint8_t* data, std::size_t length, const socka
   histogram_.Record(static_cast<std::uint64_t>(now - slot.sentNs));
 }
 
+void Generator::Answer(const std::uint8_t* data, std::size_t length, const sockaddr_in& source,
+                       std::int64_t now) {
+  tessel::bench::ReplySummary reply;
+  if (!tessel::bench::DecodeReply(data, length, &reply)) {
+    ++counters_.malformed;
+    return;
+  }
+  const int slotIndex = Claim(reply.requestId);
+  if (slotIndex < 0) return;
+  Release(slotIndex);
+  Complete(slots_[static_cast<std::size_t>(slotIndex)], reply, source, now);
+}
+
+// The msgID names the request; the answer is then checked with that request's target's keys.
+// One that fails the check (digest, decryption, level, request-id) frees its slot as malformed.
+void Generator::AnswerV3(const std::uint8_t* data, std::size_t length, const sockaddr_in& source,
+                         std::int64_t now) {
+  std::uint32_t messageId = 0;
+  if (!v3::DecodeMessageId(data, length, &messageId)) {
+    ++counters_.malformed;
+    return;
+  }
+  const int slotIndex = Claim(messageId);
+  if (slotIndex < 0) return;
+  Release(slotIndex);
+  const Slot& slot = slots_[static_cast<std::size_t>(slotIndex)];
+  tessel::bench::ReplySummary reply;
+  std::vector<std::uint32_t> reportOid;
+  if (!peers_[slot.target].Decode(data, length, &reply, reportOid.empty() && !reportShown_ ? &reportOid : nullptr)) {
+    ++counters_.malformed;
+    return;
+  }
+  if (!reportOid.empty()) {
+    reportShown_ = true;
+    std::string text;
+    for (std::uint32_t arc : reportOid) text += (text.empty() ? "" : ".") + std::to_string(arc);
+    std::fprintf(stderr, "loadgen: first Report from the agents: %s\n", text.c_str());
+  }
+  Complete(slot, reply, source, now);
+}
+
 void Generator::Drain(int socketIndex, std::int64_t now) {
   for (;;) {
     for (int i = 0; i < kMaxBatch; ++i) {
@@ -301,8 +378,12 @@ void Generator::Drain(int socketIndex, std::int64_t now) {
     int count = recvmmsg(fds_[static_cast<std::size_t>(socketIndex)], receive_.headers, kMaxBatch, 0, nullptr);
     if (count <= 0) return;
     for (int i = 0; i < count; ++i) {
-      Answer(static_cast<const std::uint8_t*>(receive_.vectors[i].iov_base), receive_.headers[i].msg_len,
-             receive_.sources[i], now);
+      const auto* data = static_cast<const std::uint8_t*>(receive_.vectors[i].iov_base);
+      if (peers_.empty()) {
+        Answer(data, receive_.headers[i].msg_len, receive_.sources[i], now);
+      } else {
+        AnswerV3(data, receive_.headers[i].msg_len, receive_.sources[i], now);
+      }
     }
     if (count < kMaxBatch) return;
   }
@@ -355,7 +436,64 @@ void Generator::Loop() {
   }
 }
 
+// Learns each target's engine (ID, boots, time) from its Report to a discovery request, in up to
+// kDiscoveryTries rounds of one time-out each, and sets up its keys and scoped PDU. The
+// passwords are stretched once; each engine ID then costs one small hash per key.
+bool Generator::Discover() {
+  v3::User user{options_.v3User, options_.v3Level, {}, {}};
+  const auto level = static_cast<std::uint8_t>(options_.v3Level);
+  if (level & 1) user.authKey = v3::PasswordToKey(options_.v3AuthPassword);
+  if (level & 2) user.privKey = v3::PasswordToKey(options_.v3PrivPassword);
+  const std::size_t count = options_.targets.size();
+  peers_.resize(count);
+  std::vector<bool> known(count, false);
+  std::size_t missing = count;
+  std::uint8_t* buffer = receive_.buffers.data();
+  std::uint8_t probe[tessel::bench::kMaxRequestSize];
+  for (int attempt = 0; attempt < kDiscoveryTries && missing > 0; ++attempt) {
+    for (std::size_t i = 0; i < count; ++i) {
+      if (known[i]) continue;
+      const v3::Bytes request = v3::EncodeDiscovery(kFirstDiscoveryId + static_cast<std::uint32_t>(i));
+      sendto(fds_[0], request.data(), request.size(), 0, reinterpret_cast<const sockaddr*>(&options_.targets[i]),
+             sizeof(sockaddr_in));
+    }
+    const std::int64_t deadline = NowNs() + static_cast<std::int64_t>(options_.timeoutMs) * 1000000;
+    for (std::int64_t now = NowNs(); missing > 0 && now < deadline; now = NowNs()) {
+      pollfd ready{fds_[0], POLLIN, 0};
+      if (poll(&ready, 1, static_cast<int>((deadline - now) / 1000000) + 1) <= 0) continue;
+      for (;;) {
+        sockaddr_in source{};
+        socklen_t sourceSize = sizeof source;
+        const ssize_t length =
+            recvfrom(fds_[0], buffer, kReceiveSize, 0, reinterpret_cast<sockaddr*>(&source), &sourceSize);
+        if (length < 0) break;
+        std::uint32_t messageId = 0;
+        v3::Engine engine;
+        if (!v3::DecodeEngine(buffer, static_cast<std::size_t>(length), &messageId, &engine)) continue;
+        const std::size_t index = messageId - kFirstDiscoveryId;
+        if (messageId < kFirstDiscoveryId || index >= count || known[index]) continue;
+        const sockaddr_in& target = options_.targets[index];
+        if (source.sin_addr.s_addr != target.sin_addr.s_addr || source.sin_port != target.sin_port) continue;
+        if (!peers_[index].Init(user, engine, template_, NowNs()) ||
+            peers_[index].Encode(kFirstRequestId, NowNs(), 0, probe, sizeof probe) == 0) {
+          std::fprintf(stderr, "loadgen: cannot set up SNMPv3 keys or requests\n");
+          return false;
+        }
+        known[index] = true;
+        --missing;
+      }
+    }
+  }
+  if (missing > 0) std::fprintf(stderr, "loadgen: %zu of %zu targets did not answer discovery\n", missing, count);
+  return missing == 0;
+}
+
 int Generator::Run() {
+  if (!options_.v3User.empty() && !Discover()) {
+    for (int fd : fds_) close(fd);
+    close(epoll_);
+    return 1;
+  }
   startNs_ = NowNs();
   lastExpireNs_ = startNs_;
   measureStartNs_ = startNs_ + static_cast<std::int64_t>(options_.warmupSeconds * 1e9);
@@ -412,6 +550,10 @@ const char kUsage[] =
     "  --duration S         measured seconds (5, at most 3600)\n"
     "  --rate R             pace to R requests/s instead of a closed loop\n"
     "  --cpu N              pin to CPU N\n"
+    "  --v3-user NAME       SNMPv3 with this USM user (HMAC-SHA-96, AES-128-CFB) instead of v1/v2c\n"
+    "  --v3-auth-pass P     its authentication password\n"
+    "  --v3-priv-pass Q     its privacy password\n"
+    "  --v3-level L         authPriv, authNoPriv or noAuthNoPriv (authPriv)\n"
     "  --until-answer       stop at the first answer (a readiness probe; exit 0 when answered)\n"
     "  --quiet              print only the RESULT line\n"
     "Targets must be loopback addresses (127.0.0.0/8).\n";
@@ -422,6 +564,30 @@ bool ParseKind(const std::string& name, const std::string& value, GeneratorOptio
                                            : tessel::bench::kPduGetBulk;
   options->oid.clear();
   return tessel::bench::ParseOid(value, &options->oid);
+}
+
+bool ParseLevel(const std::string& text, v3::Level* level) {
+  if (text == "authPriv") {
+    *level = v3::Level::kAuthPriv;
+  } else if (text == "authNoPriv") {
+    *level = v3::Level::kAuthNoPriv;
+  } else if (text == "noAuthNoPriv") {
+    *level = v3::Level::kNoAuthNoPriv;
+  } else {
+    return false;
+  }
+  return true;
+}
+
+// The passwords a level needs: present and, as agents require, at least eight characters.
+bool CheckV3Passwords(const GeneratorOptions& options) {
+  const auto level = static_cast<std::uint8_t>(options.v3Level);
+  if (((level & 1) && options.v3AuthPassword.size() < 8) || ((level & 2) && options.v3PrivPassword.size() < 8)) {
+    std::fprintf(stderr, "loadgen: --v3-level needs --v3-auth-pass (and for authPriv --v3-priv-pass) "
+                         "of at least 8 characters\n");
+    return false;
+  }
+  return true;
 }
 
 bool ParseArguments(int argc, char** argv, GeneratorOptions* options) {
@@ -444,6 +610,15 @@ bool ParseArguments(int argc, char** argv, GeneratorOptions* options) {
       ok = tessel::bench::ParsePort(value, &port);
     } else if (name == "--community") {
       options->community = value;
+    } else if (name == "--v3-user") {
+      options->v3User = value;
+      ok = !value.empty();
+    } else if (name == "--v3-auth-pass") {
+      options->v3AuthPassword = value;
+    } else if (name == "--v3-priv-pass") {
+      options->v3PrivPassword = value;
+    } else if (name == "--v3-level") {
+      ok = ParseLevel(value, &options->v3Level);
     } else if (name == "--version") {
       ok = value == "1" || value == "2c";
       options->version = value == "1" ? 0 : 1;
@@ -482,7 +657,7 @@ bool ParseArguments(int argc, char** argv, GeneratorOptions* options) {
     return false;
   }
   options->sockets = std::min(options->sockets, options->window);
-  return true;
+  return options->v3User.empty() || CheckV3Passwords(*options);
 }
 
 }  // namespace
