@@ -2,7 +2,8 @@
 # ./tessel bench: the same SNMP workloads, in one run, against Tessel, net-snmp snmpd, snmpsim
 # (serving a recording of that snmpd) and a UDP echo server (the machine's ceiling), all on
 # loopback, the server pinned to one CPU and the load generator to another. Prints one table of
-# responses/s, ratios and latency.
+# responses/s, ratios and latency. The SNMPv3 workload (authPriv, SHA + AES) runs against Tessel
+# and snmpd, both given the same user.
 #
 # Environment (defaults in brackets):
 #   BENCH_WARMUP [3]  BENCH_DURATION [10]  seconds of warm-up and of measurement per figure
@@ -12,6 +13,8 @@
 #   BENCH_ECHO_PORT [12000]
 #   BENCH_TESSEL_ADDRESS [127.0.1.1]  BENCH_TESSEL_START_TIMEOUT [300] seconds
 #   BENCH_SKIP [""]  any of "tessel snmpd snmpsim echo" to leave out (snmpsim needs snmpd)
+#   BENCH_WORKLOADS ["get getnext getbulk get-v3"]  the workloads to run
+#   BENCH_V3_USER [bench]  BENCH_V3_AUTH [shapassword]  BENCH_V3_PRIV [aespassword]  the SNMPv3 user
 set -euo pipefail
 
 ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
@@ -29,14 +32,19 @@ SNMPSIM_PORT=${BENCH_SNMPSIM_PORT:-11181}
 TESSEL_ADDRESS=${BENCH_TESSEL_ADDRESS:-127.0.1.1}
 TESSEL_START_TIMEOUT=${BENCH_TESSEL_START_TIMEOUT:-300}
 SKIP=${BENCH_SKIP:-}
+V3_USER=${BENCH_V3_USER:-bench}
+V3_AUTH=${BENCH_V3_AUTH:-shapassword}
+V3_PRIV=${BENCH_V3_PRIV:-aespassword}
 
 LOADGEN=$BUILD/bench/tessel_loadgen
 ECHO=$BUILD/bench/tessel_echo
-WORKLOADS=(get getnext getbulk)
+read -r -a WORKLOADS <<<"${BENCH_WORKLOADS:-get getnext getbulk get-v3}"
+V3_OPTIONS="--v3-user $V3_USER --v3-auth-pass $V3_AUTH --v3-priv-pass $V3_PRIV"
 declare -A REQUEST=(
   [get]="--get 1.3.6.1.2.1.1.5.0"
   [getnext]="--getnext 1.3.6.1.2.1.1"
   [getbulk]="--getbulk 1.3.6.1.2.1.2.2 --non-repeaters 0 --max-repetitions 10"
+  [get-v3]="--get 1.3.6.1.2.1.1.5.0 $V3_OPTIONS"
 )
 declare -A RESULT=()  # "server workload" -> RESULT line of the load generator
 declare -a SERVER_GROUPS=()
@@ -86,14 +94,15 @@ finish_server() {
   SERVER_GROUPS=("${kept[@]+"${kept[@]}"}")
 }
 
-# wait_for_answer TARGETS PORT SECONDS GROUP: true once a Get is answered by every address
-# given (comma list), false on time-out or when the server's group has gone.
+# wait_for_answer TARGETS PORT SECONDS GROUP [LOADGEN OPTIONS...]: true once a Get is answered
+# by every address given (comma list), false on time-out or when the server's group has gone.
 wait_for_answer() {
   local targets=$1 port=$2 seconds=$3 group=$4 deadline target
+  shift 4
   deadline=$((SECONDS + seconds))
   for target in ${targets//,/ }; do
     until "$LOADGEN" --targets "$target" --port "$port" --get 1.3.6.1.2.1.1.5.0 --window 1 --warmup 0 \
-        --duration 1 --timeout-ms 200 --until-answer --quiet >/dev/null; do
+        --duration 1 --timeout-ms 200 --until-answer --quiet "$@" >/dev/null 2>&1; do
       kill -0 -- "-$group" 2>/dev/null || return 1
       [ "$SECONDS" -lt "$deadline" ] || return 1
       sleep 0.5
@@ -114,6 +123,31 @@ measure() {
   line=$(grep '^RESULT' "$WORK/result" || true)
   RESULT["$server $workload"]=$line
   log "$server $workload: ${line:-no result}"
+}
+
+# wanted WORKLOAD: true when the workload is among those to run.
+wanted() { [[ " ${WORKLOADS[*]} " == *" $1 "* ]]; }
+
+v2_workloads() {
+  local workload
+  for workload in "${WORKLOADS[@]}"; do [ "$workload" = get-v3 ] || echo "$workload"; done
+}
+
+# measure_v3 SERVER TARGETS PORT GROUP [LAST]: the SNMPv3 workload, once the first target (and
+# the LAST address) answer an SNMPv3 Get.
+measure_v3() {
+  local server=$1 targets=$2 port=$3 group=$4 first
+  wanted get-v3 || return 0
+  first=${targets%%+*}
+  # shellcheck disable=SC2086  # V3_OPTIONS holds several words on purpose
+  if ! wait_for_answer "$first,${5:-$first}" "$port" 10 "$group" $V3_OPTIONS; then
+    log "$server did not answer an SNMPv3 authPriv Get as $V3_USER; what the load generator sees:"
+    # shellcheck disable=SC2086
+    "$LOADGEN" --targets "$first" --port "$port" --get 1.3.6.1.2.1.1.5.0 --window 1 --warmup 0 --duration 1 \
+      $V3_OPTIONS 2>&1 | sed 's/^/  /' >&2 || true
+    return 0
+  fi
+  measure "$server" get-v3 "$targets" "$port"
 }
 
 field() {  # field "RESULT line" KEY
@@ -140,7 +174,8 @@ run_snmpd() {
   ensure_package snmpd /usr/sbin/snmpd || return 0
   mkdir -p "$WORK/snmpd"
   chmod 777 "$WORK/snmpd"
-  printf 'agentAddress udp:127.0.0.1:%s\nrocommunity public 127.0.0.1\n' "$SNMPD_PORT" >"$WORK/snmpd/snmpd.conf"
+  printf 'agentAddress udp:127.0.0.1:%s\nrocommunity public 127.0.0.1\ncreateUser %s SHA %s AES %s\nrouser %s priv\n' \
+    "$SNMPD_PORT" "$V3_USER" "$V3_AUTH" "$V3_PRIV" "$V3_USER" >"$WORK/snmpd/snmpd.conf"
   local user=()
   [ "$(id -u)" -eq 0 ] && user=(-u nobody)
   start_server snmpd env SNMP_PERSISTENT_DIR="$WORK/snmpd" /usr/sbin/snmpd -f -Lo -C -c "$WORK/snmpd/snmpd.conf" \
@@ -150,7 +185,8 @@ run_snmpd() {
     log "snmpd did not answer; its log:"; tail -n 20 "$WORK/snmpd.log" >&2
     finish_server "$group"; return 0
   fi
-  for workload in "${WORKLOADS[@]}"; do measure snmpd "$workload" 127.0.0.1 "$SNMPD_PORT"; done
+  for workload in $(v2_workloads); do measure snmpd "$workload" 127.0.0.1 "$SNMPD_PORT"; done
+  measure_v3 snmpd 127.0.0.1 "$SNMPD_PORT" "$group"
   skipped snmpsim || record_snmpd
   finish_server "$group"
 }
@@ -177,7 +213,7 @@ run_snmpsim() {
     log "snmpsim did not answer; its log:"; tail -n 20 "$WORK/snmpsim.log" >&2
     finish_server "$group"; return 0
   fi
-  for workload in "${WORKLOADS[@]}"; do measure snmpsim "$workload" 127.0.0.1 "$SNMPSIM_PORT"; done
+  for workload in $(v2_workloads); do measure snmpsim "$workload" 127.0.0.1 "$SNMPSIM_PORT"; done
   finish_server "$group"
 }
 
@@ -187,7 +223,7 @@ run_echo() {
   start_server echo "$ECHO" --address 127.0.0.1 --port "$ECHO_PORT" --duration "$bound"
   local group=$SERVER_GROUP
   if wait_for_answer 127.0.0.1 "$ECHO_PORT" 10 "$group"; then
-    measure echo get 127.0.0.1 "$ECHO_PORT"
+    if wanted get; then measure echo get 127.0.0.1 "$ECHO_PORT"; fi
   else
     log "the echo server did not answer"
   fi
@@ -208,14 +244,45 @@ run_tessel() {
   first=$TESSEL_ADDRESS
   last=$(python3 -c 'import ipaddress,sys; print(ipaddress.ip_address(sys.argv[1]) + int(sys.argv[2]) - 1)' \
     "$first" "$DEVICES")
-  start_server tessel "$ROOT/tessel" run --devices "$DEVICES" --address "$first" --snmp-port "$TESSEL_PORT"
+  local v3
+  tessel_v3_options
+  start_server tessel "$ROOT/tessel" run --devices "$DEVICES" --address "$first" --snmp-port "$TESSEL_PORT" \
+    "${v3[@]+"${v3[@]}"}"
   local group=$SERVER_GROUP workload
   if ! wait_for_answer "$first,$last" "$TESSEL_PORT" "$TESSEL_START_TIMEOUT" "$group"; then
     log "Tessel did not answer on $first and $last; its log:"; tail -n 30 "$WORK/tessel.log" >&2
     finish_server "$group"; return 0
   fi
-  for workload in "${WORKLOADS[@]}"; do measure tessel "$workload" "$first+$DEVICES" "$TESSEL_PORT"; done
+  for workload in $(v2_workloads); do measure tessel "$workload" "$first+$DEVICES" "$TESSEL_PORT"; done
+  if [ ${#v3[@]} -gt 0 ]; then measure_v3 tessel "$first+$DEVICES" "$TESSEL_PORT" "$group" "$last"; fi
   finish_server "$group"
+}
+
+# tessel_v3_options: sets the array v3 to the launcher options that give Tessel the benchmark's
+# SNMPv3 user, or leaves it empty (and says why) when the launcher cannot.
+tessel_v3_options() {
+  v3=()
+  wanted get-v3 || return 0
+  if ! "$ROOT/tessel" run --help 2>&1 | grep -q -- '--snmpv3'; then
+    log "./tessel run has no --snmpv3 option yet: Tessel's SNMPv3 workload left out"; return 0
+  fi
+  cat >"$WORK/snmpv3.conf" <<CONF
+user $V3_USER SHA $V3_AUTH AES $V3_PRIV
+context ""
+group 3 $V3_USER benchgroup
+access benchgroup "" 3 3 1 all none none
+view all .1 "" 1
+CONF
+  v3=(--snmpv3 "$WORK/snmpv3.conf")
+}
+
+# ratio A B: A / B to two decimals, or "-".
+ratio() {
+  if [ "$1" != - ] && [ "$2" != - ] && [ "$2" != 0 ]; then
+    awk -v a="$1" -v b="$2" 'BEGIN { printf "%.2f", a / b }'
+  else
+    echo -
+  fi
 }
 
 # cell SERVER WORKLOAD KEY: a field of a result, or "-".
@@ -236,10 +303,7 @@ print_table() {
   for workload in "${WORKLOADS[@]}"; do
     tessel=$(cell tessel "$workload" rate)
     snmpd=$(cell snmpd "$workload" rate)
-    ratio=-
-    if [ "$tessel" != - ] && [ "$snmpd" != - ] && [ "$snmpd" != 0 ]; then
-      ratio=$(awk -v t="$tessel" -v s="$snmpd" 'BEGIN { printf "%.2f", t / s }')
-    fi
+    ratio=$(ratio "$tessel" "$snmpd")
     printf '%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' "$workload" "$tessel" "$snmpd" \
       "$(cell snmpsim "$workload" rate)" "$(cell echo "$workload" rate)" "$ratio" \
       "$(latency tessel "$workload")" "$(latency snmpd "$workload")" "$(latency snmpsim "$workload")" \
@@ -247,6 +311,11 @@ print_table() {
   done
   printf '\nwindow %s, %s s warm-up + %s s measured, server on CPU %s, load generator on CPU %s, %s Tessel agents\n' \
     "$WINDOW" "$WARMUP" "$DURATION" "$SERVER_CPU" "$LOADGEN_CPU" "$DEVICES"
+  if wanted get-v3; then
+    printf 'get-v3: SNMPv3 authPriv (HMAC-SHA-96, AES-128) Get of sysName.0; v3/v2c Get in this run: tessel %s, snmpd %s\n' \
+      "$(ratio "$(cell tessel get-v3 rate)" "$(cell tessel get rate)")" \
+      "$(ratio "$(cell snmpd get-v3 rate)" "$(cell snmpd get rate)")"
+  fi
   print_anomalies
 }
 
@@ -255,7 +324,7 @@ print_anomalies() {
   local key line k v
   for key in "${!RESULT[@]}"; do
     line=${RESULT[$key]}
-    for k in lost errors malformed late wrong_source send_failures; do
+    for k in lost errors malformed late not_response wrong_source send_failures; do
       v=$(field "$line" "$k")
       [ -n "$v" ] && [ "$v" != 0 ] && printf 'note: %s: %s=%s (of %s sent)\n' "$key" "$k" "$v" "$(field "$line" sent)"
     done
