@@ -14,7 +14,9 @@
 #   BENCH_TESSEL_ADDRESS [127.0.1.1]  BENCH_TESSEL_START_TIMEOUT [300] seconds
 #   BENCH_SKIP [""]  any of "tessel snmpd snmpsim echo" to leave out (snmpsim needs snmpd)
 #   BENCH_WORKLOADS ["get getnext getbulk get-v3"]  the workloads to run
-#   BENCH_V3_USER [bench]  BENCH_V3_AUTH [shapassword]  BENCH_V3_PRIV [aespassword]  the SNMPv3 user
+#   BENCH_V3_USER  BENCH_V3_AUTH  BENCH_V3_PRIV  the SNMPv3 user (SHA, AES) and its passwords
+#     [the first such user of profiles/snmpv3.conf, Tessel's default; without one: bench,
+#     shapassword, aespassword, given to Tessel with --snmpv3]
 set -euo pipefail
 
 ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
@@ -32,19 +34,14 @@ SNMPSIM_PORT=${BENCH_SNMPSIM_PORT:-11181}
 TESSEL_ADDRESS=${BENCH_TESSEL_ADDRESS:-127.0.1.1}
 TESSEL_START_TIMEOUT=${BENCH_TESSEL_START_TIMEOUT:-300}
 SKIP=${BENCH_SKIP:-}
-V3_USER=${BENCH_V3_USER:-bench}
-V3_AUTH=${BENCH_V3_AUTH:-shapassword}
-V3_PRIV=${BENCH_V3_PRIV:-aespassword}
 
 LOADGEN=$BUILD/bench/tessel_loadgen
 ECHO=$BUILD/bench/tessel_echo
 read -r -a WORKLOADS <<<"${BENCH_WORKLOADS:-get getnext getbulk get-v3}"
-V3_OPTIONS="--v3-user $V3_USER --v3-auth-pass $V3_AUTH --v3-priv-pass $V3_PRIV"
 declare -A REQUEST=(
   [get]="--get 1.3.6.1.2.1.1.5.0"
   [getnext]="--getnext 1.3.6.1.2.1.1"
   [getbulk]="--getbulk 1.3.6.1.2.1.2.2 --non-repeaters 0 --max-repetitions 10"
-  [get-v3]="--get 1.3.6.1.2.1.1.5.0 $V3_OPTIONS"
 )
 declare -A RESULT=()  # "server workload" -> RESULT line of the load generator
 declare -a SERVER_GROUPS=()
@@ -244,8 +241,8 @@ run_tessel() {
   first=$TESSEL_ADDRESS
   last=$(python3 -c 'import ipaddress,sys; print(ipaddress.ip_address(sys.argv[1]) + int(sys.argv[2]) - 1)' \
     "$first" "$DEVICES")
-  local v3
-  tessel_v3_options
+  local v3 with_v3=no
+  tessel_v3_options && with_v3=yes
   start_server tessel "$ROOT/tessel" run --devices "$DEVICES" --address "$first" --snmp-port "$TESSEL_PORT" \
     "${v3[@]+"${v3[@]}"}"
   local group=$SERVER_GROUP workload
@@ -254,26 +251,48 @@ run_tessel() {
     finish_server "$group"; return 0
   fi
   for workload in $(v2_workloads); do measure tessel "$workload" "$first+$DEVICES" "$TESSEL_PORT"; done
-  if [ ${#v3[@]} -gt 0 ]; then measure_v3 tessel "$first+$DEVICES" "$TESSEL_PORT" "$group" "$last"; fi
+  if [ "$with_v3" = yes ]; then measure_v3 tessel "$first+$DEVICES" "$TESSEL_PORT" "$group" "$last"; fi
   finish_server "$group"
 }
 
-# tessel_v3_options: sets the array v3 to the launcher options that give Tessel the benchmark's
-# SNMPv3 user, or leaves it empty (and says why) when the launcher cannot.
-tessel_v3_options() {
-  v3=()
-  wanted get-v3 || return 0
-  if ! "$ROOT/tessel" run --help 2>&1 | grep -q -- '--snmpv3'; then
-    log "./tessel run has no --snmpv3 option yet: Tessel's SNMPv3 workload left out"; return 0
+# choose_v3_user: sets V3_USER, V3_AUTH, V3_PRIV and the load generator's V3_OPTIONS, and
+# V3_CONFIG to a Tessel configuration with that user, or to nothing when Tessel's default
+# configuration has it already.
+V3_CONFIG=
+choose_v3_user() {
+  local found=
+  if [ -z "${BENCH_V3_USER:-}" ] && [ -f "$ROOT/profiles/snmpv3.conf" ]; then
+    found=$(awk '$1 == "user" && $3 == "SHA_AUTH" && $5 == "CFB_AES_128" { print $2, $4, $6; exit }' \
+      "$ROOT/profiles/snmpv3.conf")
   fi
-  cat >"$WORK/snmpv3.conf" <<CONF
-user $V3_USER SHA $V3_AUTH AES $V3_PRIV
+  if [ -n "$found" ]; then
+    read -r V3_USER V3_AUTH V3_PRIV <<<"$found"
+  else
+    V3_USER=${BENCH_V3_USER:-bench}
+    V3_AUTH=${BENCH_V3_AUTH:-shapassword}
+    V3_PRIV=${BENCH_V3_PRIV:-aespassword}
+    V3_CONFIG=$WORK/snmpv3.conf
+    cat >"$V3_CONFIG" <<CONF
+user $V3_USER SHA_AUTH $V3_AUTH CFB_AES_128 $V3_PRIV
 context ""
 group 3 $V3_USER benchgroup
-access benchgroup "" 3 3 1 all none none
-view all .1 "" 1
+access benchgroup "" 3 3 1 all "" ""
+view all 1 "" 1
 CONF
-  v3=(--snmpv3 "$WORK/snmpv3.conf")
+  fi
+  V3_OPTIONS="--v3-user $V3_USER --v3-auth-pass $V3_AUTH --v3-priv-pass $V3_PRIV"
+  REQUEST[get-v3]="--get 1.3.6.1.2.1.1.5.0 $V3_OPTIONS"
+}
+
+# tessel_v3_options: true when Tessel can run the SNMPv3 workload; sets the array v3 to the
+# launcher options that give it the user (none with the default configuration).
+tessel_v3_options() {
+  v3=()
+  wanted get-v3 || return 1
+  if ! "$ROOT/tessel" run --help 2>&1 | grep -q -- '--snmpv3'; then
+    log "./tessel run has no --snmpv3 option yet: Tessel's SNMPv3 workload left out"; return 1
+  fi
+  if [ -n "$V3_CONFIG" ]; then v3=(--snmpv3 "$V3_CONFIG"); fi
 }
 
 # ratio A B: A / B to two decimals, or "-".
@@ -333,6 +352,7 @@ print_anomalies() {
 }
 
 main() {
+  choose_v3_user
   build_tools
   skipped echo || run_echo
   skipped snmpd || run_snmpd
