@@ -1,5 +1,7 @@
 #include "engine/engine.h"
 
+#include <sys/resource.h>
+
 #include <mutex>
 
 #include "base/stop_signal.h"
@@ -50,6 +52,15 @@ void StopSnmpLocked(Lifecycle& lifecycle) {
   FreeTreeCells();
 }
 
+// Every started agent holds a socket: the engine may use as many descriptors as the hard limit
+// allows.
+void RaiseDescriptorLimit() {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= limit.rlim_max) return;
+  limit.rlim_cur = limit.rlim_max;
+  if (setrlimit(RLIMIT_NOFILE, &limit) != 0) LOG_ERROR("Unable to raise the descriptor limit\n");
+}
+
 }  // namespace
 
 // Status lines are printed outside the lifecycle lock: the host's printStatus may call back.
@@ -59,6 +70,7 @@ bool InitAgentParams(const EngineParams& params) {
   {
     std::lock_guard<std::mutex> lock(lifecycle.mutex);
     SetConsoleMode(params.consoleMode);
+    RaiseDescriptorLimit();
     SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
                            TableProcessWriteReq);
     lifecycle.baseLoopStop.Arm();
