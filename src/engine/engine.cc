@@ -123,31 +123,32 @@ void BaseLoop() {
   TheLifecycle().baseLoopStop.Wait();
 }
 
-bool AdapterJniStopSnmp() {
-  LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopSnmp() @@@@@ \n");
-  Lifecycle& lifecycle = TheLifecycle();
+namespace {
+
+// Stops the SNMP side and tells the host with the given status line.
+void StopSnmpAndReport(Lifecycle& lifecycle, const char* status) {
   {
     std::lock_guard<std::mutex> lock(lifecycle.mutex);
     StopSnmpLocked(lifecycle);
     gv_virtualIpBase = 100;
     gv_snmpServiceStarted = 0;
   }
-  LOG_TRACE("SNMP resources cleared Successfully\n");
-  PrintStatus("SNMP resources cleared Successfully");
+  LOG_TRACE("%s\n", status);
+  PrintStatus(status);
+}
+
+}  // namespace
+
+bool AdapterJniStopSnmp() {
+  LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopSnmp() @@@@@ \n");
+  StopSnmpAndReport(TheLifecycle(), "SNMP resources cleared Successfully");
   return true;
 }
 
 bool AdapterJniStopNetwork() {
   LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopNetwork() @@@@@ \n");
   Lifecycle& lifecycle = TheLifecycle();
-  {
-    std::lock_guard<std::mutex> lock(lifecycle.mutex);
-    StopSnmpLocked(lifecycle);
-    gv_virtualIpBase = 100;
-    gv_snmpServiceStarted = 0;
-  }
-  LOG_TRACE("Network resources cleared Successfully\n");
-  PrintStatus("Network resources cleared Successfully");
+  StopSnmpAndReport(lifecycle, "Network resources cleared Successfully");
   std::lock_guard<std::mutex> lock(lifecycle.mutex);
   CloseEngineLog();
   lifecycle.baseLoopStop.Stop();
