@@ -1,5 +1,7 @@
 #include "engine/engine.h"
 
+#include <sys/resource.h>
+
 #include <mutex>
 
 #include "base/stop_signal.h"
@@ -50,6 +52,15 @@ void StopSnmpLocked(Lifecycle& lifecycle) {
   FreeTreeCells();
 }
 
+// Every started agent holds a socket: the engine may use as many descriptors as the hard limit
+// allows.
+void RaiseDescriptorLimit() {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= limit.rlim_max) return;
+  limit.rlim_cur = limit.rlim_max;
+  if (setrlimit(RLIMIT_NOFILE, &limit) != 0) LOG_ERROR("Unable to raise the descriptor limit\n");
+}
+
 }  // namespace
 
 // Status lines are printed outside the lifecycle lock: the host's printStatus may call back.
@@ -59,6 +70,7 @@ bool InitAgentParams(const EngineParams& params) {
   {
     std::lock_guard<std::mutex> lock(lifecycle.mutex);
     SetConsoleMode(params.consoleMode);
+    RaiseDescriptorLimit();
     SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
                            TableProcessWriteReq);
     lifecycle.baseLoopStop.Arm();
@@ -111,31 +123,32 @@ void BaseLoop() {
   TheLifecycle().baseLoopStop.Wait();
 }
 
-bool AdapterJniStopSnmp() {
-  LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopSnmp() @@@@@ \n");
-  Lifecycle& lifecycle = TheLifecycle();
+namespace {
+
+// Stops the SNMP side and tells the host with the given status line.
+void StopSnmpAndReport(Lifecycle& lifecycle, const char* status) {
   {
     std::lock_guard<std::mutex> lock(lifecycle.mutex);
     StopSnmpLocked(lifecycle);
     gv_virtualIpBase = 100;
     gv_snmpServiceStarted = 0;
   }
-  LOG_TRACE("SNMP resources cleared Successfully\n");
-  PrintStatus("SNMP resources cleared Successfully");
+  LOG_TRACE("%s\n", status);
+  PrintStatus(status);
+}
+
+}  // namespace
+
+bool AdapterJniStopSnmp() {
+  LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopSnmp() @@@@@ \n");
+  StopSnmpAndReport(TheLifecycle(), "SNMP resources cleared Successfully");
   return true;
 }
 
 bool AdapterJniStopNetwork() {
   LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopNetwork() @@@@@ \n");
   Lifecycle& lifecycle = TheLifecycle();
-  {
-    std::lock_guard<std::mutex> lock(lifecycle.mutex);
-    StopSnmpLocked(lifecycle);
-    gv_virtualIpBase = 100;
-    gv_snmpServiceStarted = 0;
-  }
-  LOG_TRACE("Network resources cleared Successfully\n");
-  PrintStatus("Network resources cleared Successfully");
+  StopSnmpAndReport(lifecycle, "Network resources cleared Successfully");
   std::lock_guard<std::mutex> lock(lifecycle.mutex);
   CloseEngineLog();
   lifecycle.baseLoopStop.Stop();

@@ -25,6 +25,7 @@ namespace {
 constexpr std::int32_t kUsmSecurityModel = 3;
 constexpr std::int32_t kMinimumMessageSize = 484;  // RFC 3412: smaller msgMaxSize is invalid
 constexpr std::uint32_t kTimeWindow = 150;
+constexpr std::uint32_t kMaxEngineBoots = 2147483647;
 constexpr std::size_t kDigestLength = kUsmDigestLength;
 constexpr std::size_t kSaltLength = kUsmSaltLength;
 constexpr std::uint8_t kAuthFlag = 0x01;
@@ -383,8 +384,12 @@ bool Authentic(V3Request& request) {
   return DigestsEqual(digest, reinterpret_cast<const std::uint8_t*>(request.security.authParameters.data()));
 }
 
+// A message is timely when it names the agent's current boots (never the latched maximum) and a
+// time within the window of the agent's.
 bool InTimeWindow(const V3Request& request) {
   if (request.security.boots == 0 && request.security.time == 0) return false;
+  auto boots = static_cast<std::uint32_t>(request.security.boots);
+  if (boots == kMaxEngineBoots || boots != request.agentBoots) return false;
   std::int64_t difference = static_cast<std::int64_t>(request.agentTime) - request.security.time;
   return (difference < 0 ? -difference : difference) <= kTimeWindow;
 }

@@ -27,16 +27,23 @@ def host_jar():
     return jars[0]
 
 
+def launcher_command(data, devices, address, port, extra=()):
+    """The command line that starts the launcher in a JVM with these options."""
+    return [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
+            f"-Dtessel.profiles.dir={ROOT / 'profiles'}", "-cp", str(host_jar()),
+            "com.kestrelon.simulator.tessel.Launcher", "--snmp-data", str(data), "--devices", str(devices),
+            "--address", address, "--snmp-port", str(port), *extra]
+
+
 class Network:
-    """A Tessel network started with the launcher's options; devices at address + i."""
+    """A Tessel network started with the launcher's options, `extra` appended to them (such as
+    ("--snmpv3", path)); devices at address + i. The launcher finds the default SNMPv3
+    configuration in the source tree's profiles/."""
 
     def __init__(self, data, devices, address, port, extra=()):
         self.address, self.port, self.devices = address, port, devices
         self.workdir = tempfile.mkdtemp(prefix="tessel-it-")
-        command = [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}", "-cp", str(host_jar()),
-                   "com.kestrelon.simulator.tessel.Launcher", "--snmp-data", str(data), "--devices",
-                   str(devices), "--address", address, "--snmp-port", str(port), *extra]
-        self.process = subprocess.Popen(command, cwd=self.workdir, stdout=subprocess.PIPE,
+        self.process = subprocess.Popen(launcher_command(data, devices, address, port, extra), cwd=self.workdir, stdout=subprocess.PIPE,
                                         stderr=subprocess.PIPE, text=True)
         self.started = self._wait_for_agents()
 

@@ -16,8 +16,9 @@
 namespace tessel {
 namespace {
 
-// Ports of this suite: distinct per test so that suites running in parallel do not meet.
-constexpr std::uint16_t kBasePort = 23161;
+// Ports of this suite: distinct per test, and per process so that runs on one machine at the same
+// time do not meet (20000-32000, below the ephemeral range).
+const std::uint16_t kBasePort = static_cast<std::uint16_t>(20000 + (::getpid() % 300) * 40);
 
 sockaddr_in Address(const char* text, std::uint16_t port) {
   sockaddr_in address{};

@@ -219,6 +219,11 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   V3Request stale = Authenticated();
   stale.time = 1000 + 152;
   EXPECT_EQ(ReportedName(stale), O("1.3.6.1.6.3.15.1.1.2.0"));
+  V3Request otherBoots = Authenticated();
+  otherBoots.boots = 4;
+  EXPECT_EQ(ReportedName(otherBoots), O("1.3.6.1.6.3.15.1.1.2.0"));
+  otherBoots.boots = 2147483647;
+  EXPECT_EQ(ReportedName(otherBoots), O("1.3.6.1.6.3.15.1.1.2.0"));
   stale.time = 1000 - 149;
   auto inWindow = Exchange3(Encode(stale));
   ASSERT_TRUE(inWindow);

@@ -7,13 +7,14 @@ import java.nio.file.Path;
  * next argument or after '=' ({@code --devices 10}, {@code --devices=10}). Immutable.
  *
  * @param dataFile the device data every device starts from
+ * @param snmpV3File the SNMPv3 configuration: users, contexts, groups, access rows and views
  * @param devices how many devices; device i is at {@code firstAddress + i}
  * @param firstAddress the IPv4 address of device 0 as an unsigned 32-bit number
  * @param port the UDP port of every device
  * @param logLevel the engine's log level, 0 (no log) to 3 (every operation)
  * @param help true when only the usage text is asked for
  */
-public record LaunchOptions(Path dataFile, int devices, long firstAddress, int port,
+public record LaunchOptions(Path dataFile, Path snmpV3File, int devices, long firstAddress, int port,
     String readCommunity, String writeCommunity, int logLevel, String logFile, boolean help) {
 
   public static final String USAGE = """
@@ -22,6 +23,8 @@ public record LaunchOptions(Path dataFile, int devices, long firstAddress, int p
 
         --snmp-data FILE      device data: a .snmprec file or snmpwalk -On output
                               (default: the router profile in profiles/)
+        --snmpv3 FILE         SNMPv3 users, contexts, groups, access rows and views
+                              (default: profiles/snmpv3.conf)
         --devices N           number of devices (default 100)
         --address A           IPv4 address of device 0; device i is at A + i (default 127.0.1.1)
         --snmp-port P         UDP port of every device (default 1161)
@@ -43,9 +46,13 @@ public record LaunchOptions(Path dataFile, int devices, long firstAddress, int p
     }
   }
 
-  /** Reads the command line; unset options take their defaults, the data file {@code defaultData}. */
-  public static LaunchOptions parse(String[] args, Path defaultData) throws UsageException {
-    Builder options = new Builder(defaultData);
+  /**
+   * Reads the command line; unset options take their defaults, the data file {@code defaultData}
+   * and the SNMPv3 configuration {@code defaultSnmpV3}.
+   */
+  public static LaunchOptions parse(String[] args, Path defaultData, Path defaultSnmpV3)
+      throws UsageException {
+    Builder options = new Builder(defaultData, defaultSnmpV3);
     for (int i = 0; i < args.length; i++) {
       String name = args[i];
       String value = null;
@@ -71,7 +78,7 @@ public record LaunchOptions(Path dataFile, int devices, long firstAddress, int p
 
   private static String knownOption(String name) throws UsageException {
     return switch (name) {
-      case "--snmp-data", "--devices", "--address", "--snmp-port", "--read-community",
+      case "--snmp-data", "--snmpv3", "--devices", "--address", "--snmp-port", "--read-community",
           "--write-community", "--log-level", "--log-file" -> name;
       default -> throw new UsageException("unknown option '" + name + "'");
     };
@@ -89,6 +96,7 @@ public record LaunchOptions(Path dataFile, int devices, long firstAddress, int p
 
   private static final class Builder {
     Path dataFile;
+    Path snmpV3File;
     int devices = 100;
     long firstAddress = 0x7F00_0101L; // 127.0.1.1
     int port = 1161;
@@ -98,13 +106,15 @@ public record LaunchOptions(Path dataFile, int devices, long firstAddress, int p
     String logFile = "tessel.log";
     boolean help;
 
-    Builder(Path defaultData) {
+    Builder(Path defaultData, Path defaultSnmpV3) {
       dataFile = defaultData;
+      snmpV3File = defaultSnmpV3;
     }
 
     void set(String name, String value) throws UsageException {
       switch (knownOption(name)) {
         case "--snmp-data" -> dataFile = Path.of(nonEmpty(name, value));
+        case "--snmpv3" -> snmpV3File = Path.of(nonEmpty(name, value));
         case "--devices" -> devices = number(name, value, 1, Integer.MAX_VALUE);
         case "--address" -> firstAddress = parseAddress(value);
         case "--snmp-port" -> port = number(name, value, 1, 65535);
@@ -120,7 +130,7 @@ public record LaunchOptions(Path dataFile, int devices, long firstAddress, int p
         throw new UsageException(devices + " devices from " + dotted(firstAddress)
             + " run past 255.255.255.255");
       }
-      return new LaunchOptions(dataFile, devices, firstAddress, port, readCommunity, writeCommunity,
+      return new LaunchOptions(dataFile, snmpV3File, devices, firstAddress, port, readCommunity, writeCommunity,
           logLevel, logFile, help);
     }
   }

@@ -6,8 +6,11 @@ import com.kestrelon.simulator.tessel.data.DeviceData;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.data.MibLayout;
 import com.kestrelon.simulator.tessel.snmp.DeviceStore;
+import com.kestrelon.simulator.tessel.snmp.SerToCConverter;
 import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
 import com.kestrelon.simulator.tessel.snmp.SnmpRegister;
+import com.kestrelon.simulator.tessel.snmp.SnmpV3Config;
+import com.kestrelon.simulator.tessel.snmp.SnmpV3ConfigException;
 import java.io.IOException;
 import java.io.PrintStream;
 import java.nio.file.NoSuchFileException;
@@ -16,13 +19,14 @@ import java.util.Arrays;
 import java.util.List;
 
 /**
- * {@code ./tessel run}: loads the device data, registers its objects and the devices with the
- * engine, and serves them on the calling thread until {@link #requestStop()} (SIGINT or SIGTERM
+ * {@code ./tessel run}: loads the device data and the SNMPv3 configuration, registers the
+ * objects, the SNMPv3 rows and the devices with the engine, and serves them on the calling thread until {@link #requestStop()} (SIGINT or SIGTERM
  * when started from {@link #main}).
  *
  * <p>Exit statuses: 0 after a stop, 1 when the engine refuses the network or no device starts,
- * 2 for a usage error or faulty data (the message on the error stream; a data fault reads
- * {@code FILE:LINE: reason}). The engine's status lines go to the output stream; nothing else
+ * 2 for a usage error, faulty data or an SNMPv3 row that is faulty or that the engine refuses
+ * (the message on the error stream; a fault in a file reads {@code FILE:LINE: reason}). Both
+ * files are read and checked before the engine starts. The engine's status lines go to the output stream; nothing else
  * does. A stop that comes while the network is starting ends the start-up before the next step.
  */
 public final class Launcher {
@@ -30,6 +34,7 @@ public final class Launcher {
   static final int AGENTS_PER_CALL = 32_767;
 
   private static final String DEFAULT_PROFILE = "router.snmprec";
+  private static final String DEFAULT_SNMPV3 = "snmpv3.conf";
   private static final int MAX_LOG_FILE_SIZE = 100 << 20;
   private static final int ENGINE_BOOTS = 1;
 
@@ -48,14 +53,23 @@ public final class Launcher {
 
   /** The data file used without --snmp-data: the router profile of the profiles directory. */
   static Path defaultData() {
-    return Path.of(System.getProperty("tessel.profiles.dir", "profiles"), DEFAULT_PROFILE);
+    return profile(DEFAULT_PROFILE);
+  }
+
+  /** The SNMPv3 configuration used without --snmpv3, from the profiles directory. */
+  static Path defaultSnmpV3() {
+    return profile(DEFAULT_SNMPV3);
+  }
+
+  private static Path profile(String name) {
+    return Path.of(System.getProperty("tessel.profiles.dir", "profiles"), name);
   }
 
   /** Starts the network of the command line and serves it until a stop; returns the exit status. */
   public int run(String[] args, PrintStream out, PrintStream err) {
     LaunchOptions options;
     try {
-      options = LaunchOptions.parse(args, defaultData());
+      options = LaunchOptions.parse(args, defaultData(), defaultSnmpV3());
     } catch (UsageException e) {
       err.println("tessel: " + e.getMessage());
       err.println("usage: ./tessel run [options]   (--help lists them)");
@@ -67,20 +81,24 @@ public final class Launcher {
     }
     DeviceData data;
     List<CellDefinition> cells;
+    SnmpV3Config snmpV3;
+    Path reading = options.dataFile();
     try {
-      data = DeviceData.load(options.dataFile());
+      data = DeviceData.load(reading);
       cells = MibLayout.infer(data);
-    } catch (DeviceDataException e) {
+      reading = options.snmpV3File();
+      snmpV3 = SnmpV3Config.load(reading);
+    } catch (DeviceDataException | SnmpV3ConfigException e) {
       err.println(e.getMessage());
       return 2;
     } catch (NoSuchFileException e) {
-      err.println(options.dataFile() + ": no such file");
+      err.println(reading + ": no such file");
       return 2;
     } catch (IOException e) {
-      err.println(options.dataFile() + ": cannot be read: " + e.getMessage());
+      err.println(reading + ": cannot be read: " + e.getMessage());
       return 2;
     }
-    return serve(options, data, cells, out, err);
+    return serve(options, data, cells, snmpV3, out, err);
   }
 
   /** Stops the network, or the start-up in progress; later calls do nothing. Any thread. */
@@ -104,7 +122,7 @@ public final class Launcher {
   }
 
   private int serve(LaunchOptions options, DeviceData data, List<CellDefinition> cells,
-      PrintStream out, PrintStream err) {
+      SnmpV3Config snmpV3, PrintStream out, PrintStream err) {
     NetworkSimulator simulator = new NetworkSimulator(out);
     SnmpHandler handler = new SnmpHandler(new DeviceStore(data));
     synchronized (lifecycle) {
@@ -120,6 +138,13 @@ public final class Launcher {
       engine = simulator;
       if (!handler.jniJVMparams()) {
         return fail(err, "the engine did not accept the host");
+      }
+      // The rows go under the engine ID that jniJVMparams set.
+      try {
+        snmpV3.apply(new SerToCConverter());
+      } catch (SnmpV3ConfigException e) {
+        err.println(e.getMessage());
+        return abort(2);
       }
       String refused = registerCells(cells);
       if (refused != null) {
@@ -155,9 +180,14 @@ public final class Launcher {
   /** Reports a failed start-up and stops the engine; the caller holds the lifecycle lock. */
   private int fail(PrintStream err, String reason) {
     err.println("tessel: " + reason);
+    return abort(1);
+  }
+
+  /** Stops the engine after a failed start-up; the caller holds the lifecycle lock. */
+  private int abort(int status) {
     stopRequested = true;
     engine.AdapterJniStopNetwork();
-    return 1;
+    return status;
   }
 
   /** Registers every cell; returns the OID of the first the engine refuses, or null. */

@@ -26,6 +26,7 @@ import org.junit.jupiter.params.provider.CsvSource;
 /** The command line of ./tessel run, its exit statuses, and one real start and stop. */
 class LauncherTest {
   private static final Path DATA = Path.of("d.snmprec");
+  private static final Path V3 = Path.of("v3.conf");
 
   private final ByteArrayOutputStream out = new ByteArrayOutputStream();
   private final ByteArrayOutputStream err = new ByteArrayOutputStream();
@@ -78,22 +79,22 @@ class LauncherTest {
 
   @Test
   void optionsTakeTheirValuesInEitherFormAndDefaultsOtherwise() throws Exception {
-    LaunchOptions defaults = LaunchOptions.parse(new String[0], DATA);
-    assertEquals(new LaunchOptions(DATA, 100, 0x7F000101L, 1161, "public", "private", 0, "tessel.log", false),
+    LaunchOptions defaults = LaunchOptions.parse(new String[0], DATA, V3);
+    assertEquals(new LaunchOptions(DATA, V3, 100, 0x7F000101L, 1161, "public", "private", 0, "tessel.log", false),
         defaults);
     assertEquals("127.0.1.100", defaults.address(99));
 
-    LaunchOptions set = LaunchOptions.parse(new String[] {"--snmp-data", "x.walk", "--devices=3",
+    LaunchOptions set = LaunchOptions.parse(new String[] {"--snmp-data", "x.walk", "--snmpv3=u.conf", "--devices=3",
         "--address", "10.0.0.254", "--snmp-port=11161", "--read-community", "r", "--write-community=w",
-        "--log-level", "3", "--log-file", "e.log"}, DATA);
-    assertEquals(new LaunchOptions(Path.of("x.walk"), 3, 0x0A0000FEL, 11161, "r", "w", 3, "e.log", false), set);
+        "--log-level", "3", "--log-file", "e.log"}, DATA, V3);
+    assertEquals(new LaunchOptions(Path.of("x.walk"), Path.of("u.conf"), 3, 0x0A0000FEL, 11161, "r", "w", 3, "e.log", false), set);
     assertEquals("10.0.0.255", set.address(1), "addresses ending in .255 are used");
     assertEquals("10.0.1.0", set.address(2), "and carry into the next octet");
 
-    LaunchOptions last = LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "2"}, DATA);
+    LaunchOptions last = LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "2"}, DATA, V3);
     assertEquals("255.255.255.255", last.address(1));
     assertThrows(LaunchOptions.UsageException.class,
-        () -> LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "3"}, DATA));
+        () -> LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "3"}, DATA, V3));
   }
 
   @ParameterizedTest
@@ -108,7 +109,8 @@ class LauncherTest {
       "--address 127.0.1.256;      --address takes an IPv4 address",
       "--read-community a,b;       --read-community takes a non-empty community without ','",
       "--write-community=;         --write-community takes a non-empty community",
-      "--snmp-data=;               --snmp-data needs a value"})
+      "--snmp-data=;               --snmp-data needs a value",
+      "--snmpv3;                   --snmpv3 needs a value"})
   void usageErrorsExitWithStatusTwo(String args, String message) throws Exception {
     assertEquals(2, runToEnd(args.split(" ")));
     assertTrue(err().startsWith("tessel: " + message), err());
@@ -119,7 +121,7 @@ class LauncherTest {
   void helpGoesToStandardOutput() throws Exception {
     assertEquals(0, runToEnd("--devices", "5", "--help"));
     assertTrue(out().startsWith("usage: ./tessel run [options]"));
-    for (String option : new String[] {"--snmp-data", "--devices", "--address", "--snmp-port", "--read-community",
+    for (String option : new String[] {"--snmp-data", "--snmpv3", "--devices", "--address", "--snmp-port", "--read-community",
         "--write-community", "--log-level", "--log-file"}) {
       assertTrue(out().contains("  " + option + " "), option);
     }
@@ -140,6 +142,20 @@ class LauncherTest {
   }
 
   @Test
+  void snmpV3FaultsExitWithStatusTwoBeforeAnythingStarts(@TempDir Path dir) throws Exception {
+    Path bad = dir.resolve("bad.conf");
+    Files.writeString(bad, "user a NO_AUTH - NO_PRIV -\nuser b NO_AUTH - CBC_DES despassword\n");
+    assertEquals(2, runToEnd("--snmpv3", bad.toString(), "--snmp-port", "28163"));
+    assertEquals(bad + ":2: privacy needs authentication: NO_AUTH with CBC_DES", err().strip());
+    assertEquals("", out(), "no device was started");
+
+    err.reset();
+    assertEquals(2, runToEnd("--snmpv3", dir.resolve("missing.conf").toString()));
+    assertEquals(dir.resolve("missing.conf") + ": no such file", err().strip());
+    assertEquals("", out());
+  }
+
+  @Test
   void noDeviceStartedExitsWithStatusOne() throws Exception {
     String first = unboundPair();
     assertEquals(1, runToEnd("--devices", "2", "--address", first, "--snmp-port", "28161"));
@@ -151,6 +167,19 @@ class LauncherTest {
   /** A v2c Get of sysName.0 with the community "private". */
   private static final byte[] GET_SYS_NAME = HexFormat.of().parseHex(
       "3027020101040770726976617465a019020101020100020100300e300c06082b060102010105000500");
+
+  /** An SNMPv3 Get without engine ID or user: engine discovery. */
+  private static final byte[] DISCOVERY = HexFormat.of().parseHex(
+      "3038020103300e020101020300ffe30401040201030410300e0400020100020100040004000400301104000400a00b0201010201000201003000");
+
+  private static String exchange(DatagramSocket socket, byte[] request, String address, int port)
+      throws IOException {
+    socket.send(new DatagramPacket(request, request.length, InetAddress.getByName(address), port));
+    DatagramPacket reply = new DatagramPacket(new byte[1500], 1500);
+    socket.receive(reply);
+    assertEquals(address, reply.getAddress().getHostAddress(), "each device answers from its address");
+    return new String(reply.getData(), 0, reply.getLength(), StandardCharsets.ISO_8859_1);
+  }
 
   @Test
   void servesTheDefaultProfileUntilStopped() throws Exception {
@@ -168,12 +197,10 @@ class LauncherTest {
 
       try (DatagramSocket socket = new DatagramSocket()) {
         socket.setSoTimeout(3000);
-        socket.send(new DatagramPacket(GET_SYS_NAME, GET_SYS_NAME.length, InetAddress.getByName("127.0.3.2"), 28162));
-        DatagramPacket reply = new DatagramPacket(new byte[1500], 1500);
-        socket.receive(reply);
-        String text = new String(reply.getData(), 0, reply.getLength(), StandardCharsets.ISO_8859_1);
-        assertTrue(text.contains("edge-router"), "the write community reads the profile's sysName");
-        assertEquals("127.0.3.2", reply.getAddress().getHostAddress(), "each device answers from its address");
+        assertTrue(exchange(socket, GET_SYS_NAME, "127.0.3.2", 28162).contains("edge-router"),
+            "the write community reads the profile's sysName");
+        // The default SNMPv3 configuration is loaded: discovery gets a Report naming the engine.
+        assertTrue(exchange(socket, DISCOVERY, "127.0.3.2", 28162).contains("127.0.3.2#"));
       }
     } finally {
       launcher.requestStop();

@@ -1,0 +1,261 @@
+"""SNMPv3 managers against Tessel's devices: net-snmp and pysnmp with every level and protocol pair of
+the default configuration (profiles/snmpv3.conf), the Reports for security errors, and views."""
+
+import hashlib
+import hmac
+import re
+import socket
+import subprocess
+
+import pytest
+
+from conftest import BASE_PORT, PROFILE, Network, launcher_command, lines, snmp
+
+SYS_NAME = "1.3.6.1.2.1.1.5.0"
+IF_DESCR_1 = "1.3.6.1.2.1.2.2.1.2.1"
+INTERFACES = ".1.3.6.1.2.1.2."
+BOUNDED = ("-t", "1", "-r", "1")
+
+# The default configuration's users: name -> net-snmp security options.
+USERS = {
+    "noauth": ("-l", "noAuthNoPriv"),
+    "md5": ("-l", "authNoPriv", "-a", "MD5", "-A", "md5password"),
+    "sha": ("-l", "authNoPriv", "-a", "SHA", "-A", "shapassword"),
+    "md5des": ("-l", "authPriv", "-a", "MD5", "-A", "md5password", "-x", "DES", "-X", "despassword"),
+    "md5aes": ("-l", "authPriv", "-a", "MD5", "-A", "md5password", "-x", "AES", "-X", "aespassword"),
+    "shades": ("-l", "authPriv", "-a", "SHA", "-A", "shapassword", "-x", "DES", "-X", "despassword"),
+    "shaaes": ("-l", "authPriv", "-a", "SHA", "-A", "shapassword", "-x", "AES", "-X", "aespassword"),
+    "restricted": ("-l", "authNoPriv", "-a", "SHA", "-A", "restrictedpw"),
+}
+
+
+def v3(user, *security):
+    """net-snmp options for a v3 request as `user`: its own security options unless given."""
+    return ("-v3", *BOUNDED, "-u", user, *(security or USERS[user]))
+
+
+def walk(tool, endpoint, *options):
+    return [l for l in lines(tool, *options, endpoint, "1.3")
+            if "No more variables left" not in l and l != "End of MIB"]
+
+
+def received_packets(debug_output):
+    """The datagrams a net-snmp tool run with -d received, from its hex dumps."""
+    packets, current = [], None
+    for line in debug_output.splitlines():
+        if line.startswith("Received "):
+            current = bytearray()
+            packets.append(current)
+        elif current is not None and re.match(r"[0-9]{4}: ", line):
+            current.extend(bytes.fromhex(line[6:57]))
+        else:
+            current = None
+    return [bytes(p) for p in packets]
+
+
+# A network also binds its trap port, the agent port + 1, on every address: networks that run at
+# the same time keep two ports apart.
+@pytest.fixture(scope="module")
+def v3net():
+    net = Network(PROFILE, 2, "127.0.3.41", BASE_PORT + 3)
+    yield net
+    assert net.stop() == 0
+
+
+@pytest.mark.parametrize("user", ["noauth", "md5", "sha", "md5des", "md5aes", "shades", "shaaes"])
+def test_every_level_and_protocol_pair_reads_every_device(v3net, user):
+    for device in range(v3net.devices):
+        assert lines("snmpget", *v3(user), v3net.agent(device), SYS_NAME) == [
+            f'.{SYS_NAME} = STRING: "edge-router"']
+        assert lines("snmpgetnext", *v3(user), v3net.agent(device), "1.3.6.1.2.1.1.4.0") == [
+            f'.{SYS_NAME} = STRING: "edge-router"']
+
+
+def test_authpriv_walks_match_the_community_walk(v3net):
+    agent = v3net.agent(1)
+    expected = walk("snmpwalk", agent, "-v2c", "-c", "public", *BOUNDED)
+    assert len(expected) > 300
+    assert walk("snmpwalk", agent, *v3("shaaes")) == expected
+    assert walk("snmpbulkwalk", agent, *v3("md5des"), "-Cr25") == expected
+
+
+def test_security_errors_get_reports_that_net_snmp_names(v3net):
+    agent = v3net.agent(0)
+    cases = [
+        (v3("md5", "-l", "authNoPriv", "-a", "MD5", "-A", "notthepassword"), "Authentication failure"),
+        (v3("shaaes", "-l", "authPriv", "-a", "SHA", "-A", "md5password", "-x", "AES", "-X", "aespassword"),
+         "Authentication failure"),
+        (v3("nobody", "-l", "noAuthNoPriv"), "Unknown user name"),
+        (v3("noauth", "-l", "authNoPriv", "-a", "MD5", "-A", "md5password"), "Unsupported security level"),
+        (v3("sha", "-l", "authPriv", "-a", "SHA", "-A", "shapassword", "-x", "AES", "-X", "aespassword"),
+         "Unsupported security level"),
+    ]
+    for options, message in cases:
+        result = snmp("snmpget", *options, agent, SYS_NAME, check=False)
+        assert result.returncode != 0 and message in result.stderr, (options, result.stderr)
+        assert "edge-router" not in result.stdout
+
+
+@pytest.mark.parametrize("user,cipher", [("md5des", "DES"), ("shaaes", "AES")])
+def test_wrong_privacy_password_yields_no_plaintext(v3net, user, cipher):
+    security = list(USERS[user])
+    security[security.index("-X") + 1] = "wrongprivpass"
+    result = snmp("snmpget", "-d", *v3(user, *security), v3net.agent(0), SYS_NAME, check=False)
+    assert result.returncode != 0 and "Decryption error" in result.stderr, result.stderr
+    packets = received_packets(result.stdout + result.stderr)
+    assert packets, "the agent answered with Reports"
+    assert all(b"edge-router" not in p for p in packets)
+
+
+def test_views_limit_reads_walks_and_sets(v3net):
+    agent = v3net.agent(1)
+    assert lines("snmpget", *v3("restricted"), agent, SYS_NAME) == [f'.{SYS_NAME} = STRING: "edge-router"']
+    refused = snmp("snmpget", *v3("restricted"), agent, IF_DESCR_1, check=False)
+    assert "authorizationError" in refused.stderr + refused.stdout
+
+    full = walk("snmpwalk", agent, *v3("sha"))
+    restricted = walk("snmpwalk", agent, *v3("restricted"))
+    assert any(l.startswith(INTERFACES) for l in full)
+    assert restricted == [l for l in full if not l.startswith(INTERFACES)]
+
+    assert lines("snmpset", *v3("restricted"), agent, "1.3.6.1.2.1.1.4.0", "s", "v3 ops") == [
+        '.1.3.6.1.2.1.1.4.0 = STRING: "v3 ops"']
+    outside = snmp("snmpset", *v3("restricted"), agent, "1.3.6.1.2.1.4.1.0", "i", "2", check=False)
+    assert outside.returncode != 0 and "authorizationError" in outside.stderr + outside.stdout
+    assert lines("snmpset", *v3("shades"), agent, "1.3.6.1.2.1.4.1.0", "i", "2") == [
+        ".1.3.6.1.2.1.4.1.0 = INTEGER: 2"]
+    noauth = snmp("snmpset", *v3("noauth"), agent, "1.3.6.1.2.1.1.4.0", "s", "x", check=False)
+    assert "authorizationError" in noauth.stderr + noauth.stdout, "noauth has no write view"
+
+
+def test_pysnmp_reads_at_every_level(v3net):
+    script = f"""
+from pysnmp.hlapi import *
+host, port = "{v3net.agent(0)}".split(":")
+users = [UsmUserData("noauth"),
+         UsmUserData("md5des", "md5password", "despassword", authProtocol=usmHMACMD5AuthProtocol,
+                     privProtocol=usmDESPrivProtocol),
+         UsmUserData("shaaes", "shapassword", "aespassword", authProtocol=usmHMACSHAAuthProtocol,
+                     privProtocol=usmAesCfb128Protocol)]
+for user in users:
+    error, status, index, binds = next(getCmd(SnmpEngine(), user,
+        UdpTransportTarget((host, int(port)), timeout=1, retries=1), ContextData(),
+        ObjectType(ObjectIdentity("{SYS_NAME}"))))
+    assert not error and not status, (user, error, status)
+    print(binds[0][1].prettyPrint())
+"""
+    result = subprocess.run(["/usr/bin/python3", "-c", script], capture_output=True, text=True, timeout=60)
+    assert result.returncode == 0, result.stderr
+    assert result.stdout.split() == ["edge-router"] * 3
+
+
+# ---- Time window, with messages built here: net-snmp always synchronises before it asks. ----
+
+def tlv(tag, body):
+    if len(body) < 128:
+        return bytes([tag, len(body)]) + body
+    size = len(body).to_bytes((len(body).bit_length() + 7) // 8, "big")
+    return bytes([tag, 0x80 | len(size)]) + size + body
+
+
+def integer(value):
+    return tlv(0x02, value.to_bytes((value.bit_length() + 8) // 8, "big", signed=True))
+
+
+def octets(data):
+    return tlv(0x04, data)
+
+
+def seq(*items):
+    return tlv(0x30, b"".join(items))
+
+
+def parse(data):
+    """The (tag, contents) pairs one after the other in data."""
+    items = []
+    while data:
+        tag, length, at = data[0], data[1], 2
+        if length & 0x80:
+            at = 2 + (length & 0x7F)
+            length = int.from_bytes(data[2:at], "big")
+        items.append((tag, data[at:at + length]))
+        data = data[at + length:]
+    return items
+
+
+def md5_key(password, engine_id):
+    stretched = (password * (1048576 // len(password) + 1))[:1048576]
+    ku = hashlib.md5(stretched).digest()
+    return hashlib.md5(ku + engine_id + ku).digest()
+
+
+def v3_exchange(endpoint, engine_id=b"", boots=0, time=0, user=b"", key=None):
+    """Sends a Get of sysName.0 (authNoPriv with HMAC-MD5 when key is given); returns the reply's
+    msgFlags, security parameters (engine ID, boots, time) and the PDU tag with its first binding."""
+    get = tlv(0xA0, integer(77) + integer(0) + integer(0) + seq(seq(bytes.fromhex("06082b06010201010500"), b"\x05\x00")))
+
+    def message(digest):
+        header = seq(integer(1234), integer(65507), octets(bytes([0x05 if key else 0x04])), integer(3))
+        security = seq(octets(engine_id), integer(boots), integer(time), octets(user), octets(digest), octets(b""))
+        return seq(integer(3), header, octets(security), seq(octets(engine_id), octets(b""), get))
+
+    datagram = message(b"\x00" * 12 if key else b"")
+    if key:
+        datagram = message(hmac.new(key, datagram, hashlib.md5).digest()[:12])
+    host, port = endpoint.split(":")
+    with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as s:
+        s.settimeout(2)
+        s.sendto(datagram, (host, int(port)))
+        reply = s.recv(4096)
+    _, header, security, scoped = parse(parse(reply)[0][1])
+    flags = parse(header[1])[2][1][0]
+    engine, r_boots, r_time = parse(parse(security[1])[0][1])[:3]
+    pdu_tag, pdu = parse(scoped[1])[2]
+    name, value = parse(parse(parse(pdu)[3][1])[0][1])
+    return (flags, engine[1], int.from_bytes(r_boots[1], "big"), int.from_bytes(r_time[1], "big"), pdu_tag,
+            name[1], value[1])
+
+
+NOT_IN_TIME_WINDOWS = bytes.fromhex("2b060106030f01010200")
+
+
+def test_discovery_then_only_current_boots_and_time_are_accepted(v3net):
+    agent = v3net.agent(0)
+    flags, engine, boots, time, tag, name, _ = v3_exchange(agent)
+    assert (tag, name) == (0xA8, bytes.fromhex("2b060106030f01010400")), "usmStatsUnknownEngineIDs Report"
+    assert engine and boots >= 1 and flags & 0x03 == 0
+    key = md5_key(b"md5password", engine)
+
+    *_, tag, name, value = v3_exchange(agent, engine, boots, time, b"md5", key)
+    assert (tag, value) == (0xA2, b"edge-router")
+    for stale_boots, stale_time in ((boots, time + 1000), (boots + 1, time), (2147483647, time)):
+        flags, _, report_boots, _, tag, name, _ = v3_exchange(agent, engine, stale_boots, stale_time, b"md5", key)
+        assert (tag, name) == (0xA8, NOT_IN_TIME_WINDOWS), (stale_boots, stale_time)
+        assert flags & 0x01 and report_boots == boots, "an authenticated Report with the agent's boots"
+
+
+def test_given_configuration_replaces_the_default_and_communities_keep_working(tmp_path):
+    config = tmp_path / "v3.conf"
+    config.write_text('user solo SHA_AUTH solopassword CFB_AES_128 solosecret\ncontext ""\n'
+                      "group 3 solo g\naccess g \"\" 3 3 1 sys \"\" \"\"\nview sys 1.3.6.1.2.1.1 \"\" 1\n")
+    net = Network(PROFILE, 1, "127.0.3.45", BASE_PORT + 5, extra=("--snmpv3", str(config)))
+    try:
+        agent = net.agent(0)
+        solo = ("-l", "authPriv", "-a", "SHA", "-A", "solopassword", "-x", "AES", "-X", "solosecret")
+        assert lines("snmpget", *v3("solo", *solo), agent, SYS_NAME) == [f'.{SYS_NAME} = STRING: "edge-router"']
+        assert all(l.startswith(".1.3.6.1.2.1.1.") for l in walk("snmpwalk", agent, *v3("solo", *solo)))
+        unknown = snmp("snmpget", *v3("shaaes"), agent, SYS_NAME, check=False)
+        assert "Unknown user name" in unknown.stderr
+        assert lines("snmpget", "-v2c", "-c", "public", *BOUNDED, agent, SYS_NAME) == [
+            f'.{SYS_NAME} = STRING: "edge-router"']
+    finally:
+        assert net.stop() == 0
+
+
+def test_faulty_configuration_stops_the_start(tmp_path):
+    config = tmp_path / "bad.conf"
+    config.write_text("user a MD5_AUTH md5password NO_PRIV -\nuser a SHA_AUTH shapassword NO_PRIV -\n")
+    result = subprocess.run(launcher_command(PROFILE, 1, "127.0.3.46", BASE_PORT + 7, ("--snmpv3", str(config))),
+                            cwd=tmp_path, capture_output=True, text=True, timeout=60)
+    assert (result.returncode, result.stdout) == (2, "")
+    assert result.stderr.strip() == f"{config}:2: user 'a' is already defined at line 1"
