@@ -141,7 +141,7 @@ TEST_F(LoadgenV3Message, RoundTripsAndRejectsTampering) {
 }
 
 // The digest and the cipher text recomputed with libcrypto alone from the message's fields.
-TEST_F(LoadgenV3Message, DigestAndCipherTextAsSpecified) {
+TEST_F(LoadgenV3Message, DigestAndCipherTextRecomputedWithLibcrypto) {
   const v3::Bytes header = {0x04, 0x05, 'b', 'e', 'n', 'c', 'h', 0x04, 0x0c};
   const std::size_t digestAt = After(message_, header);
   ASSERT_GT(digestAt, 0u);
