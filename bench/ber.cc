@@ -11,7 +11,8 @@ void AppendLength(Bytes* out, std::size_t length) {
   int octets = 0;
   for (std::size_t rest = length; rest != 0; rest >>= 8) ++octets;
   out->push_back(static_cast<std::uint8_t>(0x80 | octets));
-  for (int i = octets - 1; i >= 0; --i) out->push_back(static_cast<std::uint8_t>(length >> (8 * i)));
+  for (int i = octets - 1; i >= 0; --i)
+    out->push_back(static_cast<std::uint8_t>(length >> (8 * i)));
 }
 
 void AppendBase128(Bytes* out, std::uint64_t value) {
@@ -21,7 +22,8 @@ void AppendBase128(Bytes* out, std::uint64_t value) {
     groups[count++] = static_cast<std::uint8_t>(value & 0x7F);
     value >>= 7;
   } while (value != 0);
-  for (int i = count - 1; i >= 0; --i) out->push_back(static_cast<std::uint8_t>(groups[i] | (i > 0 ? 0x80 : 0)));
+  for (int i = count - 1; i >= 0; --i)
+    out->push_back(static_cast<std::uint8_t>(groups[i] | (i > 0 ? 0x80 : 0)));
 }
 
 }  // namespace
@@ -43,17 +45,21 @@ std::size_t HeaderSize(std::size_t contentsLength) {
 
 Bytes Integer(std::int64_t value) {
   Bytes contents;
-  for (int i = 7; i >= 0; --i) contents.push_back(static_cast<std::uint8_t>(static_cast<std::uint64_t>(value) >> (8 * i)));
+  for (int i = 7; i >= 0; --i)
+    contents.push_back(static_cast<std::uint8_t>(static_cast<std::uint64_t>(value) >> (8 * i)));
   std::size_t start = 0;
   while (start + 1 < contents.size() &&
          ((contents[start] == 0x00 && !(contents[start + 1] & 0x80)) ||
           (contents[start] == 0xFF && (contents[start + 1] & 0x80)))) {
     ++start;
   }
-  return Tlv(kInteger, Bytes(contents.begin() + static_cast<std::ptrdiff_t>(start), contents.end()));
+  return Tlv(kInteger,
+             Bytes(contents.begin() + static_cast<std::ptrdiff_t>(start), contents.end()));
 }
 
-Bytes OctetString(const std::uint8_t* data, std::size_t length) { return Tlv(kOctetString, Bytes(data, data + length)); }
+Bytes OctetString(const std::uint8_t* data, std::size_t length) {
+  return Tlv(kOctetString, Bytes(data, data + length));
+}
 
 bool ObjectIdentifier(const std::vector<std::uint32_t>& oid, Bytes* out) {
   if (oid.size() < 2 || oid[0] > 2 || (oid[0] < 2 && oid[1] >= 40)) return false;

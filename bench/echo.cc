@@ -3,13 +3,12 @@
 // each batch straight back with sendmmsg. It stops after --duration seconds, --count datagrams,
 // or SIGTERM/SIGINT, and prints what it echoed.
 #include <netinet/in.h>
+#include <sched.h>
 #include <signal.h>
 #include <sys/epoll.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <unistd.h>
-
-#include <sched.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -109,8 +108,10 @@ std::uint64_t EchoServer::Serve(const EchoOptions& options) {
   epoll_event events[64];
   while (!stopRequested) {
     const std::int64_t now = NowMs();
-    if (now >= end || (options.count > 0 && echoed_ >= static_cast<std::uint64_t>(options.count))) break;
-    const int ready = epoll_wait(epoll_, events, 64, static_cast<int>(std::min<std::int64_t>(end - now, 100)));
+    if (now >= end || (options.count > 0 && echoed_ >= static_cast<std::uint64_t>(options.count)))
+      break;
+    const int ready =
+        epoll_wait(epoll_, events, 64, static_cast<int>(std::min<std::int64_t>(end - now, 100)));
     for (int i = 0; i < ready; ++i) EchoAll(events[i].data.fd);
   }
   for (int fd : fds_) close(fd);

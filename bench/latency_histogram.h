@@ -45,7 +45,8 @@ class Histogram {
     const int top = std::bit_width(value) - 1;  // >= kSubBits
     const int shift = top - (kSubBits - 1);
     const std::uint64_t sub = (value >> shift) - kHalf;  // [0, 64)
-    return static_cast<std::size_t>(kLinear + static_cast<std::uint64_t>(top - kSubBits) * kHalf + sub);
+    return static_cast<std::size_t>(kLinear + static_cast<std::uint64_t>(top - kSubBits) * kHalf +
+                                    sub);
   }
 
   static std::uint64_t Midpoint(std::size_t index) {

@@ -7,8 +7,8 @@
 // time-out, and stops by itself.
 #include <arpa/inet.h>
 #include <netinet/in.h>
-#include <sched.h>
 #include <poll.h>
+#include <sched.h>
 #include <sys/epoll.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
@@ -131,12 +131,14 @@ class Generator {
   void Queue(int slotIndex, std::int64_t now);
   void Flush(int socketIndex);
   void Drain(int socketIndex, std::int64_t now);
-  void Answer(const std::uint8_t* data, std::size_t length, const sockaddr_in& source, std::int64_t now);
-  void AnswerV3(const std::uint8_t* data, std::size_t length, const sockaddr_in& source, std::int64_t now);
+  void Answer(const std::uint8_t* data, std::size_t length, const sockaddr_in& source,
+              std::int64_t now);
+  void AnswerV3(const std::uint8_t* data, std::size_t length, const sockaddr_in& source,
+                std::int64_t now);
   int Claim(std::uint32_t requestId);
   void Release(int slotIndex);
-  void Complete(const Slot& slot, const tessel::bench::ReplySummary& reply, const sockaddr_in& source,
-                std::int64_t now);
+  void Complete(const Slot& slot, const tessel::bench::ReplySummary& reply,
+                const sockaddr_in& source, std::int64_t now);
   void Expire(std::int64_t now);
   std::int64_t WaitNs(std::int64_t now) const;
   std::uint64_t AllowedByRate(std::int64_t now) const;
@@ -170,9 +172,9 @@ class Generator {
 bool Generator::Open() {
   const bool encoded =
       options_.v3User.empty()
-          ? tessel::bench::EncodeRequestTemplate(options_.version, options_.community, options_.pduType,
-                                                 options_.oid, options_.nonRepeaters, options_.maxRepetitions,
-                                                 &template_)
+          ? tessel::bench::EncodeRequestTemplate(
+                options_.version, options_.community, options_.pduType, options_.oid,
+                options_.nonRepeaters, options_.maxRepetitions, &template_)
           : tessel::bench::EncodePduTemplate(options_.pduType, options_.oid, options_.nonRepeaters,
                                              options_.maxRepetitions, &template_);
   if (!encoded) {
@@ -196,7 +198,8 @@ bool Generator::Open() {
   batches_.resize(static_cast<std::size_t>(options_.sockets));
   for (int i = options_.window - 1; i >= 0; --i) freeSlots_.push_back(i);
   for (int i = 0; i < kMaxBatch; ++i) {
-    receive_.vectors[i] = {receive_.buffers.data() + static_cast<std::size_t>(i) * kReceiveSize, kReceiveSize};
+    receive_.vectors[i] = {receive_.buffers.data() + static_cast<std::size_t>(i) * kReceiveSize,
+                           kReceiveSize};
     receive_.headers[i].msg_hdr.msg_iov = &receive_.vectors[i];
     receive_.headers[i].msg_hdr.msg_iovlen = 1;
   }
@@ -210,7 +213,8 @@ std::uint32_t Generator::NextRequestId(int slotIndex) {
   Slot& slot = slots_[static_cast<std::size_t>(slotIndex)];
   std::uint32_t next = slot.requestId == 0 ? kFirstRequestId + static_cast<std::uint32_t>(slotIndex)
                                            : slot.requestId + window;
-  if (next > kLastRequestId - window) next = kFirstRequestId + static_cast<std::uint32_t>(slotIndex);
+  if (next > kLastRequestId - window)
+    next = kFirstRequestId + static_cast<std::uint32_t>(slotIndex);
   return next;
 }
 
@@ -236,7 +240,8 @@ void Generator::Queue(int slotIndex, std::int64_t now) {
     tessel::bench::PatchRequestId(batch.payload[n], template_, slot.requestId);
   } else {
     // A request that cannot be encoded goes out empty and is counted lost.
-    size = peers_[slot.target].Encode(slot.requestId, now, salt_++, batch.payload[n], tessel::bench::kMaxRequestSize);
+    size = peers_[slot.target].Encode(slot.requestId, now, salt_++, batch.payload[n],
+                                      tessel::bench::kMaxRequestSize);
   }
   batch.vectors[n] = {batch.payload[n], size};
   msghdr& header = batch.headers[n].msg_hdr;
@@ -314,8 +319,8 @@ void Generator::Release(int slotIndex) {
   freeSlots_.push_back(slotIndex);
 }
 
-void Generator::Complete(const Slot& slot, const tessel::bench::ReplySummary& reply, const sockaddr_in& source,
-                         std::int64_t now) {
+void Generator::Complete(const Slot& slot, const tessel::bench::ReplySummary& reply,
+                         const sockaddr_in& source, std::int64_t now) {
   answered_ = true;
   if (!slot.measured) return;
   const sockaddr_in& target = options_.targets[slot.target];
@@ -356,7 +361,8 @@ void Generator::AnswerV3(const std::uint8_t* data, std::size_t length, const soc
   const Slot& slot = slots_[static_cast<std::size_t>(slotIndex)];
   tessel::bench::ReplySummary reply;
   std::vector<std::uint32_t> reportOid;
-  if (!peers_[slot.target].Decode(data, length, &reply, reportOid.empty() && !reportShown_ ? &reportOid : nullptr)) {
+  if (!peers_[slot.target].Decode(data, length, &reply,
+                                  reportOid.empty() && !reportShown_ ? &reportOid : nullptr)) {
     ++counters_.malformed;
     return;
   }
@@ -375,7 +381,8 @@ void Generator::Drain(int socketIndex, std::int64_t now) {
       receive_.headers[i].msg_hdr.msg_name = &receive_.sources[i];
       receive_.headers[i].msg_hdr.msg_namelen = sizeof(sockaddr_in);
     }
-    int count = recvmmsg(fds_[static_cast<std::size_t>(socketIndex)], receive_.headers, kMaxBatch, 0, nullptr);
+    int count = recvmmsg(fds_[static_cast<std::size_t>(socketIndex)], receive_.headers, kMaxBatch,
+                         0, nullptr);
     if (count <= 0) return;
     for (int i = 0; i < count; ++i) {
       const auto* data = static_cast<const std::uint8_t*>(receive_.vectors[i].iov_base);
@@ -429,7 +436,8 @@ void Generator::Loop() {
     if (now >= measureEndNs_ && (busy_ == 0 || now >= measureEndNs_ + timeoutNs)) return;
     FillWindow(now);
     const std::int64_t waitNs = WaitNs(NowNs());
-    const timespec wait{static_cast<time_t>(waitNs / 1000000000), static_cast<long>(waitNs % 1000000000)};
+    const timespec wait{static_cast<time_t>(waitNs / 1000000000),
+                        static_cast<long>(waitNs % 1000000000)};
     int ready = epoll_pwait2(epoll_, events, 16, &wait, nullptr);
     now = NowNs();
     for (int i = 0; i < ready; ++i) Drain(static_cast<int>(events[i].data.u32), now);
@@ -453,9 +461,10 @@ bool Generator::Discover() {
   for (int attempt = 0; attempt < kDiscoveryTries && missing > 0; ++attempt) {
     for (std::size_t i = 0; i < count; ++i) {
       if (known[i]) continue;
-      const v3::Bytes request = v3::EncodeDiscovery(kFirstDiscoveryId + static_cast<std::uint32_t>(i));
-      sendto(fds_[0], request.data(), request.size(), 0, reinterpret_cast<const sockaddr*>(&options_.targets[i]),
-             sizeof(sockaddr_in));
+      const v3::Bytes request =
+          v3::EncodeDiscovery(kFirstDiscoveryId + static_cast<std::uint32_t>(i));
+      sendto(fds_[0], request.data(), request.size(), 0,
+             reinterpret_cast<const sockaddr*>(&options_.targets[i]), sizeof(sockaddr_in));
     }
     const std::int64_t deadline = NowNs() + static_cast<std::int64_t>(options_.timeoutMs) * 1000000;
     for (std::int64_t now = NowNs(); missing > 0 && now < deadline; now = NowNs()) {
@@ -464,16 +473,18 @@ bool Generator::Discover() {
       for (;;) {
         sockaddr_in source{};
         socklen_t sourceSize = sizeof source;
-        const ssize_t length =
-            recvfrom(fds_[0], buffer, kReceiveSize, 0, reinterpret_cast<sockaddr*>(&source), &sourceSize);
+        const ssize_t length = recvfrom(fds_[0], buffer, kReceiveSize, 0,
+                                        reinterpret_cast<sockaddr*>(&source), &sourceSize);
         if (length < 0) break;
         std::uint32_t messageId = 0;
         v3::Engine engine;
-        if (!v3::DecodeEngine(buffer, static_cast<std::size_t>(length), &messageId, &engine)) continue;
+        if (!v3::DecodeEngine(buffer, static_cast<std::size_t>(length), &messageId, &engine))
+          continue;
         const std::size_t index = messageId - kFirstDiscoveryId;
         if (messageId < kFirstDiscoveryId || index >= count || known[index]) continue;
         const sockaddr_in& target = options_.targets[index];
-        if (source.sin_addr.s_addr != target.sin_addr.s_addr || source.sin_port != target.sin_port) continue;
+        if (source.sin_addr.s_addr != target.sin_addr.s_addr || source.sin_port != target.sin_port)
+          continue;
         if (!peers_[index].Init(user, engine, template_, NowNs()) ||
             peers_[index].Encode(kFirstRequestId, NowNs(), 0, probe, sizeof probe) == 0) {
           std::fprintf(stderr, "loadgen: cannot set up SNMPv3 keys or requests\n");
@@ -484,7 +495,8 @@ bool Generator::Discover() {
       }
     }
   }
-  if (missing > 0) std::fprintf(stderr, "loadgen: %zu of %zu targets did not answer discovery\n", missing, count);
+  if (missing > 0)
+    std::fprintf(stderr, "loadgen: %zu of %zu targets did not answer discovery\n", missing, count);
   return missing == 0;
 }
 
@@ -501,7 +513,8 @@ int Generator::Run() {
   const double cpuBefore = CpuSeconds();
   Loop();
   Expire(NowNs() + static_cast<std::int64_t>(options_.timeoutMs) * 1000000);
-  const double measured = static_cast<double>(std::min(NowNs(), measureEndNs_) - measureStartNs_) / 1e9;
+  const double measured =
+      static_cast<double>(std::min(NowNs(), measureEndNs_) - measureStartNs_) / 1e9;
   Report(std::max(measured, 1e-9), CpuSeconds() - cpuBefore);
   for (int fd : fds_) close(fd);
   close(epoll_);
@@ -517,22 +530,29 @@ void Generator::Report(double seconds, double cpuSeconds) const {
   const double maximum = static_cast<double>(histogram_.Maximum()) * us;
   const double wall = static_cast<double>(NowNs() - startNs_) / 1e9;
   std::printf(
-      "RESULT sent=%llu responses=%llu lost=%llu errors=%llu malformed=%llu late=%llu not_response=%llu "
-      "wrong_source=%llu send_failures=%llu seconds=%.3f rate=%.0f p50_us=%.1f p99_us=%.1f p999_us=%.1f "
+      "RESULT sent=%llu responses=%llu lost=%llu errors=%llu malformed=%llu late=%llu "
+      "not_response=%llu "
+      "wrong_source=%llu send_failures=%llu seconds=%.3f rate=%.0f p50_us=%.1f p99_us=%.1f "
+      "p999_us=%.1f "
       "max_us=%.1f cpu_pct=%.0f\n",
-      static_cast<unsigned long long>(counters_.sent), static_cast<unsigned long long>(counters_.responses),
-      static_cast<unsigned long long>(counters_.lost), static_cast<unsigned long long>(counters_.errors),
-      static_cast<unsigned long long>(counters_.malformed), static_cast<unsigned long long>(counters_.late),
+      static_cast<unsigned long long>(counters_.sent),
+      static_cast<unsigned long long>(counters_.responses),
+      static_cast<unsigned long long>(counters_.lost),
+      static_cast<unsigned long long>(counters_.errors),
+      static_cast<unsigned long long>(counters_.malformed),
+      static_cast<unsigned long long>(counters_.late),
       static_cast<unsigned long long>(counters_.notResponse),
       static_cast<unsigned long long>(counters_.wrongSource),
-      static_cast<unsigned long long>(counters_.sendFailures), seconds, rate, p50, p99, p999, maximum,
-      100.0 * cpuSeconds / std::max(wall, 1e-9));
+      static_cast<unsigned long long>(counters_.sendFailures), seconds, rate, p50, p99, p999,
+      maximum, 100.0 * cpuSeconds / std::max(wall, 1e-9));
   if (options_.quiet) return;
-  std::printf("%.0f responses/s over %.1f s (%llu sent, %llu lost, %llu errors, %llu malformed); "
-              "latency p50 %.1f us, p99 %.1f us, p99.9 %.1f us\n",
-              rate, seconds, static_cast<unsigned long long>(counters_.sent),
-              static_cast<unsigned long long>(counters_.lost), static_cast<unsigned long long>(counters_.errors),
-              static_cast<unsigned long long>(counters_.malformed), p50, p99, p999);
+  std::printf(
+      "%.0f responses/s over %.1f s (%llu sent, %llu lost, %llu errors, %llu malformed); "
+      "latency p50 %.1f us, p99 %.1f us, p99.9 %.1f us\n",
+      rate, seconds, static_cast<unsigned long long>(counters_.sent),
+      static_cast<unsigned long long>(counters_.lost),
+      static_cast<unsigned long long>(counters_.errors),
+      static_cast<unsigned long long>(counters_.malformed), p50, p99, p999);
 }
 
 const char kUsage[] =
@@ -550,7 +570,8 @@ const char kUsage[] =
     "  --duration S         measured seconds (5, at most 3600)\n"
     "  --rate R             pace to R requests/s instead of a closed loop\n"
     "  --cpu N              pin to CPU N\n"
-    "  --v3-user NAME       SNMPv3 with this USM user (HMAC-SHA-96, AES-128-CFB) instead of v1/v2c\n"
+    "  --v3-user NAME       SNMPv3 with this USM user (HMAC-SHA-96, AES-128-CFB) instead of "
+    "v1/v2c\n"
     "  --v3-auth-pass P     its authentication password\n"
     "  --v3-priv-pass Q     its privacy password\n"
     "  --v3-level L         authPriv, authNoPriv or noAuthNoPriv (authPriv)\n"
@@ -582,9 +603,11 @@ bool ParseLevel(const std::string& text, v3::Level* level) {
 // The passwords a level needs: present and, as agents require, at least eight characters.
 bool CheckV3Passwords(const GeneratorOptions& options) {
   const auto level = static_cast<std::uint8_t>(options.v3Level);
-  if (((level & 1) && options.v3AuthPassword.size() < 8) || ((level & 2) && options.v3PrivPassword.size() < 8)) {
-    std::fprintf(stderr, "loadgen: --v3-level needs --v3-auth-pass (and for authPriv --v3-priv-pass) "
-                         "of at least 8 characters\n");
+  if (((level & 1) && options.v3AuthPassword.size() < 8) ||
+      ((level & 2) && options.v3PrivPassword.size() < 8)) {
+    std::fprintf(stderr,
+                 "loadgen: --v3-level needs --v3-auth-pass (and for authPriv --v3-priv-pass) "
+                 "of at least 8 characters\n");
     return false;
   }
   return true;
@@ -653,7 +676,8 @@ bool ParseArguments(int argc, char** argv, GeneratorOptions* options) {
     }
   }
   if (!tessel::bench::ParseTargets(targets, port, &options->targets)) {
-    std::fprintf(stderr, "loadgen: --targets needs loopback IPv4 addresses (A, A+N, comma lists)\n");
+    std::fprintf(stderr,
+                 "loadgen: --targets needs loopback IPv4 addresses (A, A+N, comma lists)\n");
     return false;
   }
   options->sockets = std::min(options->sockets, options->window);

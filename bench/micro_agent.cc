@@ -32,20 +32,28 @@ void Register(const std::string& label, const std::string& oid, bool isTable,
 
 MicroAgent::MicroAgent() {
   FreeTreeCells();
-  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq, TableProcessWriteReq);
+  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
+                         TableProcessWriteReq);
   InstallHost(&host_);
   Register("system", "1.3.6.1.2.1.1.1", false,
-           {{{"1", "4"}}, {{"2", "6"}}, {{"3", "67"}}, {{"4", "4"}}, {{"5", "4"}}, {{"6", "4"}}, {{"7", "2"}}});
+           {{{"1", "4"}},
+            {{"2", "6"}},
+            {{"3", "67"}},
+            {{"4", "4"}},
+            {{"5", "4"}},
+            {{"6", "4"}},
+            {{"7", "2"}}});
   Register("ifEntry", "1.3.6.1.2.1.2.2.1", true, {{{"1", "2"}}, {{"2", "4"}}, {{"10", "65"}}});
   StoreTreeCellsRefInArray();
   constexpr std::array<std::array<const char*, 2>, 7> kSystem{{{"1", "Tessel router"},
-                                                              {"2", ".1.3.6.1.4.1.99999"},
-                                                              {"3", "12345"},
-                                                              {"4", "ops"},
-                                                              {"5", "r1"},
-                                                              {"6", "lab"},
-                                                              {"7", "72"}}};
-  for (const auto& [column, value] : kSystem) host_.SetValue(std::string("1.3.6.1.2.1.1.") + column + ".0", value);
+                                                               {"2", ".1.3.6.1.4.1.99999"},
+                                                               {"3", "12345"},
+                                                               {"4", "ops"},
+                                                               {"5", "r1"},
+                                                               {"6", "lab"},
+                                                               {"7", "72"}}};
+  for (const auto& [column, value] : kSystem)
+    host_.SetValue(std::string("1.3.6.1.2.1.1.") + column + ".0", value);
   for (int i = 1; i <= 4; ++i) {
     const std::string n = std::to_string(i);
     host_.SetValue("1.3.6.1.2.1.2.2.1.1." + n, n);
@@ -68,10 +76,12 @@ MicroAgent::~MicroAgent() {
   FreeTreeCells();
 }
 
-std::vector<std::uint8_t> EncodeMicroRequest(std::uint8_t pduType, const std::string& oid, int maxRepetitions) {
+std::vector<std::uint8_t> EncodeMicroRequest(std::uint8_t pduType, const std::string& oid,
+                                             int maxRepetitions) {
   std::vector<std::uint32_t> ids;
   RequestTemplate request;
-  if (!ParseOid(oid, &ids) || !EncodeRequestTemplate(1, "public", pduType, ids, 0, maxRepetitions, &request)) {
+  if (!ParseOid(oid, &ids) ||
+      !EncodeRequestTemplate(1, "public", pduType, ids, 0, maxRepetitions, &request)) {
     std::abort();
   }
   PatchRequestId(request.bytes.data(), request, 1u << 24);

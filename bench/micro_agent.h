@@ -27,6 +27,7 @@ class MicroAgent {
 };
 
 // A v2c request datagram with community "public" and request-id 2^24.
-std::vector<std::uint8_t> EncodeMicroRequest(std::uint8_t pduType, const std::string& oid, int maxRepetitions = 0);
+std::vector<std::uint8_t> EncodeMicroRequest(std::uint8_t pduType, const std::string& oid,
+                                             int maxRepetitions = 0);
 
 }  // namespace tessel::bench

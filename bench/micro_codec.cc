@@ -34,7 +34,8 @@ void BM_EncodeGetResponse(benchmark::State& state) {
   std::vector<std::uint8_t> reply(kMaxSnmpMessage);
   for (auto _ : state) {
     std::size_t length = reply.size();
-    if (!CreateSnmpMessage(nullptr, 0, reply.data(), &length, &pdu)) state.SkipWithError("no reply encoded");
+    if (!CreateSnmpMessage(nullptr, 0, reply.data(), &length, &pdu))
+      state.SkipWithError("no reply encoded");
     benchmark::DoNotOptimize(reply.data());
   }
 }

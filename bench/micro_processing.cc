@@ -16,8 +16,8 @@ void RunRequest(benchmark::State& state, const std::vector<std::uint8_t>& reques
   std::size_t replyBytes = 0;
   for (auto _ : state) {
     std::size_t length = reply.size();
-    if (ProcessSnmpMessage(request.data(), request.size(), reply.data(), &length, agent.Session()) !=
-        kMessageReply) {
+    if (ProcessSnmpMessage(request.data(), request.size(), reply.data(), &length,
+                           agent.Session()) != kMessageReply) {
       state.SkipWithError("the agent did not answer");
       break;
     }
@@ -36,7 +36,9 @@ void RunRequest(benchmark::State& state, const std::vector<std::uint8_t>& reques
   state.counters["reply_bytes"] = static_cast<double>(replyBytes);
 }
 
-void BM_ProcessGet(benchmark::State& state) { RunRequest(state, EncodeMicroRequest(kPduGet, "1.3.6.1.2.1.1.5.0")); }
+void BM_ProcessGet(benchmark::State& state) {
+  RunRequest(state, EncodeMicroRequest(kPduGet, "1.3.6.1.2.1.1.5.0"));
+}
 BENCHMARK(BM_ProcessGet);
 
 void BM_ProcessGetNext(benchmark::State& state) {
@@ -45,7 +47,8 @@ void BM_ProcessGetNext(benchmark::State& state) {
 BENCHMARK(BM_ProcessGetNext);
 
 void BM_ProcessGetBulk(benchmark::State& state) {
-  RunRequest(state, EncodeMicroRequest(kPduGetBulk, "1.3.6.1.2.1.2.2", static_cast<int>(state.range(0))));
+  RunRequest(state,
+             EncodeMicroRequest(kPduGetBulk, "1.3.6.1.2.1.2.2", static_cast<int>(state.range(0))));
 }
 BENCHMARK(BM_ProcessGetBulk)->Arg(10)->Arg(50);
 

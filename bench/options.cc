@@ -18,7 +18,8 @@ bool AppendRange(const std::string& item, std::uint16_t port, std::vector<sockad
   const std::size_t plus = item.find('+');
   const std::string address = item.substr(0, plus);
   int count = 1;
-  if (plus != std::string::npos && !ParseInt(item.substr(plus + 1), 1, static_cast<int>(kMaxTargets), &count)) {
+  if (plus != std::string::npos &&
+      !ParseInt(item.substr(plus + 1), 1, static_cast<int>(kMaxTargets), &count)) {
     return false;
   }
   in_addr first{};
@@ -41,7 +42,8 @@ bool AppendRange(const std::string& item, std::uint16_t port, std::vector<sockad
 bool ParseInt(const std::string& text, int low, int high, int* out) {
   int value = 0;
   auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
-  if (error != std::errc() || end != text.data() + text.size() || value < low || value > high) return false;
+  if (error != std::errc() || end != text.data() + text.size() || value < low || value > high)
+    return false;
   *out = value;
   return true;
 }

@@ -12,8 +12,8 @@ using ber::Integer;
 using ber::Reader;
 using ber::Tlv;
 
-bool EncodePduTemplate(std::uint8_t pduType, const std::vector<std::uint32_t>& oid, int nonRepeaters,
-                       int maxRepetitions, RequestTemplate* out) {
+bool EncodePduTemplate(std::uint8_t pduType, const std::vector<std::uint32_t>& oid,
+                       int nonRepeaters, int maxRepetitions, RequestTemplate* out) {
   Bytes name;
   if (!ber::ObjectIdentifier(oid, &name)) return false;
   const Bytes null{0x05, 0x00};
@@ -29,8 +29,8 @@ bool EncodePduTemplate(std::uint8_t pduType, const std::vector<std::uint32_t>& o
 }
 
 bool EncodeRequestTemplate(int version, const std::string& community, std::uint8_t pduType,
-                           const std::vector<std::uint32_t>& oid, int nonRepeaters, int maxRepetitions,
-                           RequestTemplate* out) {
+                           const std::vector<std::uint32_t>& oid, int nonRepeaters,
+                           int maxRepetitions, RequestTemplate* out) {
   RequestTemplate pdu;
   if (!EncodePduTemplate(pduType, oid, nonRepeaters, maxRepetitions, &pdu)) return false;
   const Bytes versionField = Integer(version);
@@ -41,9 +41,11 @@ bool EncodeRequestTemplate(int version, const std::string& community, std::uint8
   return out->bytes.size() <= kMaxRequestSize;
 }
 
-void PatchRequestId(std::uint8_t* message, const RequestTemplate& request, std::uint32_t requestId) {
+void PatchRequestId(std::uint8_t* message, const RequestTemplate& request,
+                    std::uint32_t requestId) {
   for (int i = 0; i < 4; ++i) {
-    message[request.requestIdOffset + static_cast<std::size_t>(i)] = static_cast<std::uint8_t>(requestId >> (24 - 8 * i));
+    message[request.requestIdOffset + static_cast<std::size_t>(i)] =
+        static_cast<std::uint8_t>(requestId >> (24 - 8 * i));
   }
 }
 
@@ -55,7 +57,8 @@ bool DecodePdu(const std::uint8_t* data, std::size_t length, ReplySummary* out) 
   if (!reader.Next(&type, &pdu) || type < 0xA0 || type > 0xA8) return false;
   out->pduType = type;
   if (!pdu.NextInteger(&requestId) || !pdu.NextInteger(&out->errorStatus)) return false;
-  out->requestId = requestId < 0 || requestId > 0xFFFFFFFF ? 0 : static_cast<std::uint32_t>(requestId);
+  out->requestId =
+      requestId < 0 || requestId > 0xFFFFFFFF ? 0 : static_cast<std::uint32_t>(requestId);
   return true;
 }
 

@@ -28,12 +28,12 @@ struct RequestTemplate {
 // request-id are non-repeaters and max-repetitions, otherwise both are zero. False when the OID
 // is not encodable or the message would exceed kMaxRequestSize.
 bool EncodeRequestTemplate(int version, const std::string& community, std::uint8_t pduType,
-                           const std::vector<std::uint32_t>& oid, int nonRepeaters, int maxRepetitions,
-                           RequestTemplate* out);
+                           const std::vector<std::uint32_t>& oid, int nonRepeaters,
+                           int maxRepetitions, RequestTemplate* out);
 
 // The PDU alone, as the scoped PDU of an SNMPv3 message carries it; requestIdOffset is within it.
-bool EncodePduTemplate(std::uint8_t pduType, const std::vector<std::uint32_t>& oid, int nonRepeaters,
-                       int maxRepetitions, RequestTemplate* out);
+bool EncodePduTemplate(std::uint8_t pduType, const std::vector<std::uint32_t>& oid,
+                       int nonRepeaters, int maxRepetitions, RequestTemplate* out);
 
 // requestId must lie in [2^23, 2^31) so that it takes exactly four octets.
 void PatchRequestId(std::uint8_t* message, const RequestTemplate& request, std::uint32_t requestId);

@@ -40,7 +40,8 @@ struct Engine {
 Bytes EncodeDiscovery(std::uint32_t messageId);
 // The msgID and the authoritative engine of an SNMPv3 message (the Report that answers a
 // discovery), without any security check; false when malformed or the engine ID is empty.
-bool DecodeEngine(const std::uint8_t* data, std::size_t length, std::uint32_t* messageId, Engine* engine);
+bool DecodeEngine(const std::uint8_t* data, std::size_t length, std::uint32_t* messageId,
+                  Engine* engine);
 
 // The msgID of an SNMPv3 message, unchecked: which request an answer claims to be for.
 bool DecodeMessageId(const std::uint8_t* data, std::size_t length, std::uint32_t* messageId);
@@ -58,12 +59,13 @@ class Peer {
  public:
   // pdu: EncodePduTemplate's request; engineClockNs: when the engine's boots and time were
   // learnt (the caller's monotonic clock). False when a key or context cannot be set up.
-  bool Init(const User& user, const Engine& engine, const RequestTemplate& pdu, std::int64_t engineClockNs);
+  bool Init(const User& user, const Engine& engine, const RequestTemplate& pdu,
+            std::int64_t engineClockNs);
 
   // The request whose msgID and request-id are requestId, engine time advanced to nowNs, salt
   // as the privacy parameters. Returns its size, or 0 when it does not fit capacity.
-  std::size_t Encode(std::uint32_t requestId, std::int64_t nowNs, std::uint64_t salt, std::uint8_t* out,
-                     std::size_t capacity);
+  std::size_t Encode(std::uint32_t requestId, std::int64_t nowNs, std::uint64_t salt,
+                     std::uint8_t* out, std::size_t capacity);
 
   // An answer: its digest checked, decrypted, decoded up to its error-status. A Report that the
   // agent could not send at the request's level (unauthenticated) is accepted, with the msgID
@@ -77,9 +79,11 @@ class Peer {
     void operator()(EVP_MAC_CTX* context) const { EVP_MAC_CTX_free(context); }
     void operator()(EVP_CIPHER_CTX* context) const { EVP_CIPHER_CTX_free(context); }
   };
-  bool Digest(const std::uint8_t* data, std::size_t length, std::size_t digestOffset, std::uint8_t* digest);
-  bool Crypt(EVP_CIPHER_CTX* context, std::int64_t boots, std::int64_t time, const std::uint8_t* salt,
-             const std::uint8_t* in, std::size_t length, std::uint8_t* out);
+  bool Digest(const std::uint8_t* data, std::size_t length, std::size_t digestOffset,
+              std::uint8_t* digest);
+  bool Crypt(EVP_CIPHER_CTX* context, std::int64_t boots, std::int64_t time,
+             const std::uint8_t* salt, const std::uint8_t* in, std::size_t length,
+             std::uint8_t* out);
 
   User user_;
   Engine engine_;

@@ -91,20 +91,23 @@ std::size_t After(const v3::Bytes& data, const v3::Bytes& pattern) {
 TEST(LoadgenV3, KeysMatchThePublishedShaValues) {
   const v3::Bytes key = v3::PasswordToKey("maplesyrup");
   EXPECT_EQ(key, Hex("9fb5cc0381497b3793528939ff788d5d79145211"));
-  EXPECT_EQ(v3::LocalizeKey(key, Hex("000000000000000000000002")), Hex("6695febc9288e36282235fc7151f128497b38f3f"));
+  EXPECT_EQ(v3::LocalizeKey(key, Hex("000000000000000000000002")),
+            Hex("6695febc9288e36282235fc7151f128497b38f3f"));
 }
 
 class LoadgenV3Message : public ::testing::Test {
  protected:
   void SetUp() override {
     engine_ = {Hex("80001f8880aabbccdd"), 7, 1000};
-    user_ = {"bench", v3::Level::kAuthPriv, v3::PasswordToKey("shapassword"), v3::PasswordToKey("aespassword")};
+    user_ = {"bench", v3::Level::kAuthPriv, v3::PasswordToKey("shapassword"),
+             v3::PasswordToKey("aespassword")};
     ASSERT_TRUE(ParseOid("1.3.6.1.2.1.1.5.0", &oid_));
     ASSERT_TRUE(EncodePduTemplate(kPduGet, oid_, 0, 0, &pdu_));
     ASSERT_TRUE(peer_.Init(user_, engine_, pdu_, 0));
     // 2.5 s after discovery: the engine time sent is 1002.
     message_.resize(kMaxRequestSize);
-    message_.resize(peer_.Encode(0x01234567, 2500000000, 0x1122334455667788, message_.data(), message_.size()));
+    message_.resize(
+        peer_.Encode(0x01234567, 2500000000, 0x1122334455667788, message_.data(), message_.size()));
     ASSERT_GT(message_.size(), 0u);
   }
 
@@ -145,18 +148,21 @@ TEST_F(LoadgenV3Message, DigestAndCipherTextRecomputedWithLibcrypto) {
   const v3::Bytes header = {0x04, 0x05, 'b', 'e', 'n', 'c', 'h', 0x04, 0x0c};
   const std::size_t digestAt = After(message_, header);
   ASSERT_GT(digestAt, 0u);
-  ASSERT_EQ(After(message_, {0x02, 0x01, 0x07, 0x02, 0x02, 0x03, 0xea}), digestAt - header.size());  // boots, time
+  ASSERT_EQ(After(message_, {0x02, 0x01, 0x07, 0x02, 0x02, 0x03, 0xea}),
+            digestAt - header.size());  // boots, time
   v3::Bytes zeroed = message_;
   std::fill_n(zeroed.begin() + static_cast<std::ptrdiff_t>(digestAt), v3::kDigestSize, 0);
   const v3::Bytes authKey = v3::LocalizeKey(user_.authKey, engine_.id);
   std::uint8_t mac[20];
   std::size_t macSize = 0;
-  ASSERT_NE(EVP_Q_mac(nullptr, "HMAC", nullptr, "SHA1", nullptr, authKey.data(), authKey.size(), zeroed.data(),
-                      zeroed.size(), mac, sizeof mac, &macSize),
+  ASSERT_NE(EVP_Q_mac(nullptr, "HMAC", nullptr, "SHA1", nullptr, authKey.data(), authKey.size(),
+                      zeroed.data(), zeroed.size(), mac, sizeof mac, &macSize),
             nullptr);
-  EXPECT_TRUE(std::equal(mac, mac + v3::kDigestSize, message_.begin() + static_cast<std::ptrdiff_t>(digestAt)));
+  EXPECT_TRUE(std::equal(mac, mac + v3::kDigestSize,
+                         message_.begin() + static_cast<std::ptrdiff_t>(digestAt)));
 
-  const std::size_t saltAt = After(message_, {0x04, 0x08, 0x11, 0x22, 0x33, 0x44, 0x55, 0x66, 0x77, 0x88});
+  const std::size_t saltAt =
+      After(message_, {0x04, 0x08, 0x11, 0x22, 0x33, 0x44, 0x55, 0x66, 0x77, 0x88});
   ASSERT_EQ(saltAt, digestAt + v3::kDigestSize + 10);
   ASSERT_EQ(message_[saltAt], 0x04);  // the encrypted scoped PDU, to the end of the message
   const std::size_t cipherAt = saltAt + 2;
@@ -165,18 +171,23 @@ TEST_F(LoadgenV3Message, DigestAndCipherTextRecomputedWithLibcrypto) {
   const v3::Bytes iv = Hex("00000007000003ea1122334455667788");
   v3::Bytes plain(message_.size() - cipherAt);
   int written = 0;
-  std::unique_ptr<EVP_CIPHER_CTX, decltype(&EVP_CIPHER_CTX_free)> context(EVP_CIPHER_CTX_new(), EVP_CIPHER_CTX_free);
-  ASSERT_EQ(EVP_DecryptInit_ex2(context.get(), EVP_aes_128_cfb128(), privKey.data(), iv.data(), nullptr), 1);
+  std::unique_ptr<EVP_CIPHER_CTX, decltype(&EVP_CIPHER_CTX_free)> context(EVP_CIPHER_CTX_new(),
+                                                                          EVP_CIPHER_CTX_free);
+  ASSERT_EQ(
+      EVP_DecryptInit_ex2(context.get(), EVP_aes_128_cfb128(), privKey.data(), iv.data(), nullptr),
+      1);
   ASSERT_EQ(EVP_DecryptUpdate(context.get(), plain.data(), &written, message_.data() + cipherAt,
                               static_cast<int>(plain.size())),
             1);
   // SEQUENCE { contextEngineID, contextName "", GetRequest { request-id 0x01234567, ... } }
   v3::Bytes expected = {0x30, static_cast<std::uint8_t>(plain.size() - 2), 0x04, 0x09};
   expected.insert(expected.end(), engine_.id.begin(), engine_.id.end());
-  expected.insert(expected.end(), {0x04, 0x00, 0xa0, static_cast<std::uint8_t>(pdu_.bytes.size() - 2), 0x02, 0x04,
-                                   0x01, 0x23, 0x45, 0x67});
+  expected.insert(expected.end(),
+                  {0x04, 0x00, 0xa0, static_cast<std::uint8_t>(pdu_.bytes.size() - 2), 0x02, 0x04,
+                   0x01, 0x23, 0x45, 0x67});
   EXPECT_TRUE(std::equal(expected.begin(), expected.end(), plain.begin()));
-  EXPECT_TRUE(std::equal(pdu_.bytes.begin() + 8, pdu_.bytes.end(), plain.end() - (pdu_.bytes.size() - 8)));
+  EXPECT_TRUE(
+      std::equal(pdu_.bytes.begin() + 8, pdu_.bytes.end(), plain.end() - (pdu_.bytes.size() - 8)));
 }
 
 TEST(LatencyHistogram, PercentilesWithinOneBucket) {

@@ -1,14 +1,14 @@
 // Feeds arbitrary octets to every BER parse primitive and the variable-binding parser, and
 // checks that each binding that decodes is rebuilt into octets that decode to the same name
 // and value.
+#include "snmp/ber.h"
+
 #include <algorithm>
 #include <climits>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <vector>
-
-#include "snmp/ber.h"
 
 namespace tessel {
 namespace {
@@ -67,7 +67,8 @@ bool ParseBinding(const std::uint8_t** cursor, std::int32_t* remaining, Decoded*
 void CheckRoundTrip(const Decoded& decoded) {
   std::uint8_t buffer[1024];
   std::int32_t remaining = sizeof buffer;
-  std::uint8_t* end = BuildVarOp(buffer, decoded.name.data(), decoded.name.size(), decoded.value, &remaining);
+  std::uint8_t* end =
+      BuildVarOp(buffer, decoded.name.data(), decoded.name.size(), decoded.value, &remaining);
   if (end == nullptr) return;  // types the builder refuses (unknown, invalid bit strings)
   if (end - buffer + remaining != static_cast<std::int32_t>(sizeof buffer)) abort();
   const std::uint8_t* cursor = buffer;

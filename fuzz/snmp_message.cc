@@ -29,10 +29,13 @@ void RegisterCell(const char* label, const char* oid, bool isTable, std::vector<
 
 AgentSession* SetUpAgent() {
   static MemoryHost host;
-  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq, TableProcessWriteReq);
+  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
+                         TableProcessWriteReq);
   InstallHost(&host);
-  RegisterCell("system", "1.3.6.1.2.1.1.1", false, {"1", "2", "3", "5"}, {"4", "6", "67", "4"}, "43706");
-  RegisterCell("ifEntry", "1.3.6.1.2.1.2.2.1", true, {"1", "2", "6", "10"}, {"2", "4", "64", "70"}, "43706");
+  RegisterCell("system", "1.3.6.1.2.1.1.1", false, {"1", "2", "3", "5"}, {"4", "6", "67", "4"},
+               "43706");
+  RegisterCell("ifEntry", "1.3.6.1.2.1.2.2.1", true, {"1", "2", "6", "10"}, {"2", "4", "64", "70"},
+               "43706");
   StoreTreeCellsRefInArray();
   host.SetValue("1.3.6.1.2.1.1.1.0", "fuzz");
   host.SetValue("1.3.6.1.2.1.1.2.0", ".1.3.6.1.4.1.1");
@@ -64,7 +67,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   if (result == kMessageReply) {
     if (replyLength == 0 || replyLength > reply.size()) std::abort();
     SnmpPdu parsed;
-    if (ParseSnmpMessage(reply.data(), replyLength, &parsed) != 1) std::abort();  // replies must parse
+    if (ParseSnmpMessage(reply.data(), replyLength, &parsed) != 1)
+      std::abort();  // replies must parse
   }
   return 0;
 }

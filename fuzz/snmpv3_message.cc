@@ -18,7 +18,8 @@ using namespace tessel;
 
 AgentSession* SetUpAgent() {
   static MemoryHost host;
-  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq, TableProcessWriteReq);
+  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
+                         TableProcessWriteReq);
   InstallHost(&host);
   TreeCellRegistration system;
   system.label = "system";

@@ -23,7 +23,9 @@ std::uint32_t UptimeSince(std::uint32_t startSeconds, bool hundredths) {
   return hundredths ? seconds * 100u : seconds;
 }
 
-std::uint32_t GetUptime(bool hundredths) { return UptimeSince(clockBaseSeconds.load(), hundredths); }
+std::uint32_t GetUptime(bool hundredths) {
+  return UptimeSince(clockBaseSeconds.load(), hundredths);
+}
 
 void SleepMicroseconds(std::uint64_t microseconds) {
   std::uint64_t milliseconds = microseconds / 1000;

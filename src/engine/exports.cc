@@ -338,51 +338,57 @@ JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_utils_DebugScheduler_
 
 // ---- com.kestrelon.simulator.tessel.snmp.SerToCConverter ----
 
-JNIEXPORT jint JNICALL Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddUsmUserEntry(
-    JNIEnv* env, jobject, jstring userName, jstring authProtocol, jstring authPassword, jstring privProtocol,
-    jstring privPassword, jint discoveryTimeFlag) {
+JNIEXPORT jint JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddUsmUserEntry(
+    JNIEnv* env, jobject, jstring userName, jstring authProtocol, jstring authPassword,
+    jstring privProtocol, jstring privPassword, jint discoveryTimeFlag) {
   return Guarded<jint>(99, [&] {
     return AddUsmUserFromHost(Text(env, userName), Text(env, authProtocol), Text(env, authPassword),
                               Text(env, privProtocol), Text(env, privPassword), discoveryTimeFlag);
   });
 }
 
-JNIEXPORT jint JNICALL Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddContextEntry(
+JNIEXPORT jint JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddContextEntry(
     JNIEnv* env, jobject, jstring contextName) {
-  return Guarded<jint>(99, [&] { return CreateAndAddSnmpVacmContextTableEntry(Text(env, contextName)); });
+  return Guarded<jint>(
+      99, [&] { return CreateAndAddSnmpVacmContextTableEntry(Text(env, contextName)); });
 }
 
-JNIEXPORT jint JNICALL Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddSecurityToGroupEntry(
-    JNIEnv* env, jobject, jint securityModel, jstring securityName, jstring groupName, jint /*ignored*/,
-    jint storageType) {
+JNIEXPORT jint JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddSecurityToGroupEntry(
+    JNIEnv* env, jobject, jint securityModel, jstring securityName, jstring groupName,
+    jint /*ignored*/, jint storageType) {
   return Guarded<jint>(99, [&] {
     return CreateAndAddSnmpVacmSecurityToGroupTableEntry(securityModel, Text(env, securityName),
-                                                          Text(env, groupName), storageType);
+                                                         Text(env, groupName), storageType);
   });
 }
 
-JNIEXPORT jint JNICALL Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddAccessEntry(
-    JNIEnv* env, jobject, jstring groupName, jstring contextPrefix, jint securityModel, jint securityLevel,
-    jint contextMatch, jstring readView, jstring writeView, jstring notifyView, jint storageType,
-    jint /*ignored*/) {
+JNIEXPORT jint JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddAccessEntry(
+    JNIEnv* env, jobject, jstring groupName, jstring contextPrefix, jint securityModel,
+    jint securityLevel, jint contextMatch, jstring readView, jstring writeView, jstring notifyView,
+    jint storageType, jint /*ignored*/) {
   return Guarded<jint>(99, [&] {
-    return CreateAndAddNewSnmpVacmAccessTableEntry(Text(env, groupName), Text(env, contextPrefix), securityModel,
-                                                   securityLevel, contextMatch, Text(env, readView),
-                                                   Text(env, writeView), Text(env, notifyView), storageType);
+    return CreateAndAddNewSnmpVacmAccessTableEntry(
+        Text(env, groupName), Text(env, contextPrefix), securityModel, securityLevel, contextMatch,
+        Text(env, readView), Text(env, writeView), Text(env, notifyView), storageType);
   });
 }
 
-JNIEXPORT jint JNICALL Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddViewTreeEntry(
-    JNIEnv* env, jobject, jstring viewName, jstring subtree, jstring mask, jint type, jint storageType,
-    jint /*ignored*/) {
+JNIEXPORT jint JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddViewTreeEntry(
+    JNIEnv* env, jobject, jstring viewName, jstring subtree, jstring mask, jint type,
+    jint storageType, jint /*ignored*/) {
   return Guarded<jint>(99, [&] {
-    return CreateAndAddSnmpVacmViewTreeFamilyTableEntry(Text(env, viewName), Text(env, subtree), Text(env, mask),
-                                                        type, storageType);
+    return CreateAndAddSnmpVacmViewTreeFamilyTableEntry(Text(env, viewName), Text(env, subtree),
+                                                        Text(env, mask), type, storageType);
   });
 }
 
-JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeCreateLCDVectors(JNIEnv*,
-                                                                                                      jobject) {
+JNIEXPORT void JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeCreateLCDVectors(JNIEnv*, jobject) {
   GuardedVoid([] {
     CreateLCDVacmAccessTable();
     CreateLCDVacmViewTreeFamilyTable();

@@ -14,18 +14,18 @@ namespace tessel {
 // The arguments of one value call. Which fields a method passes is fixed per method (see each
 // method); texts that the host may receive as null are optional.
 struct HostValueQuery {
-  std::string label;                  // the tree cell's label
-  std::string objectOid;              // scalar: the group OID; table: the entry OID (.1.3...)
-  std::string subId;                  // scalar: the sub-identifier; table: the column, decimal
+  std::string label;                    // the tree cell's label
+  std::string objectOid;                // scalar: the group OID; table: the entry OID (.1.3...)
+  std::string subId;                    // scalar: the sub-identifier; table: the column, decimal
   std::optional<std::string> instance;  // scalar: ".0"; table: ".5", or null for a first GetNext
-  std::string previousSubId;          // scalar GetNext: the registered sub-identifier below
-  std::int32_t column = 0;            // table GetNext: the column and the one after it
+  std::string previousSubId;            // scalar GetNext: the registered sub-identifier below
+  std::int32_t column = 0;              // table GetNext: the column and the one after it
   std::int32_t nextColumn = -1;
-  std::int32_t dataType = 0;          // the column's BER identifier
+  std::int32_t dataType = 0;  // the column's BER identifier
   std::int32_t nextDataType = 0;
   std::string databaseName;
   std::string tableName;
-  std::string valueText;              // Set: the value rendered as text
+  std::string valueText;  // Set: the value rendered as text
   std::int32_t agentId = 0;
   std::int32_t rowStatusColumn = 0;
   std::string agentAddress;

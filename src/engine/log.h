@@ -45,8 +45,8 @@ void SetConsoleMode(bool consoleMode);
 
 }  // namespace tessel
 
-#define TESSEL_LOG(messageClass, ...)                       \
-  do {                                                      \
+#define TESSEL_LOG(messageClass, ...)                                        \
+  do {                                                                       \
     if (::tessel::LogEnabled(messageClass)) ::tessel::LogWrite(__VA_ARGS__); \
   } while (0)
 #define LOG_TRACE(...) TESSEL_LOG(::tessel::kLogTrace, __VA_ARGS__)

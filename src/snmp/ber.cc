@@ -28,7 +28,8 @@ struct Tlv {
   std::size_t total = 0;   // identifier, length and contents octets
 };
 
-bool ReadTlv(const std::uint8_t* data, const std::int32_t* remaining, std::uint8_t* type, Tlv* tlv) {
+bool ReadTlv(const std::uint8_t* data, const std::int32_t* remaining, std::uint8_t* type,
+             Tlv* tlv) {
   if (remaining == nullptr) return false;
   std::int32_t contentsLength = *remaining;
   tlv->contents = AsnParseHeader(data, &contentsLength, type);
@@ -64,7 +65,8 @@ bool CopyContents(const std::uint8_t* data, const std::int32_t* remaining, std::
 // Shifts big-endian contents into 64 bits, starting from all ones when `signExtend` and the
 // first octet is negative. The caller has bounded the length to fit.
 std::uint64_t ShiftIn(const std::uint8_t* contents, std::size_t length, bool signExtend) {
-  std::uint64_t value = (signExtend && length > 0 && (contents[0] & 0x80) != 0) ? ~std::uint64_t{0} : 0;
+  std::uint64_t value =
+      (signExtend && length > 0 && (contents[0] & 0x80) != 0) ? ~std::uint64_t{0} : 0;
   for (std::size_t i = 0; i < length; ++i) value = (value << 8) | contents[i];
   return value;
 }
@@ -77,8 +79,8 @@ bool UnsignedFits(const std::uint8_t* contents, std::size_t length, std::size_t 
 // A 32-bit INTEGER-like TLV as two's-complement bits. An unsigned value may carry a leading
 // 0x00 as a fifth octet; shorter contents with the top bit set are sign-extended, as peers that
 // send them intend.
-const std::uint8_t* ParseInteger(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                 bool isUnsigned, std::uint32_t* bits) {
+const std::uint8_t* ParseInteger(const std::uint8_t* data, std::int32_t* remaining,
+                                 std::uint8_t* type, bool isUnsigned, std::uint32_t* bits) {
   Tlv tlv;
   if (!ReadTlv(data, remaining, type, &tlv)) {
     LOG_ERROR("bad length\n");
@@ -167,7 +169,8 @@ std::uint8_t* BuildValue(std::uint8_t* data, std::int32_t* remaining, const VarV
     case kAsnGauge:
     case kAsnTimeTicks:
     case kAsnUInteger32:
-      return AsnBuildUnsignedInt(data, remaining, value.type, static_cast<std::uint32_t>(value.number));
+      return AsnBuildUnsignedInt(data, remaining, value.type,
+                                 static_cast<std::uint32_t>(value.number));
     case kAsnCounter64:
       return AsnBuildUnsignedInt64(data, remaining, value.type, value.number);
     case kAsnOctetString:
@@ -192,7 +195,8 @@ std::uint8_t* BuildValue(std::uint8_t* data, std::int32_t* remaining, const VarV
 
 }  // namespace
 
-const std::uint8_t* AsnParseLength(const std::uint8_t* data, std::int32_t available, std::uint32_t* length) {
+const std::uint8_t* AsnParseLength(const std::uint8_t* data, std::int32_t available,
+                                   std::uint32_t* length) {
   if (data == nullptr || available < 1) return nullptr;
   if ((data[0] & 0x80) == 0) {
     *length = data[0];
@@ -217,7 +221,8 @@ const std::uint8_t* AsnParseLength(const std::uint8_t* data, std::int32_t availa
   return data + 1 + octets;
 }
 
-const std::uint8_t* AsnParseHeader(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type) {
+const std::uint8_t* AsnParseHeader(const std::uint8_t* data, std::int32_t* remaining,
+                                   std::uint8_t* type) {
   if (data == nullptr || remaining == nullptr || *remaining < 2) return nullptr;
   if ((data[0] & 0x1F) == 0x1F) {
     LOG_ERROR("can't process ID >= 30\n");
@@ -235,8 +240,8 @@ const std::uint8_t* AsnParseHeader(const std::uint8_t* data, std::int32_t* remai
   return contents;
 }
 
-const std::uint8_t* AsnParseInt(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                std::int32_t* value) {
+const std::uint8_t* AsnParseInt(const std::uint8_t* data, std::int32_t* remaining,
+                                std::uint8_t* type, std::int32_t* value) {
   std::uint32_t bits = 0;
   const std::uint8_t* behind = ParseInteger(data, remaining, type, false, &bits);
   if (behind != nullptr) *value = static_cast<std::int32_t>(bits);
@@ -248,15 +253,16 @@ const std::uint8_t* AsnParseUnsignedInt(const std::uint8_t* data, std::int32_t* 
   return ParseInteger(data, remaining, type, true, value);
 }
 
-const std::uint8_t* AsnParseString(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                   std::uint8_t* buffer, std::size_t* length) {
+const std::uint8_t* AsnParseString(const std::uint8_t* data, std::int32_t* remaining,
+                                   std::uint8_t* type, std::uint8_t* buffer, std::size_t* length) {
   Tlv tlv;
   if (!CopyContents(data, remaining, type, buffer, length, "strings", &tlv)) return nullptr;
   return Behind(data, remaining, tlv);
 }
 
 const std::uint8_t* AsnParseBitString(const std::uint8_t* data, std::int32_t* remaining,
-                                      std::uint8_t* type, std::uint8_t* buffer, std::size_t* length) {
+                                      std::uint8_t* type, std::uint8_t* buffer,
+                                      std::size_t* length) {
   Tlv tlv;
   if (!CopyContents(data, remaining, type, buffer, length, "bitstrings", &tlv)) return nullptr;
   if (tlv.length == 0 || buffer[0] >= 8) {
@@ -266,8 +272,8 @@ const std::uint8_t* AsnParseBitString(const std::uint8_t* data, std::int32_t* re
   return Behind(data, remaining, tlv);
 }
 
-const std::uint8_t* AsnParseObjid(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                  std::uint32_t* ids, std::size_t* count) {
+const std::uint8_t* AsnParseObjid(const std::uint8_t* data, std::int32_t* remaining,
+                                  std::uint8_t* type, std::uint32_t* ids, std::size_t* count) {
   Tlv tlv;
   if (!ReadTlv(data, remaining, type, &tlv)) return nullptr;
   if (!DecodeSubIds(tlv.contents, tlv.length, ids, *count, count)) {
@@ -277,7 +283,8 @@ const std::uint8_t* AsnParseObjid(const std::uint8_t* data, std::int32_t* remain
   return Behind(data, remaining, tlv);
 }
 
-const std::uint8_t* AsnParseNull(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type) {
+const std::uint8_t* AsnParseNull(const std::uint8_t* data, std::int32_t* remaining,
+                                 std::uint8_t* type) {
   Tlv tlv;
   if (!ReadTlv(data, remaining, type, &tlv)) return nullptr;
   if (tlv.length != 0) {
@@ -287,9 +294,10 @@ const std::uint8_t* AsnParseNull(const std::uint8_t* data, std::int32_t* remaini
   return Behind(data, remaining, tlv);
 }
 
-const std::uint8_t* ParseVarOp(const std::uint8_t* data, std::uint32_t* name, std::size_t* nameLength,
-                               std::uint8_t* valueType, std::size_t* valueLength,
-                               const std::uint8_t** value, std::int32_t* remaining) {
+const std::uint8_t* ParseVarOp(const std::uint8_t* data, std::uint32_t* name,
+                               std::size_t* nameLength, std::uint8_t* valueType,
+                               std::size_t* valueLength, const std::uint8_t** value,
+                               std::int32_t* remaining) {
   std::uint8_t type = 0;
   Tlv binding;
   if (!ReadTlv(data, remaining, &type, &binding)) {
@@ -321,7 +329,8 @@ bool DecodeAsnSyntaxValue(std::uint8_t type, const std::uint8_t* contents, std::
     case kAsnInteger:
       // Longer contents cannot be a 32-bit INTEGER; the message is taken as malformed.
       if (length > 4) return false;
-      *out = VarValue::Integer(static_cast<std::int32_t>(static_cast<std::uint32_t>(ShiftIn(contents, length, true))));
+      *out = VarValue::Integer(
+          static_cast<std::int32_t>(static_cast<std::uint32_t>(ShiftIn(contents, length, true))));
       return true;
     case kAsnCounter:
     case kAsnGauge:
@@ -393,9 +402,10 @@ std::uint8_t* AsnBuildSequence(std::uint8_t* data, std::int32_t* remaining, std:
   return data + 4;
 }
 
-std::uint8_t* AsnBuildInt(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type, std::int32_t value) {
-  return BuildInteger(data, remaining, type, static_cast<std::uint64_t>(static_cast<std::int64_t>(value)),
-                      value < 0);
+std::uint8_t* AsnBuildInt(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type,
+                          std::int32_t value) {
+  return BuildInteger(data, remaining, type,
+                      static_cast<std::uint64_t>(static_cast<std::int64_t>(value)), value < 0);
 }
 
 std::uint8_t* AsnBuildUnsignedInt(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type,

@@ -14,30 +14,35 @@ namespace tessel {
 // Parsing. `remaining` counts the octets available from the cursor.
 // Reads identifier and length; returns the cursor at the contents and sets *remaining to the
 // contents length.
-const std::uint8_t* AsnParseHeader(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type);
+const std::uint8_t* AsnParseHeader(const std::uint8_t* data, std::int32_t* remaining,
+                                   std::uint8_t* type);
 // Reads a definite length (at most four length octets) from at most `available` octets.
-const std::uint8_t* AsnParseLength(const std::uint8_t* data, std::int32_t available, std::uint32_t* length);
-const std::uint8_t* AsnParseInt(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                std::int32_t* value);
+const std::uint8_t* AsnParseLength(const std::uint8_t* data, std::int32_t available,
+                                   std::uint32_t* length);
+const std::uint8_t* AsnParseInt(const std::uint8_t* data, std::int32_t* remaining,
+                                std::uint8_t* type, std::int32_t* value);
 const std::uint8_t* AsnParseUnsignedInt(const std::uint8_t* data, std::int32_t* remaining,
                                         std::uint8_t* type, std::uint32_t* value);
 // Copies the contents into buffer; *length is its capacity in and the contents length out.
-const std::uint8_t* AsnParseString(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                   std::uint8_t* buffer, std::size_t* length);
+const std::uint8_t* AsnParseString(const std::uint8_t* data, std::int32_t* remaining,
+                                   std::uint8_t* type, std::uint8_t* buffer, std::size_t* length);
 const std::uint8_t* AsnParseBitString(const std::uint8_t* data, std::int32_t* remaining,
-                                      std::uint8_t* type, std::uint8_t* buffer, std::size_t* length);
+                                      std::uint8_t* type, std::uint8_t* buffer,
+                                      std::size_t* length);
 // Reads an OBJECT IDENTIFIER; *count is the capacity of ids in (at most kMaxOidLength is ever
 // accepted) and the number of sub-identifiers out. More than the capacity, or a sub-identifier
 // above 2^32 - 1, is malformed.
-const std::uint8_t* AsnParseObjid(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type,
-                                  std::uint32_t* ids, std::size_t* count);
-const std::uint8_t* AsnParseNull(const std::uint8_t* data, std::int32_t* remaining, std::uint8_t* type);
+const std::uint8_t* AsnParseObjid(const std::uint8_t* data, std::int32_t* remaining,
+                                  std::uint8_t* type, std::uint32_t* ids, std::size_t* count);
+const std::uint8_t* AsnParseNull(const std::uint8_t* data, std::int32_t* remaining,
+                                 std::uint8_t* type);
 // One variable binding: the name into name/nameLength (capacity in), the value's type, its
 // contents length and a cursor at the value's identifier octet. Reduces *remaining by the whole
 // binding and returns the cursor behind it.
-const std::uint8_t* ParseVarOp(const std::uint8_t* data, std::uint32_t* name, std::size_t* nameLength,
-                               std::uint8_t* valueType, std::size_t* valueLength,
-                               const std::uint8_t** value, std::int32_t* remaining);
+const std::uint8_t* ParseVarOp(const std::uint8_t* data, std::uint32_t* name,
+                               std::size_t* nameLength, std::uint8_t* valueType,
+                               std::size_t* valueLength, const std::uint8_t** value,
+                               std::int32_t* remaining);
 // Decodes value contents (behind identifier and length) of the given type into *out. False when
 // the contents are malformed for the type (an OBJECT IDENTIFIER that ends inside a
 // sub-identifier, has more than kMaxOidLength sub-identifiers or one above 2^32 - 1).
@@ -52,7 +57,8 @@ std::uint8_t* AsnBuildLength(std::uint8_t* data, std::int32_t* remaining, std::s
 // contents are built can be filled in afterwards.
 std::uint8_t* AsnBuildSequence(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type,
                                std::size_t length);
-std::uint8_t* AsnBuildInt(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type, std::int32_t value);
+std::uint8_t* AsnBuildInt(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type,
+                          std::int32_t value);
 std::uint8_t* AsnBuildUnsignedInt(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type,
                                   std::uint32_t value);
 std::uint8_t* AsnBuildUnsignedInt64(std::uint8_t* data, std::int32_t* remaining, std::uint8_t type,

@@ -180,7 +180,8 @@ class DateAndTimeScanner {
   }
   // Optional blanks, optional sign, decimal digits that fit in an int.
   bool Number(std::int64_t* out) {
-    while (!rest_.empty() && (rest_.front() == ' ' || rest_.front() == '\t')) rest_.remove_prefix(1);
+    while (!rest_.empty() && (rest_.front() == ' ' || rest_.front() == '\t'))
+      rest_.remove_prefix(1);
     bool negative = !rest_.empty() && rest_.front() == '-';
     if (!rest_.empty() && (rest_.front() == '-' || rest_.front() == '+')) rest_.remove_prefix(1);
     std::size_t digits = 0;
@@ -202,7 +203,9 @@ std::optional<VarValue> ParseDateAndTime(const std::string& text) {
   char direction = 0;
   int fields = DateAndTimeScanner(text).Scan(&numbers, &direction);
   if (fields != 7 && fields != 10) return std::nullopt;
-  auto octet = [](std::int64_t value) { return static_cast<char>(static_cast<std::uint64_t>(value) & 0xFF); };
+  auto octet = [](std::int64_t value) {
+    return static_cast<char>(static_cast<std::uint64_t>(value) & 0xFF);
+  };
   std::string octets{octet(numbers[0] >> 8), octet(numbers[0])};
   for (std::size_t i = 1; i < 7; ++i) octets.push_back(octet(numbers[i]));
   if (fields == 10) octets += {direction, octet(numbers[7]), octet(numbers[8])};
@@ -279,20 +282,22 @@ HostValueQuery BaseQuery(const TesselStruct& target, std::uint32_t subId, CallKi
   if (target.agent != nullptr) {
     const AgentSession& agent = *target.agent;
     query.agentAddress = agent.transport.localAddress;
-    query.agentPort = static_cast<std::int32_t>(agent.transport.localPort) + (kind == CallKind::kRead ? 1 : 0);
+    query.agentPort =
+        static_cast<std::int32_t>(agent.transport.localPort) + (kind == CallKind::kRead ? 1 : 0);
     if (agent.agentInfo) {
       query.databaseName = agent.agentInfo->databaseName;
       query.tableName = agent.agentInfo->tableName;
       query.agentId = agent.agentInfo->agentId;
     }
   }
-  LOG_TRACE("agent %d (%s#%d) db %s table %s\n", query.agentId, query.agentAddress.c_str(), query.agentPort,
-            query.databaseName.c_str(), query.tableName.c_str());
+  LOG_TRACE("agent %d (%s#%d) db %s table %s\n", query.agentId, query.agentAddress.c_str(),
+            query.agentPort, query.databaseName.c_str(), query.tableName.c_str());
   return query;
 }
 
 // A scalar OID is group . sub-identifier . instance; the host always gets the instance ".0".
-std::optional<HostValueQuery> ScalarQuery(const Oid& oid, const TesselStruct& target, CallKind kind) {
+std::optional<HostValueQuery> ScalarQuery(const Oid& oid, const TesselStruct& target,
+                                          CallKind kind) {
   if (target.cell == nullptr || oid.size() < 3) {
     LOG_ERROR("Converting OID to String failed \n");
     return std::nullopt;
@@ -305,7 +310,8 @@ std::optional<HostValueQuery> ScalarQuery(const Oid& oid, const TesselStruct& ta
 
 // A table OID is table . 1 . column . instance; the host gets the entry OID (table . 1), the
 // column, and the instance with a dot before each sub-identifier (null when there is none).
-std::optional<HostValueQuery> TableQuery(const Oid& oid, const TesselStruct& target, CallKind kind) {
+std::optional<HostValueQuery> TableQuery(const Oid& oid, const TesselStruct& target,
+                                         CallKind kind) {
   std::size_t tableLength = target.cell == nullptr ? 0 : target.cell->oid.size();
   if (target.cell == nullptr || oid.size() < tableLength + 2) {
     LOG_ERROR("Forming Oid  failed \n");
@@ -324,14 +330,16 @@ std::optional<HostValueQuery> TableQuery(const Oid& oid, const TesselStruct& tar
 // The value of a host's answer text; *errorCode is 0 with a value, genErr when the text does
 // not convert, and left as the adapter set it when there was no text.
 std::optional<VarValue> ConvertAnswer(const std::optional<std::string>& text, std::uint8_t dataType,
-                                      const std::optional<std::string>& syntax, std::uint8_t* errorCode) {
+                                      const std::optional<std::string>& syntax,
+                                      std::uint8_t* errorCode) {
   if (!text) {
     LOG_TRACE("NULL returned\n");
     return std::nullopt;
   }
   std::optional<VarValue> value = TextToVarValue(dataType, syntax.value_or(""), *text);
   if (!value) {
-    LOG_ERROR("unable to convert to varVal from String \noidValString =%s\ntype = %d \n", text->c_str(), dataType);
+    LOG_ERROR("unable to convert to varVal from String \noidValString =%s\ntype = %d \n",
+              text->c_str(), dataType);
     *errorCode = kGenErr;
     return std::nullopt;
   }
@@ -345,7 +353,8 @@ std::optional<std::string> SetValueText(const HostValueQuery& query, const VarVa
   auto dataType = static_cast<std::uint8_t>(query.dataType);
   std::string syntax = query.syntax.value_or("");
   bool dateAndTime = IsDateAndTime(dataType, syntax);
-  ValueForm columnForm = dateAndTime || syntax == kMacAddressSyntax ? ValueForm::kOctets : FormOf(dataType);
+  ValueForm columnForm =
+      dateAndTime || syntax == kMacAddressSyntax ? ValueForm::kOctets : FormOf(dataType);
   if (columnForm != ValueForm::kNone && FormOf(value.type) != columnForm) {
     LOG_ERROR("Set value of type %d does not fit column type %d\n", value.type, dataType);
     *errorCode = kWrongType;
@@ -357,7 +366,8 @@ std::optional<std::string> SetValueText(const HostValueQuery& query, const VarVa
     if (!text) *errorCode = kBadValue;
     return text;
   }
-  text = syntax == kMacAddressSyntax ? MacAddressToText(value.octets) : VarValueToText(dataType, value);
+  text = syntax == kMacAddressSyntax ? MacAddressToText(value.octets)
+                                     : VarValueToText(dataType, value);
   if (!text) {
     LOG_ERROR("In set varVal err in ToString ..\n");
     *errorCode = kGenErr;
@@ -405,20 +415,23 @@ void NextColumn(const TreeCell& cell, std::uint32_t column, HostValueQuery* quer
 // OID: a host that answered the same or an earlier object would make a walk endless.
 std::optional<Oid> AnsweredOid(const std::string& entryOid, std::string_view columnAndInstance,
                                const Oid& requested) {
-  if (!columnAndInstance.empty() && columnAndInstance.front() == '.') columnAndInstance.remove_prefix(1);
+  if (!columnAndInstance.empty() && columnAndInstance.front() == '.')
+    columnAndInstance.remove_prefix(1);
   std::string text = entryOid + "." + std::string(columnAndInstance);
   LOG_TRACE("columnAndnextInstance ::::::: %s\n", std::string(columnAndInstance).c_str());
   LOG_TRACE("parentOidAsString :::: %s\n", entryOid.c_str());
   Oid answered;
   if (ParseDottedText(&answered, text, false) <= 0 || answered.size() > kMaxOidLength ||
       CompareOid(answered, requested) <= 0) {
-    LOG_ERROR("The host answered the unusable OID %s after %s\n", text.c_str(), OidToText(requested).c_str());
+    LOG_ERROR("The host answered the unusable OID %s after %s\n", text.c_str(),
+              OidToText(requested).c_str());
     return std::nullopt;
   }
   return answered;
 }
 
-std::optional<VarValue> TableProcessGetMsg(const Oid& oid, std::uint8_t* errorCode, const TesselStruct& target) {
+std::optional<VarValue> TableProcessGetMsg(const Oid& oid, std::uint8_t* errorCode,
+                                           const TesselStruct& target) {
   std::optional<HostValueQuery> query = TableQuery(oid, target, CallKind::kRead);
   if (!query) {
     LOG_ERROR("Forming Oid  failed  in TableProcessGetMsg \n");
@@ -429,7 +442,8 @@ std::optional<VarValue> TableProcessGetMsg(const Oid& oid, std::uint8_t* errorCo
   return ConvertAnswer(text, static_cast<std::uint8_t>(query->dataType), query->syntax, errorCode);
 }
 
-std::optional<VarValue> TableProcessGetNextMsg(Oid* oid, std::uint8_t* errorCode, const TesselStruct& target) {
+std::optional<VarValue> TableProcessGetNextMsg(Oid* oid, std::uint8_t* errorCode,
+                                               const TesselStruct& target) {
   std::optional<HostValueQuery> query = TableQuery(*oid, target, CallKind::kRead);
   if (!query) {
     LOG_ERROR("Forming Oid  failed  in TableProcessGetNextMsg \n");
@@ -438,7 +452,8 @@ std::optional<VarValue> TableProcessGetNextMsg(Oid* oid, std::uint8_t* errorCode
   }
   NextColumn(*target.cell, static_cast<std::uint32_t>(query->column), &*query);
   std::string columnAndInstance;
-  std::optional<std::string> text = AdapterTableGetNextOidVal(*query, &columnAndInstance, errorCode);
+  std::optional<std::string> text =
+      AdapterTableGetNextOidVal(*query, &columnAndInstance, errorCode);
   std::optional<Oid> answered;
   if (text) answered = AnsweredOid(query->objectOid, columnAndInstance, *oid);
   if (!answered) {
@@ -458,7 +473,8 @@ std::optional<VarValue> TableProcessGetNextMsg(Oid* oid, std::uint8_t* errorCode
 // ---------------------------------------------------------------------------------------------
 // Conversions.
 
-std::optional<VarValue> TextToVarValue(std::uint8_t dataType, const std::string& syntax, const std::string& text) {
+std::optional<VarValue> TextToVarValue(std::uint8_t dataType, const std::string& syntax,
+                                       const std::string& text) {
   if (IsDateAndTime(dataType, syntax)) return ParseDateAndTime(text);
   switch (dataType) {
     case kAsnInteger:
@@ -485,7 +501,8 @@ std::optional<VarValue> TextToVarValue(std::uint8_t dataType, const std::string&
     case kAsnIpAddress:
       return ParseIpAddress(text);
     case kAsnCounter64: {
-      std::optional<std::uint64_t> number = ParseUnsigned(text, std::numeric_limits<std::uint64_t>::max());
+      std::optional<std::uint64_t> number =
+          ParseUnsigned(text, std::numeric_limits<std::uint64_t>::max());
       if (!number) return std::nullopt;
       return VarValue::Unsigned(kAsnCounter64, *number);
     }
@@ -528,41 +545,47 @@ std::optional<std::string> DateAndTimeToText(const std::string& octets) {
     LOG_ERROR("Length is not proper\n");
     return std::nullopt;
   }
-  auto at = [&octets](std::size_t i) { return static_cast<unsigned>(static_cast<unsigned char>(octets[i])); };
+  auto at = [&octets](std::size_t i) {
+    return static_cast<unsigned>(static_cast<unsigned char>(octets[i]));
+  };
   struct Check {
     std::size_t index;
     unsigned low;
     unsigned high;
     const char* message;
   };
-  static constexpr Check kChecks[] = {
-      {2, 1, 12, "Month value is not proper\n"},        {3, 1, 31, "Day value is not proper\n"},
-      {4, 0, 23, "Hour value is not proper\n"},         {5, 0, 59, "Minute value is not proper\n"},
-      {6, 0, 60, "Second value is not proper\n "},      {7, 0, 9, "Decisecond  value is not proper\n "},
-      {9, 0, 11, " UTC hour value is not proper\n "},   {10, 0, 59, " UTC minute value is not proper\n"}};
+  static constexpr Check kChecks[] = {{2, 1, 12, "Month value is not proper\n"},
+                                      {3, 1, 31, "Day value is not proper\n"},
+                                      {4, 0, 23, "Hour value is not proper\n"},
+                                      {5, 0, 59, "Minute value is not proper\n"},
+                                      {6, 0, 60, "Second value is not proper\n "},
+                                      {7, 0, 9, "Decisecond  value is not proper\n "},
+                                      {9, 0, 11, " UTC hour value is not proper\n "},
+                                      {10, 0, 59, " UTC minute value is not proper\n"}};
   for (const Check& check : kChecks) {
-    if (check.index < octets.size() && (at(check.index) < check.low || at(check.index) > check.high)) {
+    if (check.index < octets.size() &&
+        (at(check.index) < check.low || at(check.index) > check.high)) {
       LOG_ERROR("%s", check.message);
       return std::nullopt;
     }
   }
   char text[64];
-  int length = std::snprintf(text, sizeof text, "%u-%u-%u,%u:%u:%u.%u", at(0) * 256 + at(1), at(2), at(3), at(4),
-                             at(5), at(6), at(7));
+  int length = std::snprintf(text, sizeof text, "%u-%u-%u,%u:%u:%u.%u", at(0) * 256 + at(1), at(2),
+                             at(3), at(4), at(5), at(6), at(7));
   if (octets.size() == 8) return std::string(text, static_cast<std::size_t>(length));
   if (octets[8] != '+' && octets[8] != '-') {
     LOG_ERROR("sign  value is not proper\n ");
     return std::nullopt;
   }
-  return std::string(text, static_cast<std::size_t>(length)) + "," + octets[8] + std::to_string(at(9)) + ":" +
-         std::to_string(at(10));
+  return std::string(text, static_cast<std::size_t>(length)) + "," + octets[8] +
+         std::to_string(at(9)) + ":" + std::to_string(at(10));
 }
 
 // ---------------------------------------------------------------------------------------------
 // Handlers.
 
-std::optional<VarValue> ScalarProcessReadReq(std::uint8_t pduType, Oid* oid, std::uint8_t* errorCode,
-                                             const TesselStruct& target) {
+std::optional<VarValue> ScalarProcessReadReq(std::uint8_t pduType, Oid* oid,
+                                             std::uint8_t* errorCode, const TesselStruct& target) {
   std::optional<HostValueQuery> query = ScalarQuery(*oid, target, CallKind::kRead);
   if (!query) {
     *errorCode = kGenErr;
@@ -572,15 +595,16 @@ std::optional<VarValue> ScalarProcessReadReq(std::uint8_t pduType, Oid* oid, std
   if (pduType == kGetRequest) {
     text = AdapterGetOidVal(*query, errorCode);
   } else {
-    query->previousSubId = UIntToText(PreviousSubId(*target.cell, static_cast<std::uint32_t>(query->column)));
+    query->previousSubId =
+        UIntToText(PreviousSubId(*target.cell, static_cast<std::uint32_t>(query->column)));
     text = AdapterGetNextOidVal(*query, errorCode);
     if (!text) *errorCode = kNoSuchInstance;
   }
   return ConvertAnswer(text, static_cast<std::uint8_t>(query->dataType), query->syntax, errorCode);
 }
 
-std::optional<VarValue> ScalarProcessWriteReq(const Oid& oid, const VarValue& value, std::uint8_t* errorCode,
-                                              const TesselStruct& target) {
+std::optional<VarValue> ScalarProcessWriteReq(const Oid& oid, const VarValue& value,
+                                              std::uint8_t* errorCode, const TesselStruct& target) {
   std::optional<HostValueQuery> query = ScalarQuery(oid, target, CallKind::kWrite);
   if (!query) {
     LOG_ERROR("Forming query failed \n");
@@ -598,8 +622,8 @@ std::optional<VarValue> TableProcessReadReq(std::uint8_t pduType, Oid* oid, std:
   return std::nullopt;
 }
 
-std::optional<VarValue> TableProcessWriteReq(const Oid& oid, const VarValue& value, std::uint8_t* errorCode,
-                                             const TesselStruct& target) {
+std::optional<VarValue> TableProcessWriteReq(const Oid& oid, const VarValue& value,
+                                             std::uint8_t* errorCode, const TesselStruct& target) {
   std::optional<HostValueQuery> query = TableQuery(oid, target, CallKind::kWrite);
   if (!query) {
     LOG_ERROR("\nForming Oid  failed  in TableProcessWriteReq \n");

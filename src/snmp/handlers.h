@@ -13,14 +13,14 @@
 
 namespace tessel {
 
-std::optional<VarValue> ScalarProcessReadReq(std::uint8_t pduType, Oid* oid, std::uint8_t* errorCode,
-                                             const TesselStruct& target);
-std::optional<VarValue> ScalarProcessWriteReq(const Oid& oid, const VarValue& value, std::uint8_t* errorCode,
-                                              const TesselStruct& target);
+std::optional<VarValue> ScalarProcessReadReq(std::uint8_t pduType, Oid* oid,
+                                             std::uint8_t* errorCode, const TesselStruct& target);
+std::optional<VarValue> ScalarProcessWriteReq(const Oid& oid, const VarValue& value,
+                                              std::uint8_t* errorCode, const TesselStruct& target);
 std::optional<VarValue> TableProcessReadReq(std::uint8_t pduType, Oid* oid, std::uint8_t* errorCode,
                                             const TesselStruct& target);
-std::optional<VarValue> TableProcessWriteReq(const Oid& oid, const VarValue& value, std::uint8_t* errorCode,
-                                             const TesselStruct& target);
+std::optional<VarValue> TableProcessWriteReq(const Oid& oid, const VarValue& value,
+                                             std::uint8_t* errorCode, const TesselStruct& target);
 
 // A host's value text as an SNMP value of the column's data type (and syntax, which may be
 // empty); nothing when the text does not convert.

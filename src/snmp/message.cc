@@ -16,7 +16,8 @@ namespace {
 constexpr std::size_t kMaxCommunity = 256;
 
 // Version, then (v1/v2c) the community. Refusals count a bad version.
-ParseResult ParseVersionAndCommunity(const std::uint8_t** cursor, std::int32_t* remaining, SnmpPdu* pdu) {
+ParseResult ParseVersionAndCommunity(const std::uint8_t** cursor, std::int32_t* remaining,
+                                     SnmpPdu* pdu) {
   std::uint8_t type = 0;
   *cursor = AsnParseInt(*cursor, remaining, &type, &pdu->version);
   if (*cursor == nullptr || type != kAsnInteger) {
@@ -56,8 +57,8 @@ ParseResult ParseVersionAndCommunity(const std::uint8_t** cursor, std::int32_t* 
 
 // countIncoming: a received request updates the incoming statistics; a message the engine only
 // inspects does not.
-ParseResult ParseMessage(const std::uint8_t* message, std::size_t length, SnmpPdu* pdu, PduLayout* layout,
-                         bool countIncoming) {
+ParseResult ParseMessage(const std::uint8_t* message, std::size_t length, SnmpPdu* pdu,
+                         PduLayout* layout, bool countIncoming) {
   std::int32_t remaining = static_cast<std::int32_t>(length);
   std::uint8_t type = 0;
   const std::uint8_t* cursor = length > 0 ? AsnParseHeader(message, &remaining, &type) : nullptr;
@@ -77,12 +78,14 @@ ParseResult ParseMessage(const std::uint8_t* message, std::size_t length, SnmpPd
 }
 
 bool IsValidAuthentication(const SnmpPdu& pdu, const AgentInfo& agent) {
-  const CommunityList& allowed = pdu.type == kSetRequest ? agent.writeCommunities : agent.readCommunities;
+  const CommunityList& allowed =
+      pdu.type == kSetRequest ? agent.writeCommunities : agent.readCommunities;
   if (allowed.Contains(pdu.community)) {
     LOG_TRACE("The community string matches");
     return true;
   }
-  const CommunityList& other = pdu.type == kSetRequest ? agent.readCommunities : agent.writeCommunities;
+  const CommunityList& other =
+      pdu.type == kSetRequest ? agent.readCommunities : agent.writeCommunities;
   if (other.Contains(pdu.community)) CountSnmp(SnmpCounter::kBadCommunityUses);
   CountSnmp(SnmpCounter::kBadCommunityNames);
   LOG_ERROR("Authentication failed !!!!\n");
@@ -113,7 +116,8 @@ int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const 
     case RequestOutcome::kReply:
       break;
   }
-  if (!CreateSnmpMessage(layout.bindings, layout.bindingsLength, reply, replyLength, pdu)) return kMessageDrop;
+  if (!CreateSnmpMessage(layout.bindings, layout.bindingsLength, reply, replyLength, pdu))
+    return kMessageDrop;
   CountErrorStatus(pdu->errorStatus);
   return kMessageReply;
 }
@@ -122,11 +126,26 @@ int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const 
 
 std::int32_t MapErrorStatusToV1(std::int32_t status) {
   switch (status) {
-    case 0: case 1: case 2: case 3: case 4: case 5:
+    case 0:
+    case 1:
+    case 2:
+    case 3:
+    case 4:
+    case 5:
       return status;
-    case 6: case 11: case 14: case 15: case 16: case 17: case 18:
+    case 6:
+    case 11:
+    case 14:
+    case 15:
+    case 16:
+    case 17:
+    case 18:
       return kNoSuchName;
-    case 7: case 8: case 9: case 10: case 12:
+    case 7:
+    case 8:
+    case 9:
+    case 10:
+    case 12:
       return kBadValue;
     default:
       return kGenErr;
@@ -136,9 +155,12 @@ std::int32_t MapErrorStatusToV1(std::int32_t status) {
 int ParseSnmpMessage(const std::uint8_t* message, std::size_t length, SnmpPdu* pdu) {
   PduLayout layout;
   switch (ParseMessage(message, length, pdu, &layout, false)) {
-    case ParseResult::kParsed: return 1;
-    case ParseResult::kDropped: return 0;
-    case ParseResult::kMalformed: return -1;
+    case ParseResult::kParsed:
+      return 1;
+    case ParseResult::kDropped:
+      return 0;
+    case ParseResult::kMalformed:
+      return -1;
   }
   return 0;
 }
@@ -155,7 +177,8 @@ bool CreateSnmpMessage(const std::uint8_t* requestBindings, std::size_t requestB
   if (cursor) cursor = AsnBuildInt(cursor, &remaining, kAsnInteger, pdu->version);
   if (cursor) {
     cursor = AsnBuildString(cursor, &remaining, kAsnOctetString,
-                            reinterpret_cast<const std::uint8_t*>(pdu->community.data()), pdu->community.size());
+                            reinterpret_cast<const std::uint8_t*>(pdu->community.data()),
+                            pdu->community.size());
   }
   if (cursor == nullptr) {
     LOG_ERROR("Unable to encode SNMP message length and sequnce type. !!!\n");

@@ -8,8 +8,8 @@
 
 #include <cstdint>
 #include <optional>
-#include <span>
 #include <shared_mutex>
+#include <span>
 #include <string>
 #include <vector>
 
@@ -29,11 +29,13 @@ struct TesselStruct {
 
 // A read handler answers a Get or GetNext for *oid (a GetNext handler writes the OID it answered
 // back into *oid). No value means *errorCode says why.
-using ReadHandler = std::optional<VarValue> (*)(std::uint8_t pduType, Oid* oid, std::uint8_t* errorCode,
+using ReadHandler = std::optional<VarValue> (*)(std::uint8_t pduType, Oid* oid,
+                                                std::uint8_t* errorCode,
                                                 const TesselStruct& target);
 // A write handler sets *oid to value and answers the value for the response.
 using WriteHandler = std::optional<VarValue> (*)(const Oid& oid, const VarValue& value,
-                                                 std::uint8_t* errorCode, const TesselStruct& target);
+                                                 std::uint8_t* errorCode,
+                                                 const TesselStruct& target);
 
 // Column access codes.
 inline constexpr std::uint8_t kAccessNotAccessible = 0;
@@ -98,9 +100,10 @@ int RegisteredCellCount();
 
 // The cell that answers oid for the PDU type, or nullptr with *errorCode set (noSuchInstance when
 // there is no search array yet; 0 when an unregistered cell ends the search).
-TreeCell* GetTreeCell(std::uint8_t pduType, std::span<const std::uint32_t> oid, std::uint8_t* errorCode);
-bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell, std::span<const std::uint32_t> oid,
-                       std::uint8_t* errorCode);
+TreeCell* GetTreeCell(std::uint8_t pduType, std::span<const std::uint32_t> oid,
+                      std::uint8_t* errorCode);
+bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell,
+                       std::span<const std::uint32_t> oid, std::uint8_t* errorCode);
 // 0 equal; -1 a smaller or a proper prefix of b; 1 a greater; 2 b a proper prefix of a.
 int CompareKey(std::span<const std::uint32_t> a, std::span<const std::uint32_t> b);
 TreeCell* GetTreeCellByName(const std::string& label);

@@ -43,7 +43,7 @@ inline constexpr std::uint8_t kVarBindAnswered = 5;
 
 struct VarBind {
   Oid name;
-  VarValue value;          // value.type is the binding's type
+  VarValue value;           // value.type is the binding's type
   std::uint32_t index = 0;  // 1-based position in the request
   std::uint8_t state = 0;
 };

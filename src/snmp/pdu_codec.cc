@@ -13,21 +13,21 @@ namespace {
 constexpr std::size_t kReservedHeader = 4;  // AsnBuildSequence's fixed form
 
 void CountIncoming(std::uint8_t type, std::int32_t version) {
-  static constexpr SnmpCounter kAllVersions[] = {SnmpCounter::kInGetRequests, SnmpCounter::kInGetNexts,
-                                                 SnmpCounter::kCount, SnmpCounter::kInSetRequests,
-                                                 SnmpCounter::kCount, SnmpCounter::kInGetBulks};
+  static constexpr SnmpCounter kAllVersions[] = {
+      SnmpCounter::kInGetRequests, SnmpCounter::kInGetNexts, SnmpCounter::kCount,
+      SnmpCounter::kInSetRequests, SnmpCounter::kCount,      SnmpCounter::kInGetBulks};
   static constexpr SnmpCounter kV1[] = {SnmpCounter::kV1GetRequests, SnmpCounter::kV1GetNexts,
-                                        SnmpCounter::kCount, SnmpCounter::kV1SetRequests,
-                                        SnmpCounter::kCount, SnmpCounter::kCount};
+                                        SnmpCounter::kCount,         SnmpCounter::kV1SetRequests,
+                                        SnmpCounter::kCount,         SnmpCounter::kCount};
   static constexpr SnmpCounter kV2[] = {SnmpCounter::kV2GetRequests, SnmpCounter::kV2GetNexts,
-                                        SnmpCounter::kCount, SnmpCounter::kV2SetRequests,
-                                        SnmpCounter::kCount, SnmpCounter::kV2GetBulks};
+                                        SnmpCounter::kCount,         SnmpCounter::kV2SetRequests,
+                                        SnmpCounter::kCount,         SnmpCounter::kV2GetBulks};
   static constexpr SnmpCounter kV3[] = {SnmpCounter::kV3GetRequests, SnmpCounter::kV3GetNexts,
-                                        SnmpCounter::kCount, SnmpCounter::kV3SetRequests,
-                                        SnmpCounter::kCount, SnmpCounter::kV3GetBulks};
+                                        SnmpCounter::kCount,         SnmpCounter::kV3SetRequests,
+                                        SnmpCounter::kCount,         SnmpCounter::kV3GetBulks};
   if (type == kTrapV1 || type == kTrapV2) return;
   const SnmpCounter* byVersion = version == kSnmpV1 ? kV1 : version == kSnmpV2c ? kV2 : kV3;
-  CountSnmp(version == kSnmpV1 ? SnmpCounter::kV1Requests
+  CountSnmp(version == kSnmpV1    ? SnmpCounter::kV1Requests
             : version == kSnmpV2c ? SnmpCounter::kV2Requests
                                   : SnmpCounter::kV3Requests);
   if (type < kGetRequest || type > kGetBulkRequest) return;
@@ -37,7 +37,8 @@ void CountIncoming(std::uint8_t type, std::int32_t version) {
 }
 
 // The binding list: a SEQUENCE that exactly fills the rest of the PDU.
-ParseResult ParsePdu(SnmpPdu* pdu, const std::uint8_t* data, std::int32_t remaining, PduLayout* layout) {
+ParseResult ParsePdu(SnmpPdu* pdu, const std::uint8_t* data, std::int32_t remaining,
+                     PduLayout* layout) {
   std::int32_t listLength = remaining;
   std::uint8_t type = 0;
   const std::uint8_t* cursor = AsnParseHeader(data, &listLength, &type);
@@ -55,7 +56,8 @@ ParseResult ParsePdu(SnmpPdu* pdu, const std::uint8_t* data, std::int32_t remain
     std::size_t nameLength = kMaxOidLength;
     std::size_t valueLength = 0;
     const std::uint8_t* value = nullptr;
-    cursor = ParseVarOp(cursor, name, &nameLength, &binding.value.type, &valueLength, &value, &listLength);
+    cursor = ParseVarOp(cursor, name, &nameLength, &binding.value.type, &valueLength, &value,
+                        &listLength);
     if (cursor == nullptr) {
       LOG_ERROR("Unable to parse the varbind #%u\n", index + 1);
       return ParseResult::kMalformed;
@@ -63,7 +65,8 @@ ParseResult ParsePdu(SnmpPdu* pdu, const std::uint8_t* data, std::int32_t remain
     std::int32_t valueRemaining = static_cast<std::int32_t>(listEnd - value);
     std::uint8_t valueType = 0;
     const std::uint8_t* contents = AsnParseHeader(value, &valueRemaining, &valueType);
-    if (contents == nullptr || !DecodeAsnSyntaxValue(valueType, contents, valueLength, &binding.value)) {
+    if (contents == nullptr ||
+        !DecodeAsnSyntaxValue(valueType, contents, valueLength, &binding.value)) {
       LOG_ERROR("Unable to parse the varbind #%u\n", index + 1);
       return ParseResult::kMalformed;
     }
@@ -79,8 +82,9 @@ ParseResult ParsePdu(SnmpPdu* pdu, const std::uint8_t* data, std::int32_t remain
 // PDU header, request-id, error-status, error-index and the bindings.
 }  // namespace
 
-ParseResult ParseSnmpPdu(const std::uint8_t* start, const std::uint8_t* data, std::int32_t remaining,
-                         SnmpPdu* pdu, PduLayout* layout, bool countIncoming) {
+ParseResult ParseSnmpPdu(const std::uint8_t* start, const std::uint8_t* data,
+                         std::int32_t remaining, SnmpPdu* pdu, PduLayout* layout,
+                         bool countIncoming) {
   std::int32_t pduLength = remaining;
   const std::uint8_t* cursor = AsnParseHeader(data, &pduLength, &pdu->type);
   if (cursor == nullptr) {
@@ -146,10 +150,12 @@ std::uint8_t* BuildAnswerPdu(std::uint8_t* cursor, std::int32_t* remaining, cons
   cursor = BuildPduPrefix(cursor, remaining, pdu);
   std::uint8_t* list = cursor;
   if (cursor) cursor = AsnBuildSequence(cursor, remaining, kAsnSequence, 0);
-  const VarBindList& bindings = pdu.type == kGetResponse ? pdu.responseVarBinds : pdu.requestVarBinds;
+  const VarBindList& bindings =
+      pdu.type == kGetResponse ? pdu.responseVarBinds : pdu.requestVarBinds;
   for (const VarBind& binding : bindings) {
     if (cursor == nullptr) break;
-    std::uint8_t* next = BuildVarOp(cursor, binding.name.data(), binding.name.size(), binding.value, remaining);
+    std::uint8_t* next =
+        BuildVarOp(cursor, binding.name.data(), binding.name.size(), binding.value, remaining);
     if (next == nullptr) {
       if (pdu.requestType == kGetBulkRequest) break;
       LOG_ERROR("\n 1. Too big respone PDU\n");
@@ -157,7 +163,8 @@ std::uint8_t* BuildAnswerPdu(std::uint8_t* cursor, std::int32_t* remaining, cons
     }
     cursor = next;
   }
-  if (cursor == nullptr || !FillHeader(list, kAsnSequence, cursor) || !FillHeader(start, pdu.type, cursor)) {
+  if (cursor == nullptr || !FillHeader(list, kAsnSequence, cursor) ||
+      !FillHeader(start, pdu.type, cursor)) {
     return nullptr;
   }
   return cursor;
@@ -170,7 +177,8 @@ std::uint8_t* CreateIdenticalPDU(std::uint8_t* cursor, std::int32_t* remaining, 
   std::uint8_t* start = cursor;
   cursor = BuildPduPrefix(cursor, remaining, pdu);
   if (cursor == nullptr) return nullptr;
-  bool emptyList = (pdu.errorStatus == kTooBig && pdu.version != kSnmpV1) || request.bindings == nullptr;
+  bool emptyList =
+      (pdu.errorStatus == kTooBig && pdu.version != kSnmpV1) || request.bindings == nullptr;
   if (emptyList) {
     cursor = AsnBuildSequence(cursor, remaining, kAsnSequence, 0);
   } else if (request.bindingsLength <= static_cast<std::size_t>(*remaining)) {
@@ -197,15 +205,25 @@ bool FillHeader(std::uint8_t* header, std::uint8_t type, const std::uint8_t* end
 
 void CountErrorStatus(std::int32_t status) {
   switch (status) {
-    case kTooBig: CountSnmp(SnmpCounter::kOutTooBigs); break;
-    case kNoSuchName: CountSnmp(SnmpCounter::kOutNoSuchNames); break;
-    case kBadValue: CountSnmp(SnmpCounter::kOutBadValues); break;
-    case kGenErr: CountSnmp(SnmpCounter::kOutGenErrs); break;
-    default: break;
+    case kTooBig:
+      CountSnmp(SnmpCounter::kOutTooBigs);
+      break;
+    case kNoSuchName:
+      CountSnmp(SnmpCounter::kOutNoSuchNames);
+      break;
+    case kBadValue:
+      CountSnmp(SnmpCounter::kOutBadValues);
+      break;
+    case kGenErr:
+      CountSnmp(SnmpCounter::kOutGenErrs);
+      break;
+    default:
+      break;
   }
 }
 
-RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access) {
+RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent,
+                                 const SecurityAccess* access) {
   switch (pdu->type) {
     case kInformRequest:
       return RequestOutcome::kEchoInform;
@@ -238,7 +256,8 @@ RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent, const 
     return RequestOutcome::kDrop;
   }
   if (pdu->errorStatus != 0) {
-    RecordErrorLog(pdu->requestId, pdu->requestType, pdu->version, pdu->errorStatus, agent.transport.peerAddress);
+    RecordErrorLog(pdu->requestId, pdu->requestType, pdu->version, pdu->errorStatus,
+                   agent.transport.peerAddress);
   } else {
     CountAnswered(*pdu);
   }

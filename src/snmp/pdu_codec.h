@@ -26,14 +26,16 @@ enum class ParseResult { kParsed, kDropped, kMalformed };
 // Parses the PDU at data (remaining octets to the end of its enclosing message part). A trap is
 // counted and dropped. countIncoming: a received request updates the incoming statistics; a
 // message the engine only inspects does not.
-ParseResult ParseSnmpPdu(const std::uint8_t* messageStart, const std::uint8_t* data, std::int32_t remaining,
-                         SnmpPdu* pdu, PduLayout* layout, bool countIncoming);
+ParseResult ParseSnmpPdu(const std::uint8_t* messageStart, const std::uint8_t* data,
+                         std::int32_t remaining, SnmpPdu* pdu, PduLayout* layout,
+                         bool countIncoming);
 
 enum class RequestOutcome { kReply, kEchoInform, kDrop, kResourceFailure };
 
 // Processes a parsed and authorised request PDU for the agent: dispatches it, records errors
 // and counts. kReply: pdu now holds the response to encode; kEchoInform: acknowledge the inform.
-RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access);
+RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent,
+                                 const SecurityAccess* access);
 
 // Encodes pdu as a Response at cursor: its response bindings, or, when the request failed or the
 // bindings do not fit, the error reply (the request's bindings, or an empty list for tooBig

@@ -87,9 +87,13 @@ int ColumnAtOrAfter(const TreeCell& cell, Oid* oid) {
   return -1;
 }
 
-bool Readable(std::uint8_t access) { return access != kAccessNotAccessible && access != kAccessNone; }
+bool Readable(std::uint8_t access) {
+  return access != kAccessNotAccessible && access != kAccessNone;
+}
 
-TesselStruct Target(const TreeCell& cell, const Context& context) { return TesselStruct{&context.agent, &cell}; }
+TesselStruct Target(const TreeCell& cell, const Context& context) {
+  return TesselStruct{&context.agent, &cell};
+}
 
 // The next cell of the tree with oid at its base, or nullptr at the end of the MIB.
 const TreeCell* EnterNextCell(const TreeCell* cell, Oid* oid) {
@@ -113,16 +117,19 @@ Answer EndOfMib(const Context& context, const Oid& requested) {
 enum class Step { kAnswered, kMoveOn, kAgain, kFailed };
 
 // Reads one column for a GetNext: the answer, a reason to move to the next column, or an error.
-Step ReadNextInColumn(const TreeCell& cell, int position, Oid* oid, const Context& context, Answer* answer) {
+Step ReadNextInColumn(const TreeCell& cell, int position, Oid* oid, const Context& context,
+                      Answer* answer) {
   if (!Readable(cell.access[static_cast<std::size_t>(position)])) {
     LOG_TRACE("Access is denied for this oid !!!\n");
     return Step::kMoveOn;
   }
   std::uint8_t error = 0;
-  std::optional<VarValue> value = cell.readHandler(kGetNextRequest, oid, &error, Target(cell, context));
+  std::optional<VarValue> value =
+      cell.readHandler(kGetNextRequest, oid, &error, Target(cell, context));
   if (value) {
     if (HiddenFromV1(context, *value)) return Step::kMoveOn;
-    if (CheckAccess(context, kGetNextRequest, *oid) != 1) return cell.isTable ? Step::kAgain : Step::kMoveOn;
+    if (CheckAccess(context, kGetNextRequest, *oid) != 1)
+      return cell.isTable ? Step::kAgain : Step::kMoveOn;
     *answer = Answered(*oid, std::move(*value));
     return Step::kAnswered;
   }
@@ -164,15 +171,18 @@ void ApplyRowStatusIntent(const TreeCell& cell, std::uint32_t column, const VarV
   if (asked == 5 && reached == 2) *response = VarValue::Integer(5);
 }
 
-Answer WriteExact(const TreeCell& cell, int position, const VarBind& binding, const Context& context) {
+Answer WriteExact(const TreeCell& cell, int position, const VarBind& binding,
+                  const Context& context) {
   if (cell.access[static_cast<std::size_t>(position)] == kAccessReadOnly) {
     LOG_TRACE("Trying to set to RONLY variable !!!\n");
     return Failed(kNotWritable);
   }
   std::uint8_t error = 0;
-  std::optional<VarValue> value = cell.writeHandler(binding.name, binding.value, &error, Target(cell, context));
+  std::optional<VarValue> value =
+      cell.writeHandler(binding.name, binding.value, &error, Target(cell, context));
   if (value) {
-    ApplyRowStatusIntent(cell, cell.subIds[static_cast<std::size_t>(position)], binding.value, &*value);
+    ApplyRowStatusIntent(cell, cell.subIds[static_cast<std::size_t>(position)], binding.value,
+                         &*value);
     return Answered(binding.name, std::move(*value));
   }
   LOG_ERROR("Bad value, not able to perform set operation !!!\n");
@@ -183,7 +193,8 @@ Answer WriteExact(const TreeCell& cell, int position, const VarBind& binding, co
 Answer ReadExact(const TreeCell& cell, const VarBind& binding, const Context& context) {
   Oid oid = binding.name;
   std::uint8_t error = 0;
-  std::optional<VarValue> value = cell.readHandler(kGetRequest, &oid, &error, Target(cell, context));
+  std::optional<VarValue> value =
+      cell.readHandler(kGetRequest, &oid, &error, Target(cell, context));
   if (value) {
     if (HiddenFromV1(context, *value)) return Failed(kNoSuchName);
     return Answered(binding.name, std::move(*value));
@@ -240,16 +251,17 @@ std::vector<Holder> CreateHolders(const VarBindList& bindings, const Context& co
 // Answers every binding (answers aligned with bindings). Returns the error status of the binding
 // with the lowest index that failed, and that index (1-based) in *errorIndex; bindings after a
 // failed one are not processed.
-std::int32_t ProcessVarBinds(const VarBindList& bindings, const Context& context, VarBindList* answers,
-                             std::int32_t* errorIndex) {
+std::int32_t ProcessVarBinds(const VarBindList& bindings, const Context& context,
+                             VarBindList* answers, std::int32_t* errorIndex) {
   answers->assign(bindings.size(), VarBind{});
   std::size_t lowestFailure = SIZE_MAX;
   std::int32_t status = kNoError;
   for (const Holder& holder : CreateHolders(bindings, context)) {
     for (std::size_t i : holder.members) {
       if (i > lowestFailure) continue;
-      Answer answer = context.pduType == kGetNextRequest ? WalkNext(holder.cell, bindings[i].name, context)
-                                                         : AnswerExact(holder, bindings[i], context);
+      Answer answer = context.pduType == kGetNextRequest
+                          ? WalkNext(holder.cell, bindings[i].name, context)
+                          : AnswerExact(holder, bindings[i], context);
       if (answer.error != kNoError) {
         if (i < lowestFailure) {
           lowestFailure = i;
@@ -272,8 +284,8 @@ std::size_t EncodedSize(const VarBindList& bindings, std::size_t from) {
   for (std::size_t i = from; i < bindings.size(); ++i) {
     std::int32_t remaining = static_cast<std::int32_t>(scratch.size());
     const VarBind& binding = bindings[i];
-    std::uint8_t* end = BuildVarOp(scratch.data(), binding.name.data(), binding.name.size(), binding.value,
-                                   &remaining);
+    std::uint8_t* end = BuildVarOp(scratch.data(), binding.name.data(), binding.name.size(),
+                                   binding.value, &remaining);
     total += end ? static_cast<std::size_t>(end - scratch.data()) : scratch.size();
   }
   return total;
@@ -324,9 +336,11 @@ std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent, const SecurityA
   return pdu->errorStatus;
 }
 
-std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access) {
+std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent,
+                                    const SecurityAccess* access) {
   std::size_t count = pdu->requestVarBinds.size();
-  std::size_t nonRepeaters = std::min<std::size_t>(static_cast<std::size_t>(std::max(pdu->errorStatus, 0)), count);
+  std::size_t nonRepeaters =
+      std::min<std::size_t>(static_cast<std::size_t>(std::max(pdu->errorStatus, 0)), count);
   std::int64_t maxRepetitions = std::max(pdu->errorIndex, 0);
   pdu->errorStatus = kNoError;
   pdu->errorIndex = 0;
@@ -357,7 +371,8 @@ std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent, con
       return kGenErr;
     }
     used += EncodedSize(answers, 0);
-    all.insert(all.end(), std::make_move_iterator(answers.begin()), std::make_move_iterator(answers.end()));
+    all.insert(all.end(), std::make_move_iterator(answers.begin()),
+               std::make_move_iterator(answers.end()));
   }
   return kNoError;
 }

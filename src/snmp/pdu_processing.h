@@ -22,13 +22,14 @@ struct SecurityAccess {
   std::string securityName;
   std::int32_t securityModel = 3;
   std::int32_t securityLevel = 0;
-  int (*isAccessAllowed)(const SecurityAccess& access, std::uint8_t pduType, std::span<const std::uint32_t> oid,
-                         std::string* viewCache) = nullptr;
+  int (*isAccessAllowed)(const SecurityAccess& access, std::uint8_t pduType,
+                         std::span<const std::uint32_t> oid, std::string* viewCache) = nullptr;
 };
 
 // Both return the reply's error status (pdu->errorStatus/errorIndex are set, the answers are in
 // pdu->responseVarBinds), or 99 when memory ran out. access is null for SNMPv1 and SNMPv2c.
-std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access = nullptr);
+std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent,
+                        const SecurityAccess* access = nullptr);
 std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent,
                                     const SecurityAccess* access = nullptr);
 

@@ -108,7 +108,9 @@ bool Readable(int epoll, int descriptor) {
 int OpenWildcard(const char* address, std::uint16_t port, bool ipv6, bool wantDestination) {
   int error = 0;
   int socket = OpenUdpSocket(address, port, ipv6, UdpBindOptions{true, wantDestination}, &error);
-  if (socket < 0) LOG_ERROR("Bind Failed : udp port %d Address %s, the engine carries on without it", port, address);
+  if (socket < 0)
+    LOG_ERROR("Bind Failed : udp port %d Address %s, the engine carries on without it", port,
+              address);
   return socket;
 }
 
@@ -116,7 +118,8 @@ void CloseWildcardsLocked(Service& service) {
   WildcardSockets& wildcards = service.wildcards;
   for (int* socket : {&wildcards.ipv4, &wildcards.ipv6, &wildcards.notify}) {
     if (*socket < 0) continue;
-    if (service.wildcardEpoll >= 0) epoll_ctl(service.wildcardEpoll, EPOLL_CTL_DEL, *socket, nullptr);
+    if (service.wildcardEpoll >= 0)
+      epoll_ctl(service.wildcardEpoll, EPOLL_CTL_DEL, *socket, nullptr);
     CloseUdpSocket(*socket);
     *socket = -1;
   }
@@ -145,7 +148,8 @@ void StartSnmpAgentService(Service& service) {
 bool ReleaseWildcardPort(std::uint16_t port) {
   Service& service = TheService();
   std::lock_guard<std::mutex> lock(service.wildcards.mutex);
-  if (service.wildcards.port != port || (service.wildcards.ipv4 < 0 && service.wildcards.ipv6 < 0)) return false;
+  if (service.wildcards.port != port || (service.wildcards.ipv4 < 0 && service.wildcards.ipv6 < 0))
+    return false;
   LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
   CloseWildcardsLocked(service);
   service.wildcards.port = port;  // not reopened for this port
@@ -227,7 +231,8 @@ void StartThreads(Service& service) {
   int agentEpoll = AgentSocketsEpoll();
   Readable(agentEpoll, service.stopEvent);
   Readable(service.wildcardEpoll, service.stopEvent);
-  service.threads.emplace_back(ReceiveLoop<void (*)(int)>, agentEpoll, service.stopEvent, ServeAgentSocket);
+  service.threads.emplace_back(ReceiveLoop<void (*)(int)>, agentEpoll, service.stopEvent,
+                               ServeAgentSocket);
   service.threads.emplace_back(ReceiveLoop<void (*)(int)>, service.wildcardEpoll, service.stopEvent,
                                ServeWildcardSocket);
 }
@@ -262,7 +267,8 @@ void StopSnmpGeneralServices() {
   Service& service = TheService();
   if (service.stopEvent >= 0) {
     std::uint64_t one = 1;
-    if (write(service.stopEvent, &one, sizeof one) < 0) LOG_ERROR("Unable to wake the receive threads");
+    if (write(service.stopEvent, &one, sizeof one) < 0)
+      LOG_ERROR("Unable to wake the receive threads");
   }
   for (RequestQueue& queue : service.queues) queue.Stop();
   for (std::thread& thread : service.threads) thread.join();
@@ -279,7 +285,8 @@ void StopSnmpGeneralServices() {
   }
 }
 
-bool CreateRcvdInfo(const AgentSession& session, const std::uint8_t* data, std::size_t length, bool viaWildcard) {
+bool CreateRcvdInfo(const AgentSession& session, const std::uint8_t* data, std::size_t length,
+                    bool viaWildcard) {
   auto item = std::make_unique<RcvdInfo>();
   item->data.assign(data, data + length);
   item->session = session;
@@ -302,7 +309,8 @@ bool ProcessRcvdSnmpReq(const std::uint8_t* data, std::size_t length, const Agen
   }
   if (replyLength == 0) return true;
   LOG_TRACE("The length of the pkt to send is %zu", replyLength);
-  return SendUdpPacket(session.transport, static_cast<int>(session.socket), reply.data(), replyLength, viaWildcard);
+  return SendUdpPacket(session.transport, static_cast<int>(session.socket), reply.data(),
+                       replyLength, viaWildcard);
 }
 
 std::vector<int> LiveWorkerCounts() {

@@ -23,7 +23,8 @@ void StopSnmpGeneralServices();
 
 // Queues one received datagram of an agent (round robin over the queues). viaWildcard: the
 // datagram came in on a wildcard socket, so the reply must name the agent's address as source.
-bool CreateRcvdInfo(const AgentSession& session, const std::uint8_t* data, std::size_t length, bool viaWildcard);
+bool CreateRcvdInfo(const AgentSession& session, const std::uint8_t* data, std::size_t length,
+                    bool viaWildcard);
 
 // Processes one request and sends its reply; false when the request was dropped.
 bool ProcessRcvdSnmpReq(const std::uint8_t* data, std::size_t length, const AgentSession& session,

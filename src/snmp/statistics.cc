@@ -47,7 +47,8 @@ std::uint32_t SnmpCount(SnmpCounter counter) {
 std::vector<std::int32_t> GetReportOverviewDetails() {
   std::vector<std::int32_t> report(kReportedCounters);
   for (int i = 0; i < kReportedCounters; ++i) {
-    report[static_cast<std::size_t>(i)] = static_cast<std::int32_t>(counters[static_cast<std::size_t>(i)].load());
+    report[static_cast<std::size_t>(i)] =
+        static_cast<std::int32_t>(counters[static_cast<std::size_t>(i)].load());
   }
   return report;
 }
@@ -99,7 +100,8 @@ std::vector<std::string> GetIpAddrArr(int n) {
   ErrorLog& log = Log();
   std::lock_guard<std::mutex> lock(log.mutex);
   std::size_t count = n < 0 ? 0 : std::min(static_cast<std::size_t>(n), log.lastAddresses.size());
-  return {log.lastAddresses.begin(), log.lastAddresses.begin() + static_cast<std::ptrdiff_t>(count)};
+  return {log.lastAddresses.begin(),
+          log.lastAddresses.begin() + static_cast<std::ptrdiff_t>(count)};
 }
 
 }  // namespace tessel

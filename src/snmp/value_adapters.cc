@@ -13,10 +13,25 @@ using HostMethod = HostAnswer (HostBridge::*)(const HostValueQuery&);
 
 // The host's error numbers, by position, as engine error codes. The host numbers the v2
 // exceptions and the v1 statuses in one list; 6 has no meaning and counts as genErr.
-constexpr std::uint8_t kHostErrorCodes[] = {
-    kTooBig, kNoSuchObject, kNoSuchInstance, kEndOfMibView, kBadValue, kReadOnly, kGenErr, kNoAccess,
-    8,       9,             10,              11,            12,        13,        14,      15,
-    16,      17,            18};
+constexpr std::uint8_t kHostErrorCodes[] = {kTooBig,
+                                            kNoSuchObject,
+                                            kNoSuchInstance,
+                                            kEndOfMibView,
+                                            kBadValue,
+                                            kReadOnly,
+                                            kGenErr,
+                                            kNoAccess,
+                                            8,
+                                            9,
+                                            10,
+                                            11,
+                                            12,
+                                            13,
+                                            14,
+                                            15,
+                                            16,
+                                            17,
+                                            18};
 
 // The element of the answer at index, when the host gave one.
 const std::optional<std::string>* Element(const HostAnswer& answer, std::size_t index) {
@@ -49,7 +64,8 @@ HostAnswer CallHost(HostMethod method, const HostValueQuery& query) {
   return (host->*method)(query);
 }
 
-std::optional<std::string> Ask(HostMethod method, const HostValueQuery& query, std::uint8_t* errorCode) {
+std::optional<std::string> Ask(HostMethod method, const HostValueQuery& query,
+                               std::uint8_t* errorCode) {
   return ReadAnswer(CallHost(method, query), 1, errorCode);
 }
 
@@ -63,14 +79,16 @@ std::uint8_t GetSnmpErrorStatus(const std::string& errorText) {
     if (c < '0' || c > '9') return kGenErr;
     number = number * 10 + static_cast<std::size_t>(c - '0');
   }
-  return number < std::size(kHostErrorCodes) ? kHostErrorCodes[number] : static_cast<std::uint8_t>(kGenErr);
+  return number < std::size(kHostErrorCodes) ? kHostErrorCodes[number]
+                                             : static_cast<std::uint8_t>(kGenErr);
 }
 
 std::optional<std::string> AdapterGetOidVal(const HostValueQuery& query, std::uint8_t* errorCode) {
   return Ask(&HostBridge::ScalarGetOidVal, query, errorCode);
 }
 
-std::optional<std::string> AdapterGetNextOidVal(const HostValueQuery& query, std::uint8_t* errorCode) {
+std::optional<std::string> AdapterGetNextOidVal(const HostValueQuery& query,
+                                                std::uint8_t* errorCode) {
   return Ask(&HostBridge::ScalarGetNextOidVal, query, errorCode);
 }
 
@@ -78,11 +96,13 @@ std::optional<std::string> AdapterSetOidVal(const HostValueQuery& query, std::ui
   return Ask(&HostBridge::SetOidVal, query, errorCode);
 }
 
-std::optional<std::string> AdapterTableGetOidVal(const HostValueQuery& query, std::uint8_t* errorCode) {
+std::optional<std::string> AdapterTableGetOidVal(const HostValueQuery& query,
+                                                 std::uint8_t* errorCode) {
   return Ask(&HostBridge::TableGetOidVal, query, errorCode);
 }
 
-std::optional<std::string> AdapterTableGetNextOidVal(const HostValueQuery& query, std::string* columnAndInstance,
+std::optional<std::string> AdapterTableGetNextOidVal(const HostValueQuery& query,
+                                                     std::string* columnAndInstance,
                                                      std::uint8_t* errorCode) {
   HostAnswer answer = CallHost(&HostBridge::TableGetNextOidVal, query);
   std::optional<std::string> value = ReadAnswer(answer, 2, errorCode);
@@ -91,7 +111,8 @@ std::optional<std::string> AdapterTableGetNextOidVal(const HostValueQuery& query
   return value;
 }
 
-std::optional<std::string> AdapterTableSetOidVal(const HostValueQuery& query, std::uint8_t* errorCode) {
+std::optional<std::string> AdapterTableSetOidVal(const HostValueQuery& query,
+                                                 std::uint8_t* errorCode) {
   return Ask(&HostBridge::TableSetOidVal, query, errorCode);
 }
 

@@ -40,17 +40,23 @@ struct VarValue {
   std::string octets;
   Oid oid;
 
-  std::int32_t AsInt32() const { return static_cast<std::int32_t>(static_cast<std::uint32_t>(number)); }
+  std::int32_t AsInt32() const {
+    return static_cast<std::int32_t>(static_cast<std::uint32_t>(number));
+  }
   static VarValue Integer(std::int32_t value) {
     return {kAsnInteger, static_cast<std::uint32_t>(value), {}, {}};
   }
   static VarValue Unsigned(std::uint8_t type, std::uint64_t value) { return {type, value, {}, {}}; }
-  static VarValue Octets(std::uint8_t type, std::string value) { return {type, 0, std::move(value), {}}; }
+  static VarValue Octets(std::uint8_t type, std::string value) {
+    return {type, 0, std::move(value), {}};
+  }
   static VarValue ObjectId(Oid value) { return {kAsnObjectId, 0, {}, std::move(value)}; }
   static VarValue Empty(std::uint8_t type) { return {type, 0, {}, {}}; }
   bool operator==(const VarValue&) const = default;
 };
 
-inline bool IsExceptionType(std::uint8_t type) { return type >= kNoSuchObject && type <= kEndOfMibView; }
+inline bool IsExceptionType(std::uint8_t type) {
+  return type >= kNoSuchObject && type <= kEndOfMibView;
+}
 
 }  // namespace tessel

@@ -41,7 +41,9 @@ std::string ReadEngineIdFile(const std::string& path) {
   return id.size() >= 5 ? id : std::string();
 }
 
-std::string GenerateEngineId() { return std::string(kDefaultAgentAddress) + "#" + std::to_string(kDefaultAgentPort); }
+std::string GenerateEngineId() {
+  return std::string(kDefaultAgentAddress) + "#" + std::to_string(kDefaultAgentPort);
+}
 
 }  // namespace
 
@@ -67,7 +69,8 @@ void ClearEngineId() {
 }
 
 std::string AgentEngineId(const AgentSession& agent) {
-  std::string id = agent.transport.localAddress + "#" + std::to_string(agent.transport.localPort + 1u);
+  std::string id =
+      agent.transport.localAddress + "#" + std::to_string(agent.transport.localPort + 1u);
   if (id.size() > kMaxEngineIdLength) id.erase(0, id.size() - kMaxEngineIdLength);
   return id;
 }

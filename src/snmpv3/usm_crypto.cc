@@ -217,8 +217,8 @@ bool DesCipher(bool encrypt, std::string_view privKey, const std::uint8_t salt[k
 
 // AES-128-CFB: IV = boots || time (big-endian) || salt.
 bool AesCipher(bool encrypt, std::string_view privKey, std::uint32_t boots, std::uint32_t time,
-               const std::uint8_t salt[kUsmSaltLength], const std::uint8_t* in,
-               std::size_t length, std::vector<std::uint8_t>* out) {
+               const std::uint8_t salt[kUsmSaltLength], const std::uint8_t* in, std::size_t length,
+               std::vector<std::uint8_t>* out) {
   std::uint8_t iv[16];
   PutBigEndian32(boots, iv);
   PutBigEndian32(time, iv + 4);

@@ -62,8 +62,8 @@ bool SetProtocols(UsmUser* user, std::string_view authName, std::string_view pri
   if (user->authKey.empty()) return false;
   if (user->priv == PrivProtocol::kNone) return true;
   if (user->privPassword.empty()) return false;
-  user->privKey = GetLocalKeyValue(user->privPassword, user->auth, user->engineId)
-                      .substr(0, kUsmPrivKeyLength);
+  user->privKey =
+      GetLocalKeyValue(user->privPassword, user->auth, user->engineId).substr(0, kUsmPrivKeyLength);
   return user->privKey.size() == kUsmPrivKeyLength;
 }
 

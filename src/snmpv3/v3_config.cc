@@ -17,7 +17,8 @@ namespace {
 constexpr const char* kReadOnly = "43690";
 
 // Registers one read-only scalar group: its first scalar's OID, sub-identifiers 1..n.
-void RegisterScalarGroup(const char* label, const char* firstScalar, const std::vector<std::string>& dataTypes) {
+void RegisterScalarGroup(const char* label, const char* firstScalar,
+                         const std::vector<std::string>& dataTypes) {
   TreeCellRegistration group;
   group.label = label;
   group.versionText = "V2";
@@ -32,12 +33,14 @@ void RegisterScalarGroup(const char* label, const char* firstScalar, const std::
 
 }  // namespace
 
-int AddUsmUserFromHost(std::string_view userName, std::string_view authProtocol, std::string_view authPassword,
-                       std::string_view privProtocol, std::string_view privPassword, std::int32_t discoveryTimeFlag) {
+int AddUsmUserFromHost(std::string_view userName, std::string_view authProtocol,
+                       std::string_view authPassword, std::string_view privProtocol,
+                       std::string_view privPassword, std::int32_t discoveryTimeFlag) {
   if (!ReadFromSnmpV3ConfFile()) return 99;
   gv_snmpv3Configured = true;
   gv_discoveryTimeFlag = discoveryTimeFlag != 0;
-  return AddUSMUserEntry(userName, authProtocol, authPassword, privProtocol, privPassword, EngineId());
+  return AddUSMUserEntry(userName, authProtocol, authPassword, privProtocol, privPassword,
+                         EngineId());
 }
 
 void InitSnmpV3Params() {

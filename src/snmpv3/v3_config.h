@@ -11,8 +11,9 @@ namespace tessel {
 
 // Adds a USM user under the process engine ID; the first user makes the engine an SNMPv3
 // engine. 1 added, 0 refused, 99 memory exhausted.
-int AddUsmUserFromHost(std::string_view userName, std::string_view authProtocol, std::string_view authPassword,
-                       std::string_view privProtocol, std::string_view privPassword, std::int32_t discoveryTimeFlag);
+int AddUsmUserFromHost(std::string_view userName, std::string_view authProtocol,
+                       std::string_view authPassword, std::string_view privProtocol,
+                       std::string_view privPassword, std::int32_t discoveryTimeFlag);
 
 // At a service start: sets the engine ID unless set, creates the VACM tables unless they exist,
 // resets the SNMPv3 statistics and registers the snmpEngine, snmpMPDStats and usmStats groups

@@ -31,7 +31,6 @@ constexpr std::size_t kSaltLength = kUsmSaltLength;
 constexpr std::uint8_t kAuthFlag = 0x01;
 constexpr std::uint8_t kPrivFlag = 0x02;
 
-
 std::array<std::atomic<std::uint32_t>, static_cast<std::size_t>(V3Counter::kCount)> v3Counters{};
 
 std::uint32_t CountV3(V3Counter counter) {
@@ -55,7 +54,8 @@ constexpr UsmError kDecryptionError{V3Counter::kDecryptionErrors, 6, kAuthNoPriv
 // four-octet form and are closed once their contents are written.
 class Builder {
  public:
-  explicit Builder(std::size_t capacity) : buffer_(capacity), remaining_(static_cast<std::int32_t>(capacity)) {}
+  explicit Builder(std::size_t capacity)
+      : buffer_(capacity), remaining_(static_cast<std::int32_t>(capacity)) {}
 
   std::size_t Open(std::uint8_t type) {
     std::size_t at = Offset();
@@ -65,7 +65,9 @@ class Builder {
   void Close(std::size_t header) {
     if (ok_) ok_ = FillHeader(buffer_.data() + header, buffer_[header], Cursor());
   }
-  void Integer(std::int32_t value) { Advance(AsnBuildInt(Cursor(), &remaining_, kAsnInteger, value)); }
+  void Integer(std::int32_t value) {
+    Advance(AsnBuildInt(Cursor(), &remaining_, kAsnInteger, value));
+  }
   std::size_t Octets(std::string_view octets) {
     Advance(AsnBuildString(Cursor(), &remaining_, kAsnOctetString,
                            reinterpret_cast<const std::uint8_t*>(octets.data()), octets.size()));
@@ -185,8 +187,9 @@ bool ParseHeader(Reader* reader, MessageHeader* header) {
   std::int32_t version = 0;
   std::string flags;
   if (!reader->Integer(&version) || version != 3 || !reader->Header(kAsnSequence, &contents) ||
-      !reader->Integer(&header->msgId) || !reader->Integer(&header->msgMaxSize) || !reader->Octets(&flags, 10) ||
-      flags.size() != 1 || !reader->Integer(&header->securityModel)) {
+      !reader->Integer(&header->msgId) || !reader->Integer(&header->msgMaxSize) ||
+      !reader->Octets(&flags, 10) || flags.size() != 1 ||
+      !reader->Integer(&header->securityModel)) {
     LOG_ERROR("Unable to parse SNMPV3 Message header...\n");
     return false;
   }
@@ -218,7 +221,8 @@ bool ParseSecurityParameters(Reader* reader, const std::uint8_t* start, std::uin
     return false;
   }
   // The contents of an OCTET STRING end at the cursor.
-  security->authOffset = static_cast<std::size_t>(reader->cursor - start) - security->authParameters.size();
+  security->authOffset =
+      static_cast<std::size_t>(reader->cursor - start) - security->authParameters.size();
   if (!reader->Octets(&security->privParameters, kSaltLength)) {
     LOG_ERROR("Unable to parse the priv params %d .\n", 0);
     return false;
@@ -244,8 +248,8 @@ bool ParseScopedPdu(ScopedPdu* scoped, bool countIncoming) {
     return false;
   }
   scoped->pdu.version = kSnmpV3;
-  return ParseSnmpPdu(scoped->plaintext.data(), reader.cursor, reader.remaining, &scoped->pdu, &scoped->layout,
-                      countIncoming) == ParseResult::kParsed;
+  return ParseSnmpPdu(scoped->plaintext.data(), reader.cursor, reader.remaining, &scoped->pdu,
+                      &scoped->layout, countIncoming) == ParseResult::kParsed;
 }
 
 // ---- Building ----
@@ -267,8 +271,9 @@ struct OutgoingSecurity {
 
 // The whole message around an already encoded scoped PDU field (plaintext SEQUENCE or the
 // encrypted OCTET STRING); authenticated when the level asks for it.
-bool WrapMessage(const V3Request& request, const OutgoingSecurity& out, const std::vector<std::uint8_t>& scopedField,
-                 std::uint8_t* reply, std::size_t* replyLength) {
+bool WrapMessage(const V3Request& request, const OutgoingSecurity& out,
+                 const std::vector<std::uint8_t>& scopedField, std::uint8_t* reply,
+                 std::size_t* replyLength) {
   Builder message(*replyLength);
   std::size_t outer = message.Open(kAsnSequence);
   message.Integer(3);
@@ -284,7 +289,8 @@ bool WrapMessage(const V3Request& request, const OutgoingSecurity& out, const st
   message.Integer(static_cast<std::int32_t>(out.boots));
   message.Integer(static_cast<std::int32_t>(out.time));
   message.Octets(request.security.userName);
-  std::size_t digestAt = message.Octets(out.level == kNoAuthNoPriv ? std::string() : std::string(kDigestLength, '\0'));
+  std::size_t digestAt =
+      message.Octets(out.level == kNoAuthNoPriv ? std::string() : std::string(kDigestLength, '\0'));
   message.Octets(out.salt);
   message.Close(parameters);
   message.Close(wrapper);
@@ -296,7 +302,8 @@ bool WrapMessage(const V3Request& request, const OutgoingSecurity& out, const st
   }
   if (out.level != kNoAuthNoPriv) {
     std::uint8_t digest[kDigestLength];
-    if (!CalculateDigest(request.user->auth, AuthKey(request), message.Data(), message.Offset(), digest)) {
+    if (!CalculateDigest(request.user->auth, AuthKey(request), message.Data(), message.Offset(),
+                         digest)) {
       LOG_ERROR("Digest failed, when creating respons message.\n");
       return false;
     }
@@ -307,8 +314,9 @@ bool WrapMessage(const V3Request& request, const OutgoingSecurity& out, const st
   return true;
 }
 
-std::vector<std::uint8_t> EncodeScoped(std::string_view contextEngineId, std::string_view contextName,
-                                       const std::uint8_t* pdu, std::size_t pduLength) {
+std::vector<std::uint8_t> EncodeScoped(std::string_view contextEngineId,
+                                       std::string_view contextName, const std::uint8_t* pdu,
+                                       std::size_t pduLength) {
   Builder scoped(pduLength + 16 + contextEngineId.size() + contextName.size() + 8);
   std::size_t header = scoped.Open(kAsnSequence);
   scoped.Octets(contextEngineId);
@@ -340,10 +348,12 @@ std::vector<std::uint8_t> EncodeReportPdu(std::int32_t requestId, const UsmError
 
 // Answers a security error. The request-id and context come from the scoped PDU when it can be
 // read as plaintext; a manager matches Reports by msgID in any case.
-int SendReport(V3Request& request, const UsmError& error, std::uint8_t* reply, std::size_t* replyLength) {
+int SendReport(V3Request& request, const UsmError& error, std::uint8_t* reply,
+               std::size_t* replyLength) {
   ScopedPdu scoped;
-  scoped.plaintext.assign(request.message.begin() + static_cast<std::ptrdiff_t>(request.scopedOffset),
-                          request.message.end());
+  scoped.plaintext.assign(
+      request.message.begin() + static_cast<std::ptrdiff_t>(request.scopedOffset),
+      request.message.end());
   std::int32_t requestId = ParseScopedPdu(&scoped, false) ? scoped.pdu.requestId : 0;
   std::vector<std::uint8_t> pdu = EncodeReportPdu(requestId, error);
   OutgoingSecurity out;
@@ -352,10 +362,12 @@ int SendReport(V3Request& request, const UsmError& error, std::uint8_t* reply, s
     out.boots = request.agentBoots;
     out.time = request.agentTime;
   }
-  std::vector<std::uint8_t> field = EncodeScoped(request.agentEngineId, scoped.contextName, pdu.data(), pdu.size());
+  std::vector<std::uint8_t> field =
+      EncodeScoped(request.agentEngineId, scoped.contextName, pdu.data(), pdu.size());
   CountSnmp(SnmpCounter::kV3SecurityErrors);
   LOG_TRACE("Returning Snmpv3 error like unknown engine Id, etc.\n");
-  if (pdu.empty() || field.empty() || !WrapMessage(request, out, field, reply, replyLength)) return kMessageDrop;
+  if (pdu.empty() || field.empty() || !WrapMessage(request, out, field, reply, replyLength))
+    return kMessageDrop;
   return kMessageReply;
 }
 
@@ -370,18 +382,20 @@ struct Check {
 
 bool IsForDiscovery(const V3Request& request) {
   const std::string& user = request.security.userName;
-  return request.security.engineId.empty() || request.security.engineId != request.agentEngineId || user.empty() ||
-         user == "initial";
+  return request.security.engineId.empty() || request.security.engineId != request.agentEngineId ||
+         user.empty() || user == "initial";
 }
 
 bool Authentic(V3Request& request) {
   std::uint8_t* digestAt = request.message.data() + request.security.authOffset;
   std::fill(digestAt, digestAt + kDigestLength, 0);
   std::uint8_t digest[kDigestLength];
-  if (!CalculateDigest(request.user->auth, AuthKey(request), request.message.data(), request.message.size(), digest)) {
+  if (!CalculateDigest(request.user->auth, AuthKey(request), request.message.data(),
+                       request.message.size(), digest)) {
     return false;
   }
-  return DigestsEqual(digest, reinterpret_cast<const std::uint8_t*>(request.security.authParameters.data()));
+  return DigestsEqual(
+      digest, reinterpret_cast<const std::uint8_t*>(request.security.authParameters.data()));
 }
 
 // A message is timely when it names the agent's current boots (never the latched maximum) and a
@@ -432,36 +446,39 @@ bool ScopedPlaintext(const V3Request& request, std::vector<std::uint8_t>* plaint
   Reader reader{at, static_cast<std::int32_t>(length)};
   std::int32_t contents = 0;
   if (!reader.Header(kAsnOctetString, &contents)) return false;
-  return DecryptScopedPdu(request.user->priv, PrivKey(request), static_cast<std::uint32_t>(request.security.boots),
-                          static_cast<std::uint32_t>(request.security.time),
-                          reinterpret_cast<const std::uint8_t*>(request.security.privParameters.data()),
-                          reader.cursor, static_cast<std::size_t>(contents), plaintext);
+  return DecryptScopedPdu(
+      request.user->priv, PrivKey(request), static_cast<std::uint32_t>(request.security.boots),
+      static_cast<std::uint32_t>(request.security.time),
+      reinterpret_cast<const std::uint8_t*>(request.security.privParameters.data()), reader.cursor,
+      static_cast<std::size_t>(contents), plaintext);
 }
 
 // ---- The request ----
 
-int VacmCheck(const SecurityAccess& access, std::uint8_t pduType, std::span<const std::uint32_t> oid,
-              std::string* viewCache) {
-  return IsAccessAllowed(access.contextName, access.securityName, access.securityModel, access.securityLevel,
-                         pduType, oid, viewCache);
+int VacmCheck(const SecurityAccess& access, std::uint8_t pduType,
+              std::span<const std::uint32_t> oid, std::string* viewCache) {
+  return IsAccessAllowed(access.contextName, access.securityName, access.securityModel,
+                         access.securityLevel, pduType, oid, viewCache);
 }
 
 // Room the wrapper, the security parameters, the scoped PDU header and the cipher padding take.
 std::size_t WrapperOverhead(const V3Request& request, const ScopedPdu& scoped) {
-  return 64 + request.agentEngineId.size() + request.security.userName.size() + scoped.contextEngineId.size() +
-         scoped.contextName.size();
+  return 64 + request.agentEngineId.size() + request.security.userName.size() +
+         scoped.contextEngineId.size() + scoped.contextName.size();
 }
 
 int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::size_t* replyLength) {
-  std::size_t limit = std::min({static_cast<std::size_t>(request.header.msgMaxSize), kMaxSnmpMessage, *replyLength});
+  std::size_t limit = std::min(
+      {static_cast<std::size_t>(request.header.msgMaxSize), kMaxSnmpMessage, *replyLength});
   std::size_t overhead = WrapperOverhead(request, scoped);
   if (limit <= overhead) return kMessageDrop;
   std::vector<std::uint8_t> pdu(limit - overhead);
   std::int32_t remaining = static_cast<std::int32_t>(pdu.size());
   std::uint8_t* end = BuildResponsePdu(pdu.data(), &remaining, &scoped.pdu, scoped.layout);
   if (end == nullptr) return kMessageDrop;
-  std::vector<std::uint8_t> field = EncodeScoped(scoped.contextEngineId, scoped.contextName, pdu.data(),
-                                                 static_cast<std::size_t>(end - pdu.data()));
+  std::vector<std::uint8_t> field =
+      EncodeScoped(scoped.contextEngineId, scoped.contextName, pdu.data(),
+                   static_cast<std::size_t>(end - pdu.data()));
   OutgoingSecurity out;
   out.level = request.level;
   out.boots = request.agentBoots;
@@ -469,8 +486,8 @@ int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::siz
   if (request.level == kAuthPriv) {
     std::vector<std::uint8_t> cipher;
     std::uint8_t salt[kSaltLength];
-    if (!EncryptScopedPdu(request.user->priv, PrivKey(request), out.boots, out.time, field.data(), field.size(),
-                          &cipher, salt)) {
+    if (!EncryptScopedPdu(request.user->priv, PrivKey(request), out.boots, out.time, field.data(),
+                          field.size(), &cipher, salt)) {
       LOG_ERROR("Encryption Failed  !!!\n");
       return kMessageDrop;
     }
@@ -487,10 +504,12 @@ int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::siz
   return kMessageReply;
 }
 
-int ProcessScopedPdu(V3Request& request, std::uint8_t* reply, std::size_t* replyLength, const AgentSession& agent) {
+int ProcessScopedPdu(V3Request& request, std::uint8_t* reply, std::size_t* replyLength,
+                     const AgentSession& agent) {
   ScopedPdu scoped;
   if (!ScopedPlaintext(request, &scoped.plaintext) || !ParseScopedPdu(&scoped, true)) {
-    if (request.level == kAuthPriv) return SendReport(request, kDecryptionError, reply, replyLength);
+    if (request.level == kAuthPriv)
+      return SendReport(request, kDecryptionError, reply, replyLength);
     CountSnmp(SnmpCounter::kAsnParseErrors);
     return kMessageDrop;
   }
@@ -523,7 +542,8 @@ bool ParseRequest(V3Request& request) {
     CountSnmp(SnmpCounter::kAsnParseErrors);
     return false;
   }
-  if (request.header.msgMaxSize < kMinimumMessageSize || !LevelFromFlags(request.header.flags, &request.level)) {
+  if (request.header.msgMaxSize < kMinimumMessageSize ||
+      !LevelFromFlags(request.header.flags, &request.level)) {
     CountV3(V3Counter::kInvalidMsgs);
     return false;
   }
@@ -543,7 +563,9 @@ bool ParseRequest(V3Request& request) {
 
 }  // namespace
 
-std::uint32_t V3Count(V3Counter counter) { return v3Counters[static_cast<std::size_t>(counter)].load(); }
+std::uint32_t V3Count(V3Counter counter) {
+  return v3Counters[static_cast<std::size_t>(counter)].load();
+}
 
 void ResetV3Statistics() {
   for (auto& counter : v3Counters) counter.store(0);
@@ -558,7 +580,8 @@ int ProcessSnmpV3Message(const std::uint8_t* message, std::size_t length, std::u
   request.agentBoots = agent.agentInfo ? agent.agentInfo->engineBoots.load() : 0;
   request.agentTime = AgentEngineTime(agent);
   Check check = CheckSecurity(request);
-  if (check.verdict == Verdict::kReport) return SendReport(request, check.error, reply, replyLength);
+  if (check.verdict == Verdict::kReport)
+    return SendReport(request, check.error, reply, replyLength);
   if (check.verdict == Verdict::kDrop) return kMessageDrop;
   return ProcessScopedPdu(request, reply, replyLength, agent);
 }

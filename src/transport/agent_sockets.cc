@@ -33,7 +33,8 @@ int EpollLocked(AgentSockets& sockets) {
 
 int BindAgent(const AgentSession& session, std::uint16_t port, int* error) {
   const TransportDomainInfo& transport = session.transport;
-  return OpenUdpSocket(transport.localAddress, port, transport.isIPv6 != 0, UdpBindOptions{}, error);
+  return OpenUdpSocket(transport.localAddress, port, transport.isIPv6 != 0, UdpBindOptions{},
+                       error);
 }
 
 }  // namespace

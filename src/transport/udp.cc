@@ -51,7 +51,8 @@ bool ConfigureSocket(int socket, bool ipv6, const UdpBindOptions& options) {
   if (ipv6 && !SetOption(socket, IPPROTO_IPV6, IPV6_V6ONLY)) return false;
   if (options.shareWithOwnSockets && !SetOption(socket, SOL_SOCKET, SO_REUSEADDR)) return false;
   if (options.wantDestination) {
-    if (!SetOption(socket, ipv6 ? IPPROTO_IPV6 : IPPROTO_IP, ipv6 ? IPV6_RECVPKTINFO : IP_PKTINFO)) return false;
+    if (!SetOption(socket, ipv6 ? IPPROTO_IPV6 : IPPROTO_IP, ipv6 ? IPV6_RECVPKTINFO : IP_PKTINFO))
+      return false;
   }
   return fcntl(socket, F_SETFL, fcntl(socket, F_GETFL) | O_NONBLOCK) == 0;
 }
@@ -73,7 +74,8 @@ std::string AddressText(const sockaddr_storage& address, std::uint16_t* port) {
 // The destination address that IP_PKTINFO / IPV6_PKTINFO reported, if any.
 void ReadDestination(msghdr& message, TransportDomainInfo* transport) {
   char text[INET6_ADDRSTRLEN] = {};
-  for (cmsghdr* control = CMSG_FIRSTHDR(&message); control; control = CMSG_NXTHDR(&message, control)) {
+  for (cmsghdr* control = CMSG_FIRSTHDR(&message); control;
+       control = CMSG_NXTHDR(&message, control)) {
     if (control->cmsg_level == IPPROTO_IP && control->cmsg_type == IP_PKTINFO) {
       in_pktinfo info;
       std::memcpy(&info, CMSG_DATA(control), sizeof info);
@@ -115,8 +117,8 @@ socklen_t SourceControl(const std::string& address, bool ipv6, char* buffer, std
 
 }  // namespace
 
-int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6, const UdpBindOptions& options,
-                  int* error) {
+int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6,
+                  const UdpBindOptions& options, int* error) {
   sockaddr_storage local;
   socklen_t localLength = 0;
   if (!FillAddress(address, port, ipv6, &local, &localLength)) {
@@ -137,7 +139,8 @@ int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6, con
   }
   if (bind(socket, reinterpret_cast<sockaddr*>(&local), localLength) != 0) {
     *error = errno;
-    LOG_TRACE("Bind Failed : udp port %d %s Address %s", port, ipv6 ? "IPv6" : "IPv4", address.c_str());
+    LOG_TRACE("Bind Failed : udp port %d %s Address %s", port, ipv6 ? "IPv6" : "IPv4",
+              address.c_str());
     LOG_ERROR("The error in bind is %d for IP address %s", *error, address.c_str());
     ::close(socket);
     return -1;
@@ -163,7 +166,8 @@ bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::
   message.msg_controllen = sizeof control;
   ssize_t received = recvmsg(socket, &message, MSG_DONTWAIT);
   if (received < 0) {
-    if (errno != EAGAIN && errno != EWOULDBLOCK) LOG_ERROR("Error while receiving a SNMP messge !!!!");
+    if (errno != EAGAIN && errno != EWOULDBLOCK)
+      LOG_ERROR("Error while receiving a SNMP messge !!!!");
     return false;
   }
   *length = (message.msg_flags & MSG_TRUNC) ? capacity : static_cast<std::size_t>(received);
@@ -177,8 +181,8 @@ bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::
   return true;
 }
 
-bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes, std::size_t length,
-                   bool fromLocalAddress) {
+bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes,
+                   std::size_t length, bool fromLocalAddress) {
   iovec data{const_cast<std::uint8_t*>(bytes), length};
   alignas(cmsghdr) char control[64];
   msghdr message{};
@@ -195,8 +199,8 @@ bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::
   LOG_TRACE("Sending PDU to : %s at %d", transport.peerAddress.c_str(), transport.peerPort);
   for (int attempt = 0; attempt < 3; ++attempt) {
     if (sendmsg(socket, &message, MSG_DONTWAIT) >= 0) return true;
-    LOG_ERROR("The error in sending snmp message !!! is %d to IP address %s and port num %d ", errno,
-              transport.peerAddress.c_str(), transport.peerPort);
+    LOG_ERROR("The error in sending snmp message !!! is %d to IP address %s and port num %d ",
+              errno, transport.peerAddress.c_str(), transport.peerPort);
   }
   return false;
 }

@@ -19,8 +19,8 @@ struct UdpBindOptions {
 };
 
 // A socket bound to address:port, or -1 with *error set to the errno of the failing step.
-int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6, const UdpBindOptions& options,
-                  int* error);
+int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6,
+                  const UdpBindOptions& options, int* error);
 void CloseUdpSocket(int socket);
 
 // Reads one datagram into buffer. Fills the transport's peer (address text, port, socket
@@ -32,7 +32,7 @@ bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::
 
 // Sends to the transport's peer. With fromLocalAddress the datagram leaves from the transport's
 // localAddress even on a wildcard socket. Tries three times.
-bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes, std::size_t length,
-                   bool fromLocalAddress);
+bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes,
+                   std::size_t length, bool fromLocalAddress);
 
 }  // namespace tessel
