@@ -1,10 +1,7 @@
 """SNMPv3 managers against Tessel's devices: net-snmp and pysnmp with every level and protocol pair of
 the default configuration (profiles/snmpv3.conf), the Reports for security errors, and views."""
 
-import hashlib
-import hmac
 import re
-import socket
 import subprocess
 
 import pytest
@@ -147,91 +144,6 @@ for user in users:
     result = subprocess.run(["/usr/bin/python3", "-c", script], capture_output=True, text=True, timeout=60)
     assert result.returncode == 0, result.stderr
     assert result.stdout.split() == ["edge-router"] * 3
-
-
-# ---- Time window, with messages built here: net-snmp always synchronises before it asks. ----
-
-def tlv(tag, body):
-    if len(body) < 128:
-        return bytes([tag, len(body)]) + body
-    size = len(body).to_bytes((len(body).bit_length() + 7) // 8, "big")
-    return bytes([tag, 0x80 | len(size)]) + size + body
-
-
-def integer(value):
-    return tlv(0x02, value.to_bytes((value.bit_length() + 8) // 8, "big", signed=True))
-
-
-def octets(data):
-    return tlv(0x04, data)
-
-
-def seq(*items):
-    return tlv(0x30, b"".join(items))
-
-
-def parse(data):
-    """The (tag, contents) pairs one after the other in data."""
-    items = []
-    while data:
-        tag, length, at = data[0], data[1], 2
-        if length & 0x80:
-            at = 2 + (length & 0x7F)
-            length = int.from_bytes(data[2:at], "big")
-        items.append((tag, data[at:at + length]))
-        data = data[at + length:]
-    return items
-
-
-def md5_key(password, engine_id):
-    stretched = (password * (1048576 // len(password) + 1))[:1048576]
-    ku = hashlib.md5(stretched).digest()
-    return hashlib.md5(ku + engine_id + ku).digest()
-
-
-def v3_exchange(endpoint, engine_id=b"", boots=0, time=0, user=b"", key=None):
-    """Sends a Get of sysName.0 (authNoPriv with HMAC-MD5 when key is given); returns the reply's
-    msgFlags, security parameters (engine ID, boots, time) and the PDU tag with its first binding."""
-    get = tlv(0xA0, integer(77) + integer(0) + integer(0) + seq(seq(bytes.fromhex("06082b06010201010500"), b"\x05\x00")))
-
-    def message(digest):
-        header = seq(integer(1234), integer(65507), octets(bytes([0x05 if key else 0x04])), integer(3))
-        security = seq(octets(engine_id), integer(boots), integer(time), octets(user), octets(digest), octets(b""))
-        return seq(integer(3), header, octets(security), seq(octets(engine_id), octets(b""), get))
-
-    datagram = message(b"\x00" * 12 if key else b"")
-    if key:
-        datagram = message(hmac.new(key, datagram, hashlib.md5).digest()[:12])
-    host, port = endpoint.split(":")
-    with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as s:
-        s.settimeout(2)
-        s.sendto(datagram, (host, int(port)))
-        reply = s.recv(4096)
-    _, header, security, scoped = parse(parse(reply)[0][1])
-    flags = parse(header[1])[2][1][0]
-    engine, r_boots, r_time = parse(parse(security[1])[0][1])[:3]
-    pdu_tag, pdu = parse(scoped[1])[2]
-    name, value = parse(parse(parse(pdu)[3][1])[0][1])
-    return (flags, engine[1], int.from_bytes(r_boots[1], "big"), int.from_bytes(r_time[1], "big"), pdu_tag,
-            name[1], value[1])
-
-
-NOT_IN_TIME_WINDOWS = bytes.fromhex("2b060106030f01010200")
-
-
-def test_discovery_then_only_current_boots_and_time_are_accepted(v3net):
-    agent = v3net.agent(0)
-    flags, engine, boots, time, tag, name, _ = v3_exchange(agent)
-    assert (tag, name) == (0xA8, bytes.fromhex("2b060106030f01010400")), "usmStatsUnknownEngineIDs Report"
-    assert engine and boots >= 1 and flags & 0x03 == 0
-    key = md5_key(b"md5password", engine)
-
-    *_, tag, name, value = v3_exchange(agent, engine, boots, time, b"md5", key)
-    assert (tag, value) == (0xA2, b"edge-router")
-    for stale_boots, stale_time in ((boots, time + 1000), (boots + 1, time), (2147483647, time)):
-        flags, _, report_boots, _, tag, name, _ = v3_exchange(agent, engine, stale_boots, stale_time, b"md5", key)
-        assert (tag, name) == (0xA8, NOT_IN_TIME_WINDOWS), (stale_boots, stale_time)
-        assert flags & 0x01 and report_boots == boots, "an authenticated Report with the agent's boots"
 
 
 def test_given_configuration_replaces_the_default_and_communities_keep_working(tmp_path):

@@ -162,6 +162,7 @@ class V3MessageTest : public SnmpAgentTest {
       std::int32_t inner = static_cast<std::int32_t>(reply.data() + length - cursor);
       const std::uint8_t* contents = AsnParseHeader(cursor, &inner, &type);
       if (contents == nullptr) return std::nullopt;
+      if (skip == 1) replyFlags_ = contents[inner - 4];  // global data ends: flags, 02 01 03
       cursor = contents + inner;
       remaining = static_cast<std::int32_t>(reply.data() + length - cursor);
     }
@@ -189,6 +190,7 @@ class V3MessageTest : public SnmpAgentTest {
 
   std::string engineId_;
   std::vector<std::uint8_t> reply_;
+  std::uint8_t replyFlags_ = 0xFF;
 };
 
 TEST_F(V3MessageTest, DiscoveryIsAnsweredWithTheAgentsEngineId) {
@@ -224,6 +226,10 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   EXPECT_EQ(ReportedName(otherBoots), O("1.3.6.1.6.3.15.1.1.2.0"));
   otherBoots.boots = 2147483647;
   EXPECT_EQ(ReportedName(otherBoots), O("1.3.6.1.6.3.15.1.1.2.0"));
+  // That Report is authenticated and tells this engine's boots, so that the manager can resync.
+  EXPECT_EQ(replyFlags_ & 0x03, 0x01);
+  std::string text(reply_.begin(), reply_.end());
+  EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 3), "\x02\x01\x03");
   stale.time = 1000 - 149;
   auto inWindow = Exchange3(Encode(stale));
   ASSERT_TRUE(inWindow);

@@ -43,11 +43,6 @@ std::vector<HostValueQuery> MemoryHost::SetCalls() const {
   return setCalls_;
 }
 
-int MemoryHost::CallCount() const {
-  std::lock_guard<std::mutex> lock(mutex_);
-  return callCount_;
-}
-
 void MemoryHost::PrintStatus(const std::string& text) {
   std::lock_guard<std::mutex> lock(mutex_);
   statusLines_.push_back(text);
@@ -55,7 +50,6 @@ void MemoryHost::PrintStatus(const std::string& text) {
 
 HostAnswer MemoryHost::Answer(const Oid& oid) {
   std::lock_guard<std::mutex> lock(mutex_);
-  ++callCount_;
   auto found = objects_.find(oid);
   if (found == objects_.end()) return std::nullopt;
   return std::vector<std::optional<std::string>>{found->second.value, found->second.error};
@@ -63,7 +57,6 @@ HostAnswer MemoryHost::Answer(const Oid& oid) {
 
 HostAnswer MemoryHost::Store(const Oid& oid, const HostValueQuery& query) {
   std::lock_guard<std::mutex> lock(mutex_);
-  ++callCount_;
   setCalls_.push_back(query);
   Entry& entry = objects_[oid];
   if (entry.error != "-1") return std::vector<std::optional<std::string>>{entry.value, entry.error};
@@ -93,7 +86,6 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   columnOid.push_back(static_cast<std::uint32_t>(query.column));
   Oid from = ToOid(query.objectOid + "." + std::to_string(query.column) + query.instance.value_or(""));
   std::lock_guard<std::mutex> lock(mutex_);
-  ++callCount_;
   auto next = query.instance ? objects_.upper_bound(from) : objects_.lower_bound(from);
   if (next == objects_.end() || next->first.size() <= columnOid.size() ||
       !std::equal(columnOid.begin(), columnOid.end(), next->first.begin())) {

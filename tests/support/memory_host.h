@@ -24,7 +24,6 @@ class MemoryHost : public HostBridge {
   std::string ValueOf(const std::string& oidText) const;
   std::vector<std::string> StatusLines() const;
   std::vector<HostValueQuery> SetCalls() const;
-  int CallCount() const;
 
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
@@ -47,7 +46,6 @@ class MemoryHost : public HostBridge {
   std::map<Oid, Entry> objects_;
   std::vector<std::string> statusLines_;
   std::vector<HostValueQuery> setCalls_;
-  int callCount_ = 0;
 };
 
 }  // namespace tessel

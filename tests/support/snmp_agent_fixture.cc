@@ -15,9 +15,10 @@ namespace {
 constexpr const char* kRo = "43690";  // read-only
 constexpr const char* kRw = "43706";  // read-write
 
-// Columns as {sub-identifier, data type, access}.
-void Register(const std::string& label, const std::string& oid, bool isTable,
-              std::vector<std::array<std::string, 3>> columns) {
+}  // namespace
+
+void RegisterCell(const std::string& label, const std::string& oid, bool isTable,
+                  std::vector<std::array<std::string, 3>> columns) {
   TreeCellRegistration cell;
   cell.label = label;
   cell.versionText = "V2";
@@ -30,8 +31,6 @@ void Register(const std::string& label, const std::string& oid, bool isTable,
   }
   ASSERT_TRUE(CreateAndRegisterCell(cell));
 }
-
-}  // namespace
 
 Oid O(const std::string& dotted) {
   Oid oid;
@@ -75,12 +74,12 @@ void SnmpAgentTest::SetUp() {
   ResetSnmpStatistics();
   SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq, TableProcessWriteReq);
   InstallHost(&host_);
-  Register("system", "1.3.6.1.2.1.1.1", false,
+  RegisterCell("system", "1.3.6.1.2.1.1.1", false,
            {{"1", "4", kRo}, {"2", "6", kRo}, {"3", "67", kRo}, {"4", "4", kRw},
             {"5", "4", kRw}, {"6", "4", kRw}, {"7", "2", kRo}});
-  Register("ifEntry", "1.3.6.1.2.1.2.2.1", true,
+  RegisterCell("ifEntry", "1.3.6.1.2.1.2.2.1", true,
            {{"1", "2", kRo}, {"2", "4", kRo}, {"10", "65", kRo}});
-  Register("ifXEntry", "1.3.6.1.2.1.31.1.1.1", true, {{"1", "4", kRw}, {"6", "70", kRo}});
+  RegisterCell("ifXEntry", "1.3.6.1.2.1.31.1.1.1", true, {{"1", "4", kRw}, {"6", "70", kRo}});
   StoreTreeCellsRefInArray();
   host_.SetValue("1.3.6.1.2.1.1.1.0", "Tessel router");
   host_.SetValue("1.3.6.1.2.1.1.2.0", ".1.3.6.1.4.1.99999");

@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 
+#include <array>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -29,6 +30,9 @@ struct Request {
 
 std::vector<std::uint8_t> EncodeRequest(const Request& request);
 Oid O(const std::string& dotted);
+// Registers a cell (SMIv2); columns as {sub-identifier, data type, access}.
+void RegisterCell(const std::string& label, const std::string& oid, bool isTable,
+                  std::vector<std::array<std::string, 3>> columns);
 
 class SnmpAgentTest : public ::testing::Test {
  protected:

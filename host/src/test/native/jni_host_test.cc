@@ -27,7 +27,10 @@ class JniHostTest : public ::testing::Test {
   }
 
   void SetUp() override {
-    ASSERT_TRUE(JniHost::Instance().BindSnmpHandler(env_, NewObject(kHandler)));
+    jobject handler =
+        ProbeCall("handler", "()Lcom/kestrelon/simulator/tessel/snmp/SnmpHandler;", nullptr);
+    ASSERT_NE(handler, nullptr);
+    ASSERT_TRUE(JniHost::Instance().BindSnmpHandler(env_, env_->NewGlobalRef(handler)));
   }
 
   static jobject NewObject(const char* className) {
@@ -77,7 +80,6 @@ class JniHostTest : public ::testing::Test {
   }
 
   using Texts = std::vector<std::optional<std::string>>;
-  static constexpr const char* kHandler = "com/kestrelon/simulator/tessel/NativeProbe$MemoryHandler";
   static inline JavaVM* vm_ = nullptr;
   static inline JNIEnv* env_ = nullptr;
   static inline jobject simulator_ = nullptr;
@@ -88,9 +90,11 @@ TEST_F(JniHostTest, ScalarValuesCrossAsUtf8Bytes) {
   const std::string name = std::string("h\xC3\xA9llo \xE2\x82\xAC", 10) + std::string("\0x", 2);
   HostValueQuery set = Scalar("5");
   set.valueText = name;
-  EXPECT_EQ(host.SetOidVal(set), (Texts{name, "-1"}));
-  EXPECT_EQ(host.ScalarGetOidVal(Scalar("5")), (Texts{name, "-1"}));
-  EXPECT_EQ(host.ScalarGetNextOidVal(Scalar("5")), (Texts{name, "-1"}));
+  // The host stores the octets it received, and answers them as hex.
+  const Texts stored = {"'68c3a96c6c6f20e282ac0078'h", "-1"};
+  EXPECT_EQ(host.SetOidVal(set), stored);
+  EXPECT_EQ(host.ScalarGetOidVal(Scalar("5")), stored);
+  EXPECT_EQ(host.ScalarGetNextOidVal(Scalar("5")), stored);
   EXPECT_EQ(host.ScalarGetOidVal(Scalar("6")), std::nullopt);
 
   host.PrintStatus("\xC3\xA9tat");
@@ -102,11 +106,12 @@ TEST_F(JniHostTest, ScalarValuesCrossAsUtf8Bytes) {
 
 TEST_F(JniHostTest, TableValuesAreSetAndWalkedInColumnOrder) {
   JniHost& host = JniHost::Instance();
-  EXPECT_EQ(host.TableSetOidVal(Column(".3", "eth2")), (Texts{"eth2", "-1"}));
-  EXPECT_EQ(host.TableSetOidVal(Column(".1", "eth0")), (Texts{"eth0", "-1"}));
-  EXPECT_EQ(host.TableGetOidVal(Column(".1")), (Texts{"eth0", "-1"}));
-  EXPECT_EQ(host.TableGetNextOidVal(Column(std::nullopt)), (Texts{"eth0", "2.1", "-1"}));
-  EXPECT_EQ(host.TableGetNextOidVal(Column(".1")), (Texts{"eth2", "2.3", "-1"}));
+  const std::string eth0 = "'65746830'h", eth2 = "'65746832'h";
+  EXPECT_EQ(host.TableSetOidVal(Column(".3", "eth2")), (Texts{eth2, "-1"}));
+  EXPECT_EQ(host.TableSetOidVal(Column(".1", "eth0")), (Texts{eth0, "-1"}));
+  EXPECT_EQ(host.TableGetOidVal(Column(".1")), (Texts{eth0, "-1"}));
+  EXPECT_EQ(host.TableGetNextOidVal(Column(std::nullopt)), (Texts{eth0, "2.1", "-1"}));
+  EXPECT_EQ(host.TableGetNextOidVal(Column(".1")), (Texts{eth2, "2.3", "-1"}));
   EXPECT_EQ(host.TableGetNextOidVal(Column(".3")), std::nullopt);
 }
 
@@ -118,7 +123,7 @@ TEST_F(JniHostTest, HostExceptionIsNoAnswer) {
   EXPECT_FALSE(env_->ExceptionCheck());
   HostValueQuery set = Scalar("1");
   set.valueText = "still answers";
-  EXPECT_EQ(host.SetOidVal(set), (Texts{"still answers", "-1"}));
+  EXPECT_EQ(host.SetOidVal(set), (Texts{"'7374696c6c20616e7377657273'h", "-1"}));
 }
 
 TEST_F(JniHostTest, EngineThreadAttachesOnceAndDetachesAtItsEnd) {
@@ -129,7 +134,7 @@ TEST_F(JniHostTest, EngineThreadAttachesOnceAndDetachesAtItsEnd) {
   std::thread engineThread([&] {
     host.SetOidVal(set);
     HostAnswer answer = host.ScalarGetOidVal(Scalar("4"));
-    EXPECT_EQ(answer, (Texts{"from a thread", "-1"}));
+    EXPECT_EQ(answer, (Texts{"'66726f6d206120746872656164'h", "-1"}));
     attachedDuring = ThreadsNamed(AttachedEnv(vm_), "tessel-engine");
   });
   engineThread.join();

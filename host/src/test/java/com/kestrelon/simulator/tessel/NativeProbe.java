@@ -1,9 +1,11 @@
 package com.kestrelon.simulator.tessel;
 
+import com.kestrelon.simulator.tessel.data.DeviceData;
+import com.kestrelon.simulator.tessel.data.DeviceDataException;
+import com.kestrelon.simulator.tessel.snmp.DeviceStore;
 import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
-import com.kestrelon.simulator.tessel.snmp.ValueStore;
 
-/** What the native host-bridge test asks the JVM about. */
+/** What the native host-bridge test asks the JVM about, and the handlers it binds. */
 public final class NativeProbe {
   private NativeProbe() {}
 
@@ -23,71 +25,23 @@ public final class NativeProbe {
     return lines.isEmpty() ? null : lines.get(lines.size() - 1);
   }
 
-  /**
-   * A handler that stores any Set text as given and answers it back, for any OID: the bridge is
-   * tested for what crosses it, not for the device data.
-   */
-  public static class MemoryHandler extends SnmpHandler {
-    private static final String NO_ERROR = "-1";
-    private final ValueStore values = new ValueStore();
+  /** The host's own handler over a few system objects and two ifDescr instances. */
+  public static SnmpHandler handler() throws DeviceDataException {
+    return new SnmpHandler(probeStore());
+  }
 
-    private static String[] answer(String value) {
-      return value == null ? null : new String[] {value, NO_ERROR};
-    }
-
-    private String[] store(String oid, String value) {
-      values.put(oid, value);
-      return new String[] {value, NO_ERROR};
-    }
-
-    @Override
-    public String[] ScalarGetOidVal(String label, String groupOid, String subId, String instance,
-        String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
-        String address, int port, String syntax) {
-      return answer(values.get(groupOid + "." + subId + instance));
-    }
-
-    @Override
-    public String[] ScalarGetNextOidVal(String label, String groupOid, String subId, String instance,
-        String previousSubId, String databaseName, String tableName, int dataType, int agentId,
-        int rowStatusColumn, String address, int port, String syntax) {
-      return answer(values.get(groupOid + "." + subId + instance));
-    }
-
-    @Override
-    public String[] SetOidVal(String label, String groupOid, String subId, String instance,
-        String databaseName, String tableName, String value, int dataType, int agentId,
-        int rowStatusColumn, String address, int port, String syntax) {
-      return store(groupOid + "." + subId + instance, value);
-    }
-
-    @Override
-    public String[] TableGetOidVal(String label, String entryOid, String column, String instance,
-        String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
-        String address, int port, String syntax) {
-      return answer(values.get(entryOid + "." + column + instance));
-    }
-
-    @Override
-    public String[] TableGetNextOidVal(String label, String entryOid, String instance, int column,
-        int nextColumn, int dataType, int nextDataType, String databaseName, String tableName,
-        int agentId, int rowStatusColumn, String address, int port, String syntax) {
-      String[] next = values.nextInColumn(entryOid, column, instance);
-      return next == null ? null : new String[] {next[0], next[1], NO_ERROR};
-    }
-
-    @Override
-    public String[] TableSetOidVal(String label, String entryOid, String column, String instance,
-        String databaseName, String tableName, String value, String[] rowColumns,
-        String[] rowValues, String[] rowTypes, String[] extraColumns, String[] extraValues,
-        String[] extraTypes, int dataType, int agentId, int rowStatusColumn, String address,
-        int port, String syntax) {
-      return store(entryOid + "." + column + instance, value);
-    }
+  private static DeviceStore probeStore() throws DeviceDataException {
+    return new DeviceStore(DeviceData.parse("probe.snmprec", String.join("\n",
+        "1.3.6.1.2.1.1.1.0|4|descr", "1.3.6.1.2.1.1.4.0|4|contact", "1.3.6.1.2.1.1.5.0|4|name",
+        "1.3.6.1.2.1.2.2.1.2.1|4|old0", "1.3.6.1.2.1.2.2.1.2.3|4|old2")));
   }
 
   /** A handler whose scalar Get always throws. */
-  public static final class ThrowingHandler extends MemoryHandler {
+  public static final class ThrowingHandler extends SnmpHandler {
+    public ThrowingHandler() throws DeviceDataException {
+      super(probeStore());
+    }
+
     @Override
     public String[] ScalarGetOidVal(String label, String groupOid, String subId, String instance,
         String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,

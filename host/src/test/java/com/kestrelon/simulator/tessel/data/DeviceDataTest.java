@@ -4,11 +4,8 @@ import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertThrows;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
-import java.nio.file.Files;
-import java.nio.file.Path;
 import java.util.List;
 import org.junit.jupiter.api.Test;
-import org.junit.jupiter.api.io.TempDir;
 import org.junit.jupiter.params.ParameterizedTest;
 import org.junit.jupiter.params.provider.CsvSource;
 
@@ -83,33 +80,6 @@ class DeviceDataTest {
         assertTrue(data.next(Oid.parse("1.3.6.1.4.1.4294967295.0")).isEmpty());
     }
 
-    @Test
-    void bothFormatsGiveTheSameObjects() throws Exception {
-        DeviceData walk = DeviceData.parse("a.walk", String.join("\n",
-                ".1.3.6.1.2.1.1.1.0 = STRING: \"two\nlines\"",
-                ".1.3.6.1.2.1.1.2.0 = OID: .1.3.6.1.4.1.8072.3.2.10",
-                ".1.3.6.1.2.1.1.3.0 = Timeticks: (123) 0:00:01.23",
-                ".1.3.6.1.2.1.2.2.1.6.2 = Hex-STRING: 00 1B 21 3A 4C 5D ",
-                ".1.3.6.1.2.1.2.2.1.7.2 = INTEGER: up(1)",
-                ".1.3.6.1.2.1.4.20.1.1.10.0.0.0 = IpAddress: 10.0.0.0",
-                ".1.3.6.1.2.1.4.21.1.3.0.0.0.0 = INTEGER: -1",
-                ".1.3.6.1.2.1.31.1.1.1.6.2 = Counter64: 21167265032",
-                ".1.3.6.1.4.1.32473.1.0 = Opaque: Float: 42.000000",
-                ".1.3.6.1.4.1.32473.2.0 = NULL"));
-        DeviceData snmprec = DeviceData.parse("a.snmprec", String.join("\n",
-                "1.3.6.1.2.1.1.1.0|4x|74776f0a6c696e6573",
-                "1.3.6.1.2.1.1.2.0|6|1.3.6.1.4.1.8072.3.2.10",
-                "1.3.6.1.2.1.1.3.0|67|123",
-                "1.3.6.1.2.1.2.2.1.6.2|4x|001b213a4c5d",
-                "1.3.6.1.2.1.2.2.1.7.2|2|1",
-                "1.3.6.1.2.1.4.20.1.1.10.0.0.0|64|10.0.0.0",
-                "1.3.6.1.2.1.4.21.1.3.0.0.0.0|2|-1",
-                "1.3.6.1.2.1.31.1.1.1.6.2|70|21167265032",
-                "1.3.6.1.4.1.32473.1.0|68x|9f780442280000",
-                "1.3.6.1.4.1.32473.2.0|5|"));
-        assertEquals(summary(snmprec), summary(walk));
-    }
-
     @ParameterizedTest
     @CsvSource(delimiter = ';', value = {
         "1.3.6.1.2.1.1.1.0|4|x\\n1.3.6.1.2.1.1.2.0|4:numeric|x; dev:2: variation modules are not supported (tag '4:numeric')",
@@ -118,11 +88,7 @@ class DeviceDataTest {
         "1.3.6.1.2.1.1.1.0|99|x; dev:1: unknown tag '99'",
         "1.3.6.1.2.1.1.1.0|4e|x; dev:1: unknown tag '4e'",
         "1.3.6.1.2.1.1.1.0|2|2147483648; dev:1: bad INTEGER value for 1.3.6.1.2.1.1.1.0: out of the INTEGER range: 2147483648",
-        "1.3.6.1.2.1.1.1.0|65|-1; dev:1: bad COUNTER32 value for 1.3.6.1.2.1.1.1.0: not an unsigned decimal number: '-1'",
-        "1.3.6.1.2.1.1.1.0|64|10.0.0.256; dev:1: bad IP_ADDRESS value for 1.3.6.1.2.1.1.1.0: not an IPv4 address: '10.0.0.256'",
         "1.3.6.1.2.1.1.1.0|4x|abc; dev:1: bad OCTET_STRING value for 1.3.6.1.2.1.1.1.0: odd number of hex digits",
-        "1.3.6.1.2.1.1.1.0|5|0; dev:1: bad NULL value for 1.3.6.1.2.1.1.1.0: a NULL value has no text: '0'",
-        "1.3.6.1.2.1.1.1.0|6|3.1; dev:1: bad OBJECT_IDENTIFIER value for 1.3.6.1.2.1.1.1.0: not an encodable OID value: '3.1'",
         "1.3.6.1.2..1|4|x; dev:1: bad OID '1.3.6.1.2..1': malformed object identifier '1.3.6.1.2..1'",
         "1.3.6.1.4294967296|4|x; dev:1: bad OID '1.3.6.1.4294967296': sub-identifier 4294967296 exceeds 4294967295",
         "# only a comment; dev:1: no objects in the data",
@@ -132,14 +98,5 @@ class DeviceDataTest {
         var error = assertThrows(DeviceDataException.class,
                 () -> DeviceData.parse("dev", content.replace("\\n", "\n")));
         assertEquals(message, error.getMessage());
-    }
-
-    @Test
-    void namesTheLoadedFileInErrors(@TempDir Path dir) throws Exception {
-        Path file = dir.resolve("device.data");
-        Files.writeString(file, "1.3.6.1.2.1.1.1.0|4|x\n1.3.6.1.2.1.1.1.0|4|y\n");
-        var error = assertThrows(DeviceDataException.class, () -> DeviceData.load(file));
-        assertEquals(file + ":2: duplicate OID 1.3.6.1.2.1.1.1.0 (first on line 1)", error.getMessage());
-        assertEquals(2, error.line());
     }
 }
