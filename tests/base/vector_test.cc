@@ -14,12 +14,19 @@ std::int8_t CompareData(const VectorNode* a, const VectorNode* b) {
 
 class VectorTest : public ::testing::Test {
  protected:
-  void SetUp() override { InitVector(&ordered_, &kOrdered); InitVector(&plain_, nullptr); }
-  void TearDown() override { FreeVector(&ordered_); FreeVector(&plain_); }
+  void SetUp() override {
+    InitVector(&ordered_, &kOrdered);
+    InitVector(&plain_, nullptr);
+  }
+  void TearDown() override {
+    FreeVector(&ordered_);
+    FreeVector(&plain_);
+  }
 
   static std::vector<std::uint64_t> Contents(Vector* vector) {
     std::vector<std::uint64_t> out;
-    for (VectorNode* node = GetElementAt(vector, 0); node; node = node->next) out.push_back(node->data);
+    for (VectorNode* node = GetElementAt(vector, 0); node; node = node->next)
+      out.push_back(node->data);
     return out;
   }
 
@@ -91,7 +98,8 @@ TEST_F(VectorTest, ConcurrentProducersAndConsumerLoseNothing) {
   std::vector<std::thread> producers;
   for (int t = 0; t < 4; ++t) {
     producers.emplace_back([this, t] {
-      for (int i = 0; i < kPerThread; ++i) AddElement(&plain_, NewVectorNode(t * kPerThread + i + 1));
+      for (int i = 0; i < kPerThread; ++i)
+        AddElement(&plain_, NewVectorNode(t * kPerThread + i + 1));
     });
   }
   std::uint64_t sum = 0;

@@ -86,7 +86,8 @@ TEST_F(AgentRegistryTest, AgentThatCannotOpenIsDroppedAndReported) {
   EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.0.0.99", 161)), 0);
   EXPECT_EQ(RegisteredAgentCount(), 0);
   EXPECT_FALSE(LookupAgentByAddress("127.0.0.99"));
-  const std::string refused = "Unable to start SNMP Agent at Port : 161 and at IpAddress : 127.0.0.99 ";
+  const std::string refused =
+      "Unable to start SNMP Agent at Port : 161 and at IpAddress : 127.0.0.99 ";
   EXPECT_THAT(host_.StatusLines(), ElementsAre(refused, refused));
 
   InstallSessionTransport(nullptr, nullptr);

@@ -26,12 +26,14 @@ VarValue Decode(const Bytes& binding, Oid* name = nullptr) {
   const std::uint8_t* value = nullptr;
   std::int32_t remaining = static_cast<std::int32_t>(binding.size());
   VarValue out = VarValue::Empty(0xFF);
-  if (ParseVarOp(binding.data(), ids.data(), &count, &type, &valueLength, &value, &remaining) == nullptr ||
+  if (ParseVarOp(binding.data(), ids.data(), &count, &type, &valueLength, &value, &remaining) ==
+          nullptr ||
       remaining != 0)
     return out;
   std::int32_t contentsLength = static_cast<std::int32_t>(binding.data() + binding.size() - value);
   const std::uint8_t* contents = AsnParseHeader(value, &contentsLength, &type);
-  if (contents == nullptr || !DecodeAsnSyntaxValue(type, contents, valueLength, &out)) return VarValue::Empty(0xFF);
+  if (contents == nullptr || !DecodeAsnSyntaxValue(type, contents, valueLength, &out))
+    return VarValue::Empty(0xFF);
   ids.resize(count);
   if (name != nullptr) *name = ids;
   return out;
@@ -66,14 +68,17 @@ TEST(BerTest, ValuesEncodeToTheseOctetsAndDecodeBack) {
       {VarValue::Unsigned(kAsnCounter, 0), {0x41, 0x01, 0x00}},
       {VarValue::Unsigned(kAsnTimeTicks, 0x8000), {0x43, 0x03, 0x00, 0x80, 0x00}},
       {VarValue::Unsigned(kAsnUInteger32, 0x7FFFFFFF), {0x47, 0x04, 0x7F, 0xFF, 0xFF, 0xFF}},
-      {VarValue::Unsigned(kAsnCounter64, 1ull << 63), {0x46, 0x09, 0x00, 0x80, 0, 0, 0, 0, 0, 0, 0}},
+      {VarValue::Unsigned(kAsnCounter64, 1ull << 63),
+       {0x46, 0x09, 0x00, 0x80, 0, 0, 0, 0, 0, 0, 0}},
       {VarValue::Unsigned(kAsnCounter64, 0x0100000000ull), {0x46, 0x05, 0x01, 0, 0, 0, 0}},
       {VarValue::ObjectId({1, 3, 6, 1}), {0x06, 0x03, 0x2B, 0x06, 0x01}},
-      {VarValue::ObjectId({1, 3, 128, 0xFFFFFFFF}), {0x06, 0x08, 0x2B, 0x81, 0x00, 0x8F, 0xFF, 0xFF, 0xFF, 0x7F}},
+      {VarValue::ObjectId({1, 3, 128, 0xFFFFFFFF}),
+       {0x06, 0x08, 0x2B, 0x81, 0x00, 0x8F, 0xFF, 0xFF, 0xFF, 0x7F}},
       {VarValue::ObjectId({2, 100}), {0x06, 0x02, 0x81, 0x34}},
       {VarValue::Octets(kAsnOctetString, ""), {0x04, 0x00}},
       {VarValue::Octets(kAsnOctetString, "ab"), {0x04, 0x02, 'a', 'b'}},
-      {VarValue::Octets(kAsnIpAddress, std::string("\x0A\x00\x00\x01", 4)), {0x40, 0x04, 0x0A, 0x00, 0x00, 0x01}},
+      {VarValue::Octets(kAsnIpAddress, std::string("\x0A\x00\x00\x01", 4)),
+       {0x40, 0x04, 0x0A, 0x00, 0x00, 0x01}},
       {VarValue::Octets(kAsnOpaque, "x"), {0x44, 0x01, 'x'}},
       {VarValue::Octets(kAsnNsapAddress, "y"), {0x45, 0x01, 'y'}},
       {VarValue::Octets(kAsnBitString, std::string("\x07\x80", 2)), {0x03, 0x02, 0x07, 0x80}},
@@ -92,18 +97,19 @@ TEST(BerTest, ValuesEncodeToTheseOctetsAndDecodeBack) {
 }
 
 TEST(BerTest, BuildRefusesWhatItCannotEncodeOrFit) {
-  EXPECT_TRUE(Encode(VarValue::Empty(0x01)).empty());                         // unknown type
-  EXPECT_TRUE(Encode(VarValue::Octets(kAsnBitString, "")).empty());           // no unused-bits octet
-  EXPECT_TRUE(Encode(VarValue::Octets(kAsnBitString, "\x08")).empty());       // 8 unused bits
+  EXPECT_TRUE(Encode(VarValue::Empty(0x01)).empty());                    // unknown type
+  EXPECT_TRUE(Encode(VarValue::Octets(kAsnBitString, "")).empty());      // no unused-bits octet
+  EXPECT_TRUE(Encode(VarValue::Octets(kAsnBitString, "\x08")).empty());  // 8 unused bits
   EXPECT_TRUE(Encode(VarValue::ObjectId(Oid(kMaxOidLength + 1, 1))).empty());
-  EXPECT_TRUE(Encode(VarValue::ObjectId({0xFFFFFFFF, 0})).empty());           // first two arcs overflow
+  EXPECT_TRUE(Encode(VarValue::ObjectId({0xFFFFFFFF, 0})).empty());  // first two arcs overflow
   EXPECT_EQ(Encode(VarValue::ObjectId(Oid(kMaxOidLength, 1)), 200).size(), 2u + 127u);
   const Bytes whole = {0x30, 0x82, 0x00, 0x07, 0x06, 0x01, 0x2B, 0x02, 0x02, 0x00, 0x80};
   for (std::int32_t room = 0; room <= 11; ++room) {
     Bytes buffer(static_cast<std::size_t>(room) + 1, 0xEE);  // one guard octet behind the room
     std::int32_t remaining = room;
     const Oid name = {1, 3};
-    std::uint8_t* end = BuildVarOp(buffer.data(), name.data(), 2, VarValue::Integer(128), &remaining);
+    std::uint8_t* end =
+        BuildVarOp(buffer.data(), name.data(), 2, VarValue::Integer(128), &remaining);
     EXPECT_EQ(buffer.back(), 0xEE) << room;
     EXPECT_EQ(end != nullptr, room == 11) << room;
     if (end != nullptr) {
@@ -120,7 +126,8 @@ TEST(BerTest, LengthsAndHeaders) {
   remaining = 3;
   EXPECT_EQ(AsnBuildSequence(buffer, &remaining, kAsnSequence, 5), nullptr);
   EXPECT_EQ(remaining, 3);
-  for (std::size_t length : {std::size_t{0x7F}, std::size_t{0x80}, std::size_t{0xFF}, std::size_t{0x100}, std::size_t{0xFFFF}}) {
+  for (std::size_t length : {std::size_t{0x7F}, std::size_t{0x80}, std::size_t{0xFF},
+                             std::size_t{0x100}, std::size_t{0xFFFF}}) {
     remaining = 8;
     std::uint8_t* end = AsnBuildLength(buffer, &remaining, length);
     ASSERT_NE(end, nullptr);
@@ -200,7 +207,8 @@ TEST(BerTest, ObjectIdentifierLimits) {
   const Bytes tooLong = encodedOid(kMaxOidLength + 1, {0x05});
   EXPECT_FALSE(DecodeAsnSyntaxValue(kAsnObjectId, tooLong.data(), tooLong.size(), &out));
   const Bytes subIdTooLarge = encodedOid(4, {0x90, 0x80, 0x80, 0x80, 0x00});  // 2^32
-  EXPECT_FALSE(DecodeAsnSyntaxValue(kAsnObjectId, subIdTooLarge.data(), subIdTooLarge.size(), &out));
+  EXPECT_FALSE(
+      DecodeAsnSyntaxValue(kAsnObjectId, subIdTooLarge.data(), subIdTooLarge.size(), &out));
   const Bytes unfinished = encodedOid(4, {0x81});
   EXPECT_FALSE(DecodeAsnSyntaxValue(kAsnObjectId, unfinished.data(), unfinished.size(), &out));
 
@@ -223,7 +231,9 @@ TEST(BerTest, TruncatedBindingsAreRefused) {
   const Bytes whole = Binding({0x06, 0x03, 0x2B, 0x06, 0x01}, {0x04, 0x03, 'a', 'b', 'c'});
   ASSERT_EQ(Decode(whole), VarValue::Octets(kAsnOctetString, "abc"));
   for (std::size_t cut = 0; cut < whole.size(); ++cut)
-    EXPECT_EQ(Decode(Bytes(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(cut))).type, 0xFF) << cut;
+    EXPECT_EQ(Decode(Bytes(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(cut))).type,
+              0xFF)
+        << cut;
   // The value may not run past its binding even when the message goes on.
   Bytes overrun = whole;
   overrun[1] = static_cast<std::uint8_t>(overrun[1] - 1);

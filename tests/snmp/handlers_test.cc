@@ -66,8 +66,8 @@ class HandlersTest : public ::testing::Test {
     table_.isTable = true;
     table_.oid = {1, 3, 6, 1, 2, 1, 2, 2};
     table_.subIds = {1, 2, 3, 4, 5, 6};
-    table_.dataTypes = {kAsnOctetString, kAsnInteger, kAsnCounter64, kAsnOctetString, kAsnOctetString,
-                        kAsnIpAddress};
+    table_.dataTypes = {kAsnOctetString, kAsnInteger,     kAsnCounter64,
+                        kAsnOctetString, kAsnOctetString, kAsnIpAddress};
     table_.syntaxes = {"", "", "", "DateAndTime", "MacAddress", ""};
     table_.hasSyntaxes = true;
   }
@@ -107,13 +107,16 @@ TEST_F(HandlersTest, ScalarGetAsksForTheGroupAndInstanceZero) {
 
 TEST_F(HandlersTest, ScalarMissingValues) {
   Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
-  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}), std::nullopt);
+  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}),
+            std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
   EXPECT_EQ(host_.last.previousSubId, "3");
   host_.SetError("1.3.6.1.2.1.1.5.0", "5");
-  EXPECT_EQ(ScalarProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &system_}), std::nullopt);
+  EXPECT_EQ(ScalarProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &system_}),
+            std::nullopt);
   EXPECT_EQ(errorCode_, kReadOnly);  // a Get keeps the host's code
-  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}), std::nullopt);
+  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}),
+            std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
 }
 
@@ -144,14 +147,17 @@ TEST_F(HandlersTest, TableGetConvertsByColumnType) {
       {1, "'xy'h", VarValue::Octets(kAsnOctetString, "'xy'h")},
       {6, "10.0.0.1", VarValue::Octets(kAsnIpAddress, "\x0A\x00\x00\x01"s)},
       {6, "10.0.0.256", std::nullopt},
-      {4, "2024-5-6,7:8:9.1,+2:0", VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01+\x02\x00"s)},
-      {4, "2024-5-6,7:8:9.1", VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01"s)},
+      {4, "2024-5-6,7:8:9.1,+2:0",
+       VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01+\x02\x00"s)},
+      {4, "2024-5-6,7:8:9.1",
+       VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01"s)},
       {4, "2024-5-6,7:8", std::nullopt},
   };
   for (const Case& c : cases) {
     host_.SetValue("1.3.6.1.2.1.2.2.1." + std::to_string(c.column) + ".10.0.0.1.161", c.text);
     Oid oid = Column(c.column, {10, 0, 0, 1, 161});
-    EXPECT_EQ(TableProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &table_}), c.value) << c.text;
+    EXPECT_EQ(TableProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &table_}), c.value)
+        << c.text;
     EXPECT_EQ(errorCode_, c.value ? 0 : kGenErr) << c.text;
     EXPECT_EQ(host_.last.instance, ".10.0.0.1.161");
     EXPECT_EQ(host_.last.objectOid, ".1.3.6.1.2.1.2.2.1");
@@ -161,12 +167,16 @@ TEST_F(HandlersTest, TableGetConvertsByColumnType) {
 TEST(TextToVarValueTest, OtherTypes) {
   EXPECT_EQ(TextToVarValue(kAsnObjectId, "", "1.3.6"), VarValue::ObjectId({1, 3, 6}));
   EXPECT_EQ(TextToVarValue(kAsnObjectId, "", ".1.3.6"), VarValue::ObjectId({1, 3, 6}));
-  EXPECT_EQ(TextToVarValue(kAsnGauge, "", "4294967295"), VarValue::Unsigned(kAsnGauge, 0xFFFFFFFFu));
-  EXPECT_EQ(TextToVarValue(kAsnOpaque, "", "00:1a:2b:3c:4d:5e"), VarValue::Octets(kAsnOpaque, "00:1a:2b:3c:4d:5e"));
+  EXPECT_EQ(TextToVarValue(kAsnGauge, "", "4294967295"),
+            VarValue::Unsigned(kAsnGauge, 0xFFFFFFFFu));
+  EXPECT_EQ(TextToVarValue(kAsnOpaque, "", "00:1a:2b:3c:4d:5e"),
+            VarValue::Octets(kAsnOpaque, "00:1a:2b:3c:4d:5e"));
   EXPECT_EQ(TextToVarValue(kAsnNull, "", "anything"), VarValue::Empty(kAsnNull));
-  EXPECT_EQ(TextToVarValue(0x99, "", "2024-5-6,7:8:9.1"), VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01"s));
+  EXPECT_EQ(TextToVarValue(0x99, "", "2024-5-6,7:8:9.1"),
+            VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01"s));
   // A BIT STRING's contents start with its count of unused bits, 0 to 7.
-  EXPECT_EQ(TextToVarValue(kAsnBitString, "", "'0380'h"), VarValue::Octets(kAsnBitString, "\x03\x80"s));
+  EXPECT_EQ(TextToVarValue(kAsnBitString, "", "'0380'h"),
+            VarValue::Octets(kAsnBitString, "\x03\x80"s));
   EXPECT_EQ(TextToVarValue(kAsnBitString, "", "'08ff'h"), std::nullopt);
   EXPECT_EQ(TextToVarValue(kAsnBitString, "", ""), std::nullopt);
 }
@@ -174,7 +184,8 @@ TEST(TextToVarValueTest, OtherTypes) {
 TEST_F(HandlersTest, TableGetNextFollowsTheHostAnswer) {
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.3", "7");
   Oid oid = Column(2);
-  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}), VarValue::Integer(7));
+  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
+            VarValue::Integer(7));
   EXPECT_EQ(errorCode_, 0);
   EXPECT_EQ(oid, Column(2, {3}));
   EXPECT_EQ(host_.last.instance, std::nullopt);
@@ -184,7 +195,8 @@ TEST_F(HandlersTest, TableGetNextFollowsTheHostAnswer) {
   EXPECT_EQ(host_.last.agentPort, 161);
 
   oid = Column(6, {1});  // last column: nothing after it, and the host has nothing
-  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}), std::nullopt);
+  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
+            std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
   EXPECT_EQ(host_.last.nextColumn, -1);
   EXPECT_EQ(host_.last.nextDataType, 0);
@@ -201,7 +213,8 @@ TEST_F(HandlersTest, TableGetNextRefusesUnusableAnswers) {
   for (const HostAnswer& answer : answers) {
     host_.fixedNext = answer;
     Oid oid = Column(2, {3});
-    EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}), std::nullopt);
+    EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
+              std::nullopt);
     EXPECT_EQ(errorCode_, kNoSuchInstance);
     EXPECT_EQ(oid, Column(2, {3}));
   }
@@ -219,7 +232,8 @@ TEST_F(HandlersTest, TableSetRendersTheValueForTheColumn) {
       {1, VarValue::Octets(kAsnOctetString, ""), ""},
       {2, VarValue::Integer(-12), "-12"},
       {3, VarValue::Unsigned(kAsnCounter64, (1ull << 32) + 5), "4294967301"},
-      {4, VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01+\x02\x00"s), "2024-5-6,7:8:9.1,+2:0"},
+      {4, VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01+\x02\x00"s),
+       "2024-5-6,7:8:9.1,+2:0"},
       {5, VarValue::Octets(kAsnOctetString, "\x00\x1A\x2B\x3C\x4D\x5E"s), "00:1a:2b:3c:4d:5e"},
       {6, VarValue::Octets(kAsnIpAddress, "\x0A\x00\x00\x01"s), "10.0.0.1"},
   };
@@ -239,9 +253,12 @@ TEST_F(HandlersTest, TableSetRefusals) {
     VarValue value;
     std::uint8_t errorCode;
   } cases[] = {
-      {Column(4, {5}), VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01+"s), kBadValue},
-      {Column(4, {5}), VarValue::Octets(kAsnOctetString, "\x07\xE8\x0D\x06\x07\x08\x09\x01"s), kBadValue},
-      {Column(4, {5}), VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01*\x02\x00"s), kBadValue},
+      {Column(4, {5}), VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01+"s),
+       kBadValue},
+      {Column(4, {5}), VarValue::Octets(kAsnOctetString, "\x07\xE8\x0D\x06\x07\x08\x09\x01"s),
+       kBadValue},
+      {Column(4, {5}),
+       VarValue::Octets(kAsnOctetString, "\x07\xE8\x05\x06\x07\x08\x09\x01*\x02\x00"s), kBadValue},
       {Column(2, {5}), VarValue::Octets(kAsnOctetString, "A"), 7},  // wrongType
       {Column(1, {5}), VarValue::Integer(1), 7},
       {Column(2), VarValue::Integer(1), kNoSuchInstance},

@@ -28,12 +28,14 @@ class PduProcessingTest : public SnmpAgentTest {
     return names;
   }
 
-  SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions, std::vector<std::string> oids) {
+  SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions,
+               std::vector<std::string> oids) {
     Request request;
     request.type = kGetBulkRequest;
     request.field1 = nonRepeaters;
     request.field2 = maxRepetitions;
-    for (const std::string& oid : oids) request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
+    for (const std::string& oid : oids)
+      request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
     auto reply = Send(request);
     EXPECT_TRUE(reply);
     return reply.value_or(SnmpPdu{});
@@ -41,10 +43,11 @@ class PduProcessingTest : public SnmpAgentTest {
 };
 
 const std::vector<std::string> kWholeMib = {
-    "1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.1.2.0", "1.3.6.1.2.1.1.3.0", "1.3.6.1.2.1.1.4.0",
-    "1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.1.6.0", "1.3.6.1.2.1.1.7.0", "1.3.6.1.2.1.2.2.1.1.1",
-    "1.3.6.1.2.1.2.2.1.1.2", "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.2.2", "1.3.6.1.2.1.2.2.1.10.1",
-    "1.3.6.1.2.1.2.2.1.10.2", "1.3.6.1.2.1.31.1.1.1.1.1", "1.3.6.1.2.1.31.1.1.1.1.2",
+    "1.3.6.1.2.1.1.1.0",        "1.3.6.1.2.1.1.2.0",        "1.3.6.1.2.1.1.3.0",
+    "1.3.6.1.2.1.1.4.0",        "1.3.6.1.2.1.1.5.0",        "1.3.6.1.2.1.1.6.0",
+    "1.3.6.1.2.1.1.7.0",        "1.3.6.1.2.1.2.2.1.1.1",    "1.3.6.1.2.1.2.2.1.1.2",
+    "1.3.6.1.2.1.2.2.1.2.1",    "1.3.6.1.2.1.2.2.1.2.2",    "1.3.6.1.2.1.2.2.1.10.1",
+    "1.3.6.1.2.1.2.2.1.10.2",   "1.3.6.1.2.1.31.1.1.1.1.1", "1.3.6.1.2.1.31.1.1.1.1.2",
     "1.3.6.1.2.1.31.1.1.1.6.1", "1.3.6.1.2.1.31.1.1.1.6.2"};
 
 TEST_F(PduProcessingTest, WalkVisitsEveryObjectInOrderAcrossCellsAndColumns) {
@@ -146,10 +149,12 @@ TEST_F(PduProcessingTest, SetWritesInCellOrderAndStopsAfterAFailure) {
 TEST_F(PduProcessingTest, GetBulkRepeatsTheRepeatersAfterTheNonRepeaters) {
   SnmpPdu reply = Bulk(1, 3, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1", "1.3.6.1.2.1.2.2.1.2"});
   std::vector<std::string> names;
-  for (const VarBind& binding : reply.requestVarBinds) names.push_back(OidToPlainText(binding.name));
-  EXPECT_EQ(names, (std::vector<std::string>{"1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1", "1.3.6.1.2.1.2.2.1.2.1",
-                                             "1.3.6.1.2.1.2.2.1.1.2", "1.3.6.1.2.1.2.2.1.2.2",
-                                             "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.10.1"}));
+  for (const VarBind& binding : reply.requestVarBinds)
+    names.push_back(OidToPlainText(binding.name));
+  EXPECT_EQ(names, (std::vector<std::string>{"1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1",
+                                             "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.1.2",
+                                             "1.3.6.1.2.1.2.2.1.2.2", "1.3.6.1.2.1.2.2.1.2.1",
+                                             "1.3.6.1.2.1.2.2.1.10.1"}));
   EXPECT_EQ(Bulk(1, 0, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 1u);
   EXPECT_EQ(Bulk(-5, -1, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 0u);
   EXPECT_EQ(Bulk(-5, 2, {"1.3.6.1.2.1.1.1"}).requestVarBinds.size(), 2u);
@@ -170,7 +175,8 @@ TEST_F(PduProcessingTest, GetBulkReplyIsTrimmedOnlyAtItsEnd) {
   EXPECT_LE(lastReply_.size(), kMaxSnmpMessage);
   EXPECT_GT(lastReply_.size(), kMaxSnmpMessage - 200);
   for (std::size_t i = 0; i < reply.requestVarBinds.size(); ++i) {
-    EXPECT_EQ(OidToPlainText(reply.requestVarBinds[i].name), "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
+    EXPECT_EQ(OidToPlainText(reply.requestVarBinds[i].name),
+              "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
   }
 }
 

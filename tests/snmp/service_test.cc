@@ -1,12 +1,11 @@
 #include "snmp/service.h"
 
 #include <arpa/inet.h>
+#include <gtest/gtest.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
-
-#include <gtest/gtest.h>
 
 #include "engine/agent_registry.h"
 #include "engine/engine_state.h"
@@ -38,23 +37,25 @@ class Manager {
   ~Manager() { close(socket_); }
 
   // Sends the datagram and waits (at most two seconds) for one answer; its source in *from.
-  std::optional<SnmpPdu> Ask(const std::vector<std::uint8_t>& datagram, const char* agent, std::uint16_t port,
-                             std::string* from = nullptr) {
+  std::optional<SnmpPdu> Ask(const std::vector<std::uint8_t>& datagram, const char* agent,
+                             std::uint16_t port, std::string* from = nullptr) {
     sockaddr_in to = Address(agent, port);
-    sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to), sizeof to);
+    sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
+           sizeof to);
     pollfd ready{socket_, POLLIN, 0};
     if (poll(&ready, 1, 2000) != 1) return std::nullopt;
     std::vector<std::uint8_t> reply(kMaxSnmpMessage);
     sockaddr_in source{};
     socklen_t sourceLength = sizeof source;
-    ssize_t length = recvfrom(socket_, reply.data(), reply.size(), 0, reinterpret_cast<sockaddr*>(&source),
-                              &sourceLength);
+    ssize_t length = recvfrom(socket_, reply.data(), reply.size(), 0,
+                              reinterpret_cast<sockaddr*>(&source), &sourceLength);
     if (length <= 0) return std::nullopt;
     char text[INET_ADDRSTRLEN] = {};
     inet_ntop(AF_INET, &source.sin_addr, text, sizeof text);
     if (from) *from = std::string(text) + ":" + std::to_string(ntohs(source.sin_port));
     SnmpPdu pdu;
-    if (ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1) return std::nullopt;
+    if (ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1)
+      return std::nullopt;
     return pdu;
   }
 
@@ -137,7 +138,8 @@ TEST_F(ServiceTest, PortServedByAnotherSocketIsRefused) {
   ASSERT_EQ(bind(other, reinterpret_cast<sockaddr*>(&taken), sizeof taken), 0);
   EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.77.0.5", kBasePort + 20)), 0);
   EXPECT_EQ(host_.StatusLines().back(),
-            "Unable to start SNMP Agent at Port : " + std::to_string(kBasePort + 20) + " and at IpAddress : 127.77.0.5 ");
+            "Unable to start SNMP Agent at Port : " + std::to_string(kBasePort + 20) +
+                " and at IpAddress : 127.77.0.5 ");
   close(other);
 }
 

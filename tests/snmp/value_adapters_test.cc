@@ -28,11 +28,24 @@ class ValueAdaptersTest : public ::testing::Test {
 };
 
 TEST(GetSnmpErrorStatusTest, MapsHostNumbersToEngineCodes) {
-  const std::pair<const char*, std::uint8_t> cases[] = {
-      {"-1", 0},  {"0", 1},   {"1", kNoSuchObject}, {"2", kNoSuchInstance}, {"3", kEndOfMibView},
-      {"4", 3},   {"5", 4},   {"6", 5},             {"7", 6},               {"8", 8},
-      {"13", 13}, {"18", 18}, {"19", 5},            {"abc", 5},             {"", 5},
-      {"-2", 5},  {"017", 5}, {"99999999999999999999", 5}};
+  const std::pair<const char*, std::uint8_t> cases[] = {{"-1", 0},
+                                                        {"0", 1},
+                                                        {"1", kNoSuchObject},
+                                                        {"2", kNoSuchInstance},
+                                                        {"3", kEndOfMibView},
+                                                        {"4", 3},
+                                                        {"5", 4},
+                                                        {"6", 5},
+                                                        {"7", 6},
+                                                        {"8", 8},
+                                                        {"13", 13},
+                                                        {"18", 18},
+                                                        {"19", 5},
+                                                        {"abc", 5},
+                                                        {"", 5},
+                                                        {"-2", 5},
+                                                        {"017", 5},
+                                                        {"99999999999999999999", 5}};
   for (const auto& [text, code] : cases) EXPECT_EQ(GetSnmpErrorStatus(text), code) << text;
 }
 

@@ -154,8 +154,8 @@ struct Encryption {
   std::string cipher;
 };
 
-Encryption Encrypt(PrivProtocol priv, std::string_view key, std::uint32_t boots,
-                   std::uint32_t time, std::string_view plain) {
+Encryption Encrypt(PrivProtocol priv, std::string_view key, std::uint32_t boots, std::uint32_t time,
+                   std::string_view plain) {
   Encryption result{};
   std::vector<std::uint8_t> cipher;
   EXPECT_TRUE(EncryptScopedPdu(priv, key, boots, time,

@@ -50,10 +50,14 @@ struct ProtocolCase {
 
 TEST_F(UsmUsersTest, ProtocolNamesDecideLevelOrRefusal) {
   const ProtocolCase cases[] = {
-      {"NO_AUTH", "NO_PRIV", 1, kNoAuthNoPriv},   {"SHA_AUTH", "NO_PRIV", 1, kAuthNoPriv},
-      {"MD5_AUTH", "CFB_AES_128", 1, kAuthPriv},  {"NO_AUTH", "CBC_DES", 0, 0},
-      {"md5_auth", "NO_PRIV", 0, 0},              {"", "NO_PRIV", 0, 0},
-      {"MD5_AUTH", "AES", 0, 0},                  {"SHA_AUTH", "CBC_DES ", 0, 0},
+      {"NO_AUTH", "NO_PRIV", 1, kNoAuthNoPriv},
+      {"SHA_AUTH", "NO_PRIV", 1, kAuthNoPriv},
+      {"MD5_AUTH", "CFB_AES_128", 1, kAuthPriv},
+      {"NO_AUTH", "CBC_DES", 0, 0},
+      {"md5_auth", "NO_PRIV", 0, 0},
+      {"", "NO_PRIV", 0, 0},
+      {"MD5_AUTH", "AES", 0, 0},
+      {"SHA_AUTH", "CBC_DES ", 0, 0},
   };
   int n = 0;
   for (const ProtocolCase& c : cases) {

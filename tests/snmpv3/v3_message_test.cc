@@ -43,7 +43,9 @@ class Encoder {
     bytes.insert(bytes.end(), value.begin(), value.end());
     return bytes.size() - value.size();
   }
-  void Raw(const std::vector<std::uint8_t>& raw) { bytes.insert(bytes.end(), raw.begin(), raw.end()); }
+  void Raw(const std::vector<std::uint8_t>& raw) {
+    bytes.insert(bytes.end(), raw.begin(), raw.end());
+  }
   std::vector<std::uint8_t> bytes;
 };
 
@@ -71,7 +73,8 @@ std::vector<std::uint8_t> Encode(const V3Request& r) {
   std::size_t list = pdu.Open(kAsnSequence);
   std::vector<std::uint8_t> binding(64);
   std::int32_t room = 64;
-  std::uint8_t* end = BuildVarOp(binding.data(), r.name.data(), r.name.size(), VarValue::Empty(kAsnNull), &room);
+  std::uint8_t* end =
+      BuildVarOp(binding.data(), r.name.data(), r.name.size(), VarValue::Empty(kAsnNull), &room);
   binding.resize(static_cast<std::size_t>(end - binding.data()));
   pdu.Raw(binding);
   pdu.Close(list);
@@ -104,7 +107,8 @@ std::vector<std::uint8_t> Encode(const V3Request& r) {
   m.Close(outer);
   if (!r.authKey.empty()) {
     std::uint8_t digest[12];
-    EXPECT_TRUE(CalculateDigest(AuthProtocol::kMd5, r.authKey, m.bytes.data(), m.bytes.size(), digest));
+    EXPECT_TRUE(
+        CalculateDigest(AuthProtocol::kMd5, r.authKey, m.bytes.data(), m.bytes.size(), digest));
     std::copy(digest, digest + 12, m.bytes.begin() + static_cast<std::ptrdiff_t>(digestAt));
   }
   return m.bytes;
@@ -149,7 +153,8 @@ class V3MessageTest : public SnmpAgentTest {
   std::optional<SnmpPdu> Exchange3(const std::vector<std::uint8_t>& datagram) {
     std::vector<std::uint8_t> reply(kMaxSnmpMessage);
     std::size_t length = reply.size();
-    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply.data(), &length, agent_) != kMessageReply) {
+    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply.data(), &length, agent_) !=
+        kMessageReply) {
       return std::nullopt;
     }
     reply.resize(length);
@@ -177,7 +182,8 @@ class V3MessageTest : public SnmpAgentTest {
     SnmpPdu pdu;
     PduLayout layout;
     std::int32_t rest = static_cast<std::int32_t>(reply.data() + length - scoped);
-    if (ParseSnmpPdu(reply.data(), scoped, rest, &pdu, &layout, false) != ParseResult::kParsed) return std::nullopt;
+    if (ParseSnmpPdu(reply.data(), scoped, rest, &pdu, &layout, false) != ParseResult::kParsed)
+      return std::nullopt;
     return pdu;
   }
 

@@ -84,7 +84,8 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   Oid entryOid = ToOid(query.objectOid);
   Oid columnOid = entryOid;
   columnOid.push_back(static_cast<std::uint32_t>(query.column));
-  Oid from = ToOid(query.objectOid + "." + std::to_string(query.column) + query.instance.value_or(""));
+  Oid from =
+      ToOid(query.objectOid + "." + std::to_string(query.column) + query.instance.value_or(""));
   std::lock_guard<std::mutex> lock(mutex_);
   auto next = query.instance ? objects_.upper_bound(from) : objects_.lower_bound(from);
   if (next == objects_.end() || next->first.size() <= columnOid.size() ||
@@ -94,7 +95,7 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   std::span<const std::uint32_t> relative(next->first.data() + entryOid.size(),
                                           next->first.size() - entryOid.size());
   return std::vector<std::optional<std::string>>{next->second.value, OidToPlainText(relative),
-                                                  next->second.error};
+                                                 next->second.error};
 }
 
 HostAnswer MemoryHost::TableSetOidVal(const HostValueQuery& query) {

@@ -45,7 +45,8 @@ std::vector<std::uint8_t> EncodeRequest(const Request& request) {
   std::uint8_t* cursor = AsnBuildSequence(start, &remaining, kAsnSequence, 0);
   cursor = AsnBuildInt(cursor, &remaining, kAsnInteger, request.version);
   cursor = AsnBuildString(cursor, &remaining, kAsnOctetString,
-                          reinterpret_cast<const std::uint8_t*>(request.community.data()), request.community.size());
+                          reinterpret_cast<const std::uint8_t*>(request.community.data()),
+                          request.community.size());
   std::uint8_t* pdu = cursor;
   cursor = AsnBuildSequence(cursor, &remaining, request.type, 0);
   cursor = AsnBuildInt(cursor, &remaining, kAsnInteger, request.requestId);
@@ -72,13 +73,19 @@ std::vector<std::uint8_t> EncodeRequest(const Request& request) {
 void SnmpAgentTest::SetUp() {
   FreeTreeCells();
   ResetSnmpStatistics();
-  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq, TableProcessWriteReq);
+  SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
+                         TableProcessWriteReq);
   InstallHost(&host_);
   RegisterCell("system", "1.3.6.1.2.1.1.1", false,
-           {{"1", "4", kRo}, {"2", "6", kRo}, {"3", "67", kRo}, {"4", "4", kRw},
-            {"5", "4", kRw}, {"6", "4", kRw}, {"7", "2", kRo}});
+               {{"1", "4", kRo},
+                {"2", "6", kRo},
+                {"3", "67", kRo},
+                {"4", "4", kRw},
+                {"5", "4", kRw},
+                {"6", "4", kRw},
+                {"7", "2", kRo}});
   RegisterCell("ifEntry", "1.3.6.1.2.1.2.2.1", true,
-           {{"1", "2", kRo}, {"2", "4", kRo}, {"10", "65", kRo}});
+               {{"1", "2", kRo}, {"2", "4", kRo}, {"10", "65", kRo}});
   RegisterCell("ifXEntry", "1.3.6.1.2.1.31.1.1.1", true, {{"1", "4", kRw}, {"6", "70", kRo}});
   StoreTreeCellsRefInArray();
   host_.SetValue("1.3.6.1.2.1.1.1.0", "Tessel router");
@@ -116,7 +123,8 @@ void SnmpAgentTest::TearDown() {
 std::optional<SnmpPdu> SnmpAgentTest::Exchange(const std::vector<std::uint8_t>& datagram) {
   lastReply_.assign(kMaxSnmpMessage, 0);
   std::size_t length = lastReply_.size();
-  int result = ProcessSnmpMessage(datagram.data(), datagram.size(), lastReply_.data(), &length, agent_);
+  int result =
+      ProcessSnmpMessage(datagram.data(), datagram.size(), lastReply_.data(), &length, agent_);
   if (result != kMessageReply) return std::nullopt;
   lastReply_.resize(length);
   SnmpPdu reply;
