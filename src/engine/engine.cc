@@ -2,6 +2,7 @@
 
 #include <sys/resource.h>
 
+#include <cstdio>
 #include <mutex>
 
 #include "base/stop_signal.h"
@@ -52,11 +53,22 @@ void StopSnmpLocked(Lifecycle& lifecycle) {
   FreeTreeCells();
 }
 
-// Every started agent holds a socket: the engine may use as many descriptors as the hard limit
-// allows.
+// Every started agent holds a socket: the engine raises its descriptor limit as far as the system
+// allows (root may raise the hard limit too), else to the hard limit.
 void RaiseDescriptorLimit() {
   rlimit limit{};
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= limit.rlim_max) return;
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  rlim_t systemMaximum = 1048576;
+  if (std::FILE* file = std::fopen("/proc/sys/fs/nr_open", "r")) {
+    unsigned long value = 0;
+    if (std::fscanf(file, "%lu", &value) == 1 && value > 0) systemMaximum = value;
+    std::fclose(file);
+  }
+  if (limit.rlim_max < systemMaximum) {
+    rlimit raised{systemMaximum, systemMaximum};
+    if (setrlimit(RLIMIT_NOFILE, &raised) == 0) return;
+  }
+  if (limit.rlim_cur >= limit.rlim_max) return;
   limit.rlim_cur = limit.rlim_max;
   if (setrlimit(RLIMIT_NOFILE, &limit) != 0) LOG_ERROR("Unable to raise the descriptor limit\n");
 }
