@@ -196,14 +196,26 @@ std::int32_t RegisterAgentInfo(const AgentRegistration& registration) {
   return registration.agentId;
 }
 
+namespace {
+
+// The agent a start or stop names; applies the trap-port rule on the way, as every start and
+// stop does. registry.sessions.end() when there is none.
+std::vector<std::unique_ptr<AgentSession>>::iterator FindForStartOrStop(Registry& registry,
+                                                                        const std::string& address,
+                                                                        std::int32_t port) {
+  if (registry.sessions.empty()) return registry.sessions.end();
+  ApplyTrapPortRule(static_cast<std::uint16_t>(port));
+  return FindSessionLocked(registry, address, port);
+}
+
+}  // namespace
+
 bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t engineBoots) {
   LOG_TRACE("\n\t@@@@@ Inside StartAgent() @@@@@ \n");
   Registry& registry = TheRegistry();
   {
     std::lock_guard<std::mutex> lock(registry.mutex);
-    if (registry.sessions.empty()) return false;
-    ApplyTrapPortRule(static_cast<std::uint16_t>(port));
-    auto found = FindSessionLocked(registry, address, port);
+    auto found = FindForStartOrStop(registry, address, port);
     if (found == registry.sessions.end()) {
       LOG_TRACE("The td Info cannot be obtained for %s\n", address.c_str());
       return false;
@@ -232,9 +244,7 @@ bool StopAgent(const std::string& address, std::int32_t port) {
   LOG_TRACE("\n\t@@@@@ Inside StopAgent() @@@@@ \n");
   Registry& registry = TheRegistry();
   std::lock_guard<std::mutex> lock(registry.mutex);
-  if (registry.sessions.empty()) return false;
-  ApplyTrapPortRule(static_cast<std::uint16_t>(port));
-  auto found = FindSessionLocked(registry, address, port);
+  auto found = FindForStartOrStop(registry, address, port);
   if (found == registry.sessions.end()) {
     LOG_ERROR("The tdInfo cannot be obtained for %s while stop agent\n", address.c_str());
     return false;
