@@ -6,11 +6,11 @@
 
 #include <array>
 #include <atomic>
-#include <condition_variable>
-#include <deque>
 #include <memory>
 #include <mutex>
 #include <new>
+#include <optional>
+#include <span>
 #include <thread>
 
 #include "base/clock.h"
@@ -21,56 +21,15 @@
 #include "snmp/statistics.h"
 #include "transport/agent_sockets.h"
 #include "transport/udp.h"
+#include "transport/udp_batch.h"
 
 namespace tessel {
 namespace {
 
-// One received datagram with the session it arrived for; belongs to the worker that takes it.
-struct RcvdInfo {
-  std::vector<std::uint8_t> data;
-  AgentSession session;
-  bool viaWildcard = false;
-};
-
-// A FIFO of received datagrams; Pop blocks until there is one or the queue is stopped.
-class RequestQueue {
- public:
-  void Push(std::unique_ptr<RcvdInfo> item) {
-    {
-      std::lock_guard<std::mutex> lock(mutex_);
-      items_.push_back(std::move(item));
-    }
-    ready_.notify_one();
-  }
-  std::unique_ptr<RcvdInfo> Pop() {
-    std::unique_lock<std::mutex> lock(mutex_);
-    ready_.wait(lock, [this] { return stopped_ || !items_.empty(); });
-    if (stopped_) return nullptr;
-    std::unique_ptr<RcvdInfo> item = std::move(items_.front());
-    items_.pop_front();
-    return item;
-  }
-  void Start() {
-    std::lock_guard<std::mutex> lock(mutex_);
-    stopped_ = false;
-    items_.clear();
-  }
-  // Wakes every waiting worker; datagrams still queued are dropped.
-  void Stop() {
-    {
-      std::lock_guard<std::mutex> lock(mutex_);
-      stopped_ = true;
-      items_.clear();
-    }
-    ready_.notify_all();
-  }
-
- private:
-  std::mutex mutex_;
-  std::condition_variable ready_;
-  std::deque<std::unique_ptr<RcvdInfo>> items_;
-  bool stopped_ = false;
-};
+// Tags of epoll events besides agent sockets (whose tag is their descriptor, below 2^32).
+constexpr std::uint64_t kStopTag = 1ull << 32;
+constexpr std::uint64_t kWildcardTag = 2ull << 32;
+constexpr std::uint64_t kDescriptorMask = 0xFFFFFFFFull;
 
 // The engine-wide sockets: IPv4 and IPv6 wildcards on the SNMP port and the notification socket.
 struct WildcardSockets {
@@ -82,12 +41,10 @@ struct WildcardSockets {
 };
 
 struct Service {
-  std::array<RequestQueue, kRequestQueues> queues;
-  std::array<std::atomic<int>, kRequestQueues> liveWorkers{};
   std::vector<std::thread> threads;
-  std::atomic<std::uint32_t> nextQueue{0};
+  std::atomic<int> liveThreads{0};
   int stopEvent = -1;
-  int wildcardEpoll = -1;
+  int wildcardEpoll = -1;  // the first shard's epoll
   WildcardSockets wildcards;
 };
 
@@ -96,10 +53,10 @@ Service& TheService() {
   return service;
 }
 
-bool Readable(int epoll, int descriptor) {
+bool Readable(int epoll, int descriptor, std::uint64_t tag) {
   epoll_event event{};
   event.events = EPOLLIN;
-  event.data.fd = descriptor;
+  event.data.u64 = tag | static_cast<std::uint64_t>(descriptor);
   return epoll_ctl(epoll, EPOLL_CTL_ADD, descriptor, &event) == 0;
 }
 
@@ -140,7 +97,7 @@ void StartSnmpAgentService(Service& service) {
   if (trapPort == 0 || trapPort == port) trapPort = static_cast<std::uint16_t>(port + 1u);
   wildcards.notify = OpenWildcard("0.0.0.0", trapPort, false, false);
   for (int socket : {wildcards.ipv4, wildcards.ipv6}) {
-    if (socket >= 0) Readable(service.wildcardEpoll, socket);
+    if (socket >= 0) Readable(service.wildcardEpoll, socket, kWildcardTag);
   }
 }
 
@@ -158,50 +115,47 @@ bool ReleaseWildcardPort(std::uint16_t port) {
 
 // ---- Threads ----
 
-void Worker(int queue) {
-  Service& service = TheService();
-  while (std::unique_ptr<RcvdInfo> item = service.queues[static_cast<std::size_t>(queue)].Pop()) {
-    try {
-      ProcessRcvdSnmpReq(item->data.data(), item->data.size(), item->session, item->viaWildcard);
-    } catch (const std::bad_alloc&) {
-      LOG_ERROR("Unable to allocate buffer !!! \n");
+// What one service thread reuses from request to request.
+struct ThreadState {
+  UdpBatch batch;
+  AgentSession request;  // the agent's session with the peer of the request at hand
+  std::vector<std::uint8_t> buffer = std::vector<std::uint8_t>(kUdpReceiveBuffer);
+};
+
+// Answers what a ready agent socket holds: one batch in, one batch out. One batch per wake-up,
+// so that one busy agent cannot starve the others of its shard.
+void ServeAgentSocket(int descriptor, ThreadState& state) {
+  std::shared_ptr<const AgentSocket> agent = FindAgentSocket(descriptor);
+  if (!agent) return;
+  UdpBatch& batch = state.batch;
+  std::size_t count = batch.Receive(agent->Descriptor());
+  if (count == 0) return;
+  state.request = agent->Session();
+  for (std::size_t i = 0; i < count; ++i) {
+    SetPeer(batch.Peer(i), &state.request.transport);
+    std::span<const std::uint8_t> datagram = batch.Datagram(i);
+    LOG_TRACE("Received Packet from %s : at %d", state.request.transport.peerAddress.c_str(),
+              state.request.transport.peerPort);
+    std::size_t replyLength = batch.ReplyCapacity();
+    if (ProcessSnmpMessage(datagram.data(), datagram.size(), batch.ReplyBuffer(i), &replyLength,
+                           state.request) != kMessageReply) {
+      LOG_ERROR("ProcessSnmpPDU() is failed. ");
+    } else if (replyLength > 0) {
+      LOG_TRACE("The length of the pkt to send is %zu", replyLength);
+      batch.QueueReply(i, replyLength);
     }
   }
-  service.liveWorkers[static_cast<std::size_t>(queue)].fetch_sub(1);
+  batch.SendQueued(agent->Descriptor());
 }
 
-// Waits on epoll for readable sockets until the stop event; hands each to `serve`.
-template <typename Serve>
-void ReceiveLoop(int epoll, int stopEvent, Serve serve) {
-  std::array<epoll_event, 64> events;
-  for (;;) {
-    int ready = epoll_wait(epoll, events.data(), static_cast<int>(events.size()), -1);
-    if (ready < 0 && errno != EINTR) LOG_ERROR("Error in response select %d", errno);
-    for (int i = 0; i < ready; ++i) {
-      if (events[static_cast<std::size_t>(i)].data.fd == stopEvent) return;
-      serve(events[static_cast<std::size_t>(i)].data.fd);
-    }
-  }
-}
-
-// Reads what a ready socket holds (a bounded batch, so that one busy agent cannot starve the
-// others) and queues it.
-void ServeAgentSocket(int socket) {
-  thread_local std::vector<std::uint8_t> buffer(kUdpReceiveBuffer);
-  for (int batch = 0; batch < 32; ++batch) {
-    AgentSession session;
-    std::size_t length = 0;
-    if (!ReadAgentDatagram(socket, buffer.data(), buffer.size(), &length, &session)) return;
-    CreateRcvdInfo(session, buffer.data(), length, false);
-  }
-}
-
-void ServeWildcardSocket(int socket) {
-  thread_local std::vector<std::uint8_t> buffer(kUdpReceiveBuffer);
+// A datagram for any registered agent, which need not have a socket of its own: answered from
+// the address it was sent to.
+void ServeWildcardSocket(int socket, ThreadState& state) {
   for (int batch = 0; batch < 32; ++batch) {
     TransportDomainInfo received;
     std::size_t length = 0;
-    if (!ReadUdpPacket(socket, buffer.data(), buffer.size(), &length, &received)) return;
+    if (!ReadUdpPacket(socket, state.buffer.data(), state.buffer.size(), &length, &received))
+      return;
     if (received.localAddress.empty()) {
       LOG_ERROR("The agent address is NULL. Hence skipping this packet.");
       continue;
@@ -217,24 +171,51 @@ void ServeWildcardSocket(int socket) {
     agent->transport.peerPort = received.peerPort;
     agent->transport.peerSockAddr = received.peerSockAddr;
     agent->transport.localAddress = received.localAddress;
-    CreateRcvdInfo(*agent, buffer.data(), length, true);
+    try {
+      ProcessRcvdSnmpReq(state.buffer.data(), length, *agent, true);
+    } catch (const std::bad_alloc&) {
+      LOG_ERROR("Unable to allocate buffer !!! \n");
+    }
   }
 }
 
-void StartThreads(Service& service) {
-  for (int queue = 0; queue < kRequestQueues; ++queue) {
-    service.queues[static_cast<std::size_t>(queue)].Start();
-    service.liveWorkers[static_cast<std::size_t>(queue)] = kWorkersPerQueue;
-    for (int i = 0; i < kWorkersPerQueue; ++i) service.threads.emplace_back(Worker, queue);
+// Waits on the shard's epoll until the stop event; serves each ready socket on this thread.
+void ServiceThread(int epoll) {
+  auto state = std::make_unique<ThreadState>();
+  std::array<epoll_event, 64> events;
+  for (bool running = true; running;) {
+    int ready = epoll_wait(epoll, events.data(), static_cast<int>(events.size()), -1);
+    if (ready < 0 && errno != EINTR) LOG_ERROR("Error in response select %d", errno);
+    for (int i = 0; i < ready; ++i) {
+      std::uint64_t tag = events[static_cast<std::size_t>(i)].data.u64;
+      auto descriptor = static_cast<int>(tag & kDescriptorMask);
+      try {
+        if (tag == (kStopTag | static_cast<std::uint64_t>(TheService().stopEvent))) {
+          running = false;
+        } else if ((tag & ~kDescriptorMask) == kWildcardTag) {
+          ServeWildcardSocket(descriptor, *state);
+        } else {
+          ServeAgentSocket(descriptor, *state);
+        }
+      } catch (const std::bad_alloc&) {
+        LOG_ERROR("Unable to allocate buffer !!! \n");
+      }
+    }
   }
-  LOG_TRACE("InitThreads with %d", kWorkersPerQueue);
-  int agentEpoll = AgentSocketsEpoll();
-  Readable(agentEpoll, service.stopEvent);
-  Readable(service.wildcardEpoll, service.stopEvent);
-  service.threads.emplace_back(ReceiveLoop<void (*)(int)>, agentEpoll, service.stopEvent,
-                               ServeAgentSocket);
-  service.threads.emplace_back(ReceiveLoop<void (*)(int)>, service.wildcardEpoll, service.stopEvent,
-                               ServeWildcardSocket);
+  TheService().liveThreads.fetch_sub(1);
+}
+
+bool StartThreads(Service& service) {
+  int shards = AgentSocketShards();
+  for (int shard = 0; shard < shards; ++shard) {
+    int epoll = AgentSocketsEpoll(shard);
+    if (epoll < 0 || !Readable(epoll, service.stopEvent, kStopTag)) return false;
+  }
+  LOG_TRACE("InitThreads with %d", shards);
+  service.liveThreads = shards;
+  for (int shard = 0; shard < shards; ++shard)
+    service.threads.emplace_back(ServiceThread, AgentSocketsEpoll(shard));
+  return true;
 }
 
 }  // namespace
@@ -250,16 +231,19 @@ bool InitSnmpGeneralServices() {
   if (!service.threads.empty()) return true;
   // Agent uptimes and the SNMPv3 engine time count from here.
   SetClockBase();
-  service.nextQueue = 0;
   service.stopEvent = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-  service.wildcardEpoll = epoll_create1(EPOLL_CLOEXEC);
+  service.wildcardEpoll = AgentSocketsEpoll(0);
   if (service.stopEvent < 0 || service.wildcardEpoll < 0) {
     LOG_ERROR("Unable to create Thread");
     StopSnmpGeneralServices();
     return false;
   }
   StartSnmpAgentService(service);
-  StartThreads(service);
+  if (!StartThreads(service)) {
+    LOG_ERROR("Unable to create Thread");
+    StopSnmpGeneralServices();
+    return false;
+  }
   return true;
 }
 
@@ -268,34 +252,21 @@ void StopSnmpGeneralServices() {
   if (service.stopEvent >= 0) {
     std::uint64_t one = 1;
     if (write(service.stopEvent, &one, sizeof one) < 0)
-      LOG_ERROR("Unable to wake the receive threads");
+      LOG_ERROR("Unable to wake the service threads");
   }
-  for (RequestQueue& queue : service.queues) queue.Stop();
   for (std::thread& thread : service.threads) thread.join();
   service.threads.clear();
   {
     std::lock_guard<std::mutex> lock(service.wildcards.mutex);
     CloseWildcardsLocked(service);
   }
-  int agentEpoll = AgentSocketsEpoll();
-  if (service.stopEvent >= 0) epoll_ctl(agentEpoll, EPOLL_CTL_DEL, service.stopEvent, nullptr);
-  for (int* descriptor : {&service.stopEvent, &service.wildcardEpoll}) {
-    if (*descriptor >= 0) close(*descriptor);
-    *descriptor = -1;
+  if (service.stopEvent >= 0) {
+    for (int shard = 0; shard < AgentSocketShards(); ++shard)
+      epoll_ctl(AgentSocketsEpoll(shard), EPOLL_CTL_DEL, service.stopEvent, nullptr);
+    close(service.stopEvent);
   }
-}
-
-bool CreateRcvdInfo(const AgentSession& session, const std::uint8_t* data, std::size_t length,
-                    bool viaWildcard) {
-  auto item = std::make_unique<RcvdInfo>();
-  item->data.assign(data, data + length);
-  item->session = session;
-  item->viaWildcard = viaWildcard;
-  if (session.agentInfo) session.agentInfo->engineTime = GetUptime(false);
-  Service& service = TheService();
-  std::uint32_t queue = service.nextQueue.fetch_add(1) % kRequestQueues;
-  service.queues[queue].Push(std::move(item));
-  return true;
+  service.stopEvent = -1;
+  service.wildcardEpoll = -1;
 }
 
 bool ProcessRcvdSnmpReq(const std::uint8_t* data, std::size_t length, const AgentSession& session,
@@ -313,10 +284,6 @@ bool ProcessRcvdSnmpReq(const std::uint8_t* data, std::size_t length, const Agen
                        replyLength, viaWildcard);
 }
 
-std::vector<int> LiveWorkerCounts() {
-  std::vector<int> counts;
-  for (const auto& live : TheService().liveWorkers) counts.push_back(live.load());
-  return counts;
-}
+int LiveServiceThreads() { return TheService().liveThreads.load(); }
 
 }  // namespace tessel

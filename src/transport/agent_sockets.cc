@@ -1,8 +1,11 @@
 #include "transport/agent_sockets.h"
 
+#include <sched.h>
 #include <sys/epoll.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <mutex>
 #include <shared_mutex>
@@ -15,10 +18,12 @@ namespace tessel {
 namespace {
 
 struct AgentSockets {
-  std::shared_mutex mutex;  // shared: reading a socket; exclusive: opening or closing one
-  int epoll = -1;
-  std::unordered_map<int, AgentSession> sessions;
+  std::shared_mutex mutex;  // shared: finding a socket; exclusive: opening or closing one
+  std::array<int, kMaxAgentShards> epolls;
+  std::unordered_map<int, std::shared_ptr<const AgentSocket>> sockets;
   std::function<bool(std::uint16_t)> releaser;
+  std::uint32_t nextShard = 0;
+  AgentSockets() { epolls.fill(-1); }
 };
 
 AgentSockets& Sockets() {
@@ -26,9 +31,16 @@ AgentSockets& Sockets() {
   return sockets;
 }
 
-int EpollLocked(AgentSockets& sockets) {
-  if (sockets.epoll < 0) sockets.epoll = epoll_create1(EPOLL_CLOEXEC);
-  return sockets.epoll;
+int EpollLocked(AgentSockets& sockets, int shard) {
+  int& epoll = sockets.epolls[static_cast<std::size_t>(shard)];
+  if (epoll < 0) epoll = epoll_create1(EPOLL_CLOEXEC);
+  return epoll;
+}
+
+int CpusAvailable() {
+  cpu_set_t cpus;
+  if (sched_getaffinity(0, sizeof cpus, &cpus) != 0) return 1;
+  return CPU_COUNT(&cpus);
 }
 
 int BindAgent(const AgentSession& session, std::uint16_t port, int* error) {
@@ -38,6 +50,16 @@ int BindAgent(const AgentSession& session, std::uint16_t port, int* error) {
 }
 
 }  // namespace
+
+AgentSocket::AgentSocket(int descriptor, int shard, AgentSession session)
+    : descriptor_(descriptor), shard_(shard), session_(std::move(session)) {}
+
+AgentSocket::~AgentSocket() { CloseUdpSocket(descriptor_); }
+
+int AgentSocketShards() {
+  static const int shards = std::clamp(CpusAvailable(), 1, kMaxAgentShards);
+  return shards;
+}
 
 std::int64_t OpenAgentSocket(AgentSession& session) {
   // Agents keep their configured port minus one; each binds its own configured port.
@@ -52,10 +74,12 @@ std::int64_t OpenAgentSocket(AgentSession& session) {
     lock.lock();
   }
   if (socket < 0) return 0;
-  int epoll = EpollLocked(sockets);
+  int shard =
+      static_cast<int>(sockets.nextShard++ % static_cast<std::uint32_t>(AgentSocketShards()));
+  int epoll = EpollLocked(sockets, shard);
   epoll_event event{};
   event.events = EPOLLIN;
-  event.data.fd = socket;
+  event.data.u64 = static_cast<std::uint64_t>(socket);
   if (epoll < 0 || epoll_ctl(epoll, EPOLL_CTL_ADD, socket, &event) != 0) {
     LOG_ERROR("Unable to watch the socket of %s", session.transport.localAddress.c_str());
     CloseUdpSocket(socket);
@@ -64,39 +88,37 @@ std::int64_t OpenAgentSocket(AgentSession& session) {
   AgentSession copy = session;
   copy.socket = socket;
   copy.transport.socket = socket;
-  sockets.sessions[socket] = std::move(copy);
+  sockets.sockets[socket] = std::make_shared<const AgentSocket>(socket, shard, std::move(copy));
   return socket;
 }
 
 void CloseAgentSocket(std::int64_t socket) {
+  std::shared_ptr<const AgentSocket> closing;
   AgentSockets& sockets = Sockets();
-  std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-  auto found = sockets.sessions.find(static_cast<int>(socket));
-  if (found == sockets.sessions.end()) return;
-  if (sockets.epoll >= 0) epoll_ctl(sockets.epoll, EPOLL_CTL_DEL, found->first, nullptr);
-  CloseUdpSocket(found->first);
-  sockets.sessions.erase(found);
+  {
+    std::unique_lock<std::shared_mutex> lock(sockets.mutex);
+    auto found = sockets.sockets.find(static_cast<int>(socket));
+    if (found == sockets.sockets.end()) return;
+    closing = std::move(found->second);
+    sockets.sockets.erase(found);
+    int epoll = sockets.epolls[static_cast<std::size_t>(closing->Shard())];
+    if (epoll >= 0) epoll_ctl(epoll, EPOLL_CTL_DEL, closing->Descriptor(), nullptr);
+  }
+  // The descriptor closes here, or when a service thread answering it lets go.
 }
 
-int AgentSocketsEpoll() {
+int AgentSocketsEpoll(int shard) {
+  if (shard < 0 || shard >= AgentSocketShards()) return -1;
   AgentSockets& sockets = Sockets();
   std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-  return EpollLocked(sockets);
+  return EpollLocked(sockets, shard);
 }
 
-bool ReadAgentDatagram(int socket, std::uint8_t* buffer, std::size_t capacity, std::size_t* length,
-                       AgentSession* session) {
+std::shared_ptr<const AgentSocket> FindAgentSocket(int socket) {
   AgentSockets& sockets = Sockets();
   std::shared_lock<std::shared_mutex> lock(sockets.mutex);
-  auto found = sockets.sessions.find(socket);
-  if (found == sockets.sessions.end()) return false;
-  TransportDomainInfo peer;
-  if (!ReadUdpPacket(socket, buffer, capacity, length, &peer)) return false;
-  *session = found->second;
-  session->transport.peerAddress = std::move(peer.peerAddress);
-  session->transport.peerPort = peer.peerPort;
-  session->transport.peerSockAddr = peer.peerSockAddr;
-  return true;
+  auto found = sockets.sockets.find(socket);
+  return found == sockets.sockets.end() ? nullptr : found->second;
 }
 
 void SetPortReleaser(std::function<bool(std::uint16_t port)> releaser) {

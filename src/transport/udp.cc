@@ -181,6 +181,11 @@ bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::
   return true;
 }
 
+void SetPeer(const sockaddr_storage& peer, TransportDomainInfo* transport) {
+  transport->peerSockAddr = peer;
+  transport->peerAddress = AddressText(peer, &transport->peerPort);
+}
+
 bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes,
                    std::size_t length, bool fromLocalAddress) {
   iovec data{const_cast<std::uint8_t*>(bytes), length};

@@ -30,6 +30,9 @@ void CloseUdpSocket(int socket);
 bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::size_t* length,
                    TransportDomainInfo* transport);
 
+// Makes peer the transport's peer: its socket address, address text and port.
+void SetPeer(const sockaddr_storage& peer, TransportDomainInfo* transport);
+
 // Sends to the transport's peer. With fromLocalAddress the datagram leaves from the transport's
 // localAddress even on a wildcard socket. Tries three times.
 bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes,

@@ -11,6 +11,7 @@
 #include "engine/engine_state.h"
 #include "snmp/message.h"
 #include "support/snmp_agent_fixture.h"
+#include "transport/agent_sockets.h"
 
 namespace tessel {
 namespace {
@@ -99,7 +100,7 @@ TEST_F(ServiceTest, EveryAgentAnswersFromItsOwnAddressAndPort) {
   ASSERT_TRUE(InitSnmpGeneralServices());
   Manager manager;
   std::string from;
-  for (int round = 0; round < 3; ++round) {  // spread over several queues
+  for (int round = 0; round < 3; ++round) {
     auto first = manager.Ask(GetSysName(), "127.77.0.1", kBasePort, &from);
     ASSERT_TRUE(first);
     EXPECT_EQ(first->requestVarBinds.at(0).value, VarValue::Octets(kAsnOctetString, "r1"));
@@ -112,7 +113,7 @@ TEST_F(ServiceTest, EveryAgentAnswersFromItsOwnAddressAndPort) {
   EXPECT_FALSE(manager.Ask(GetSysName(), "127.77.0.1", kBasePort));
   EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.2", kBasePort + 1));
   StopSnmpGeneralServices();
-  for (int live : LiveWorkerCounts()) EXPECT_EQ(live, 0);
+  EXPECT_EQ(LiveServiceThreads(), 0);
 }
 
 TEST_F(ServiceTest, WildcardSocketAnswersRegisteredAgentsFromTheirAddress) {
@@ -147,11 +148,11 @@ TEST_F(ServiceTest, StopEndsEveryThreadAndTheServiceStartsAgain) {
   ASSERT_GT(FillAgentInfoAndStartAgent(Agent("127.77.0.3", kBasePort + 30)), 0);
   for (int cycle = 0; cycle < 2; ++cycle) {
     ASSERT_TRUE(InitSnmpGeneralServices());
-    for (int live : LiveWorkerCounts()) EXPECT_EQ(live, kWorkersPerQueue);
+    EXPECT_EQ(LiveServiceThreads(), AgentSocketShards());
     Manager manager;
     EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.3", kBasePort + 30));
     StopSnmpGeneralServices();
-    for (int live : LiveWorkerCounts()) EXPECT_EQ(live, 0);
+    EXPECT_EQ(LiveServiceThreads(), 0);
   }
 }
 
