@@ -2,6 +2,9 @@
 
 #include <algorithm>
 #include <new>
+#include <shared_mutex>
+#include <string_view>
+#include <unordered_map>
 
 #include "engine/log.h"
 
@@ -139,6 +142,47 @@ bool ForEachElement(JNIEnv* env, jobjectArray array, Body body) {
   return true;
 }
 
+// Java strings for the texts that recur in value calls (labels, OIDs, agent names and
+// addresses): made once, held by global references for the life of the process, so a call
+// creates Java strings only for its variable texts. Bounded: past kMaxEntries texts are no
+// longer kept.
+class InternedStrings {
+ public:
+  static constexpr std::size_t kMaxEntries = 1 << 18;
+
+  // A global reference to the Java string for text, or nullptr when none is kept.
+  jstring Find(std::string_view text) const {
+    std::shared_lock<std::shared_mutex> lock(mutex_);
+    auto found = strings_.find(text);
+    return found == strings_.end() ? nullptr : found->second;
+  }
+  // Keeps local (a Java string for text) and returns the kept reference; nullptr when full.
+  jstring Keep(JNIEnv* env, std::string_view text, jstring local) {
+    std::unique_lock<std::shared_mutex> lock(mutex_);
+    auto found = strings_.find(text);
+    if (found != strings_.end()) return found->second;
+    if (strings_.size() >= kMaxEntries) return nullptr;
+    auto global = static_cast<jstring>(env->NewGlobalRef(local));
+    if (global != nullptr) strings_.emplace(std::string(text), global);
+    return global;
+  }
+
+ private:
+  struct Hash {
+    using is_transparent = void;
+    std::size_t operator()(std::string_view text) const {
+      return std::hash<std::string_view>{}(text);
+    }
+  };
+  mutable std::shared_mutex mutex_;
+  std::unordered_map<std::string, jstring, Hash, std::equal_to<>> strings_;
+};
+
+InternedStrings& Interned() {
+  static auto* strings = new InternedStrings();  // never destroyed: outlives every call
+  return *strings;
+}
+
 template <typename T>
 class NoDestructor {
  public:
@@ -232,6 +276,22 @@ class JavaArguments {
   JavaArguments& Text(const std::optional<std::string>& text) {
     return text ? Text(*text) : Null();
   }
+  // A text that recurs from call to call: passed as its kept Java string.
+  JavaArguments& Constant(const std::string& text) {
+    jvalue value;
+    value.l = Interned().Find(text);
+    if (value.l == nullptr) {
+      jstring local = StringToJava(env_, text);
+      value.l = local == nullptr ? nullptr : Interned().Keep(env_, text, local);
+      if (value.l == nullptr) value.l = local;
+    }
+    failed_ = failed_ || value.l == nullptr;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Constant(const std::optional<std::string>& text) {
+    return text ? Constant(*text) : Null();
+  }
   JavaArguments& Int(std::int32_t number) {
     jvalue value;
     value.i = number;
@@ -244,13 +304,17 @@ class JavaArguments {
     values_.push_back(value);
     return *this;
   }
+  // Scalars' ".0" recurs; table instances vary with every row.
+  JavaArguments& Instance(const std::optional<std::string>& instance) {
+    return instance && *instance == ".0" ? Constant(*instance) : Text(instance);
+  }
   // The trailing arguments every value method ends with.
   JavaArguments& AgentTail(const HostValueQuery& query) {
     return Int(query.agentId)
         .Int(query.rowStatusColumn)
-        .Text(query.agentAddress)
+        .Constant(query.agentAddress)
         .Int(query.agentPort)
-        .Text(query.syntax);
+        .Constant(query.syntax);
   }
   bool Failed() const { return failed_; }
   const jvalue* Values() const { return values_.data(); }
@@ -409,6 +473,15 @@ std::shared_ptr<const HandlerBinding> JniHost::Handler() const {
 
 std::optional<std::string> JniHost::ToCpp(JNIEnv* env, jstring text) {
   if (text == nullptr) return std::nullopt;
+  // Plain ASCII (1..127) is the only case where the UTF-16 length equals the modified UTF-8
+  // length; its bytes are the text's own and need no trip through the host.
+  jsize units = env->GetStringLength(text);
+  if (env->GetStringUTFLength(text) == units) {
+    std::string ascii(static_cast<std::size_t>(units) + 1, '\0');
+    env->GetStringUTFRegion(text, 0, units, ascii.data());
+    ascii.resize(static_cast<std::size_t>(units));
+    return ascii;
+  }
   jobject bytes = nullptr;
   if (std::shared_ptr<const SimulatorBinding> simulator = Simulator()) {
     bytes = env->CallObjectMethod(simulator->object.Get(), simulator->getBytes, text);
@@ -473,8 +546,9 @@ namespace {
 
 // Scalar and table Get pass the same arguments.
 void FillGetArguments(JavaArguments& a, const HostValueQuery& query) {
-  a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
-  a.Text(query.databaseName).Text(query.tableName).Int(query.dataType).AgentTail(query);
+  a.Constant(query.label).Constant(query.objectOid).Constant(query.subId);
+  a.Instance(query.instance);
+  a.Constant(query.databaseName).Constant(query.tableName).Int(query.dataType).AgentTail(query);
 }
 
 }  // namespace
@@ -485,20 +559,21 @@ HostAnswer JniHost::ScalarGetOidVal(const HostValueQuery& query) {
 
 HostAnswer JniHost::ScalarGetNextOidVal(const HostValueQuery& query) {
   return CallValueMethod(kScalarGetNext, [&](JavaArguments& a) {
-    a.Text(query.label)
-        .Text(query.objectOid)
-        .Text(query.subId)
-        .Text(query.instance)
-        .Text(query.previousSubId);
-    a.Text(query.databaseName).Text(query.tableName).Int(query.dataType).AgentTail(query);
+    a.Constant(query.label)
+        .Constant(query.objectOid)
+        .Constant(query.subId)
+        .Instance(query.instance)
+        .Constant(query.previousSubId);
+    a.Constant(query.databaseName).Constant(query.tableName).Int(query.dataType).AgentTail(query);
   });
 }
 
 HostAnswer JniHost::SetOidVal(const HostValueQuery& query) {
   return CallValueMethod(kScalarSet, [&](JavaArguments& a) {
-    a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
-    a.Text(query.databaseName)
-        .Text(query.tableName)
+    a.Constant(query.label).Constant(query.objectOid).Constant(query.subId);
+    a.Instance(query.instance);
+    a.Constant(query.databaseName)
+        .Constant(query.tableName)
         .Text(query.valueText)
         .Int(query.dataType)
         .AgentTail(query);
@@ -511,16 +586,17 @@ HostAnswer JniHost::TableGetOidVal(const HostValueQuery& query) {
 
 HostAnswer JniHost::TableGetNextOidVal(const HostValueQuery& query) {
   return CallValueMethod(kTableGetNext, [&](JavaArguments& a) {
-    a.Text(query.label).Text(query.objectOid).Text(query.instance);
+    a.Constant(query.label).Constant(query.objectOid).Instance(query.instance);
     a.Int(query.column).Int(query.nextColumn).Int(query.dataType).Int(query.nextDataType);
-    a.Text(query.databaseName).Text(query.tableName).AgentTail(query);
+    a.Constant(query.databaseName).Constant(query.tableName).AgentTail(query);
   });
 }
 
 HostAnswer JniHost::TableSetOidVal(const HostValueQuery& query) {
   return CallValueMethod(kTableSet, [&](JavaArguments& a) {
-    a.Text(query.label).Text(query.objectOid).Text(query.subId).Text(query.instance);
-    a.Text(query.databaseName).Text(query.tableName).Text(query.valueText);
+    a.Constant(query.label).Constant(query.objectOid).Constant(query.subId);
+    a.Instance(query.instance);
+    a.Constant(query.databaseName).Constant(query.tableName).Text(query.valueText);
     for (int i = 0; i < 6; ++i) a.Null();  // the host's row arrays, which the engine never fills
     a.Int(query.dataType).AgentTail(query);
   });
