@@ -16,6 +16,14 @@
 
 namespace tessel {
 
+// A peer's socket address, IPv4 or IPv6 (family in any.sa_family). Smaller than a
+// sockaddr_storage by a hundred bytes, which every stored session would carry.
+union PeerSocketAddress {
+  sockaddr any;
+  sockaddr_in v4;
+  sockaddr_in6 v6;
+};
+
 struct TransportDomainInfo {
   std::uint16_t localPort = 0;  // agents: the configured port minus one
   std::uint16_t peerPort = 0;
@@ -26,7 +34,7 @@ struct TransportDomainInfo {
   std::int32_t ipv6SocketCreated = 0;
   std::int32_t ipv6Bound = 0;
   std::int32_t lastBindError = 0;
-  sockaddr_storage peerSockAddr{};
+  PeerSocketAddress peerSockAddr{};
 };
 
 class CommunityList {

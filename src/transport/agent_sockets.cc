@@ -9,7 +9,7 @@
 #include <cerrno>
 #include <mutex>
 #include <shared_mutex>
-#include <unordered_map>
+#include <vector>
 
 #include "engine/log.h"
 #include "transport/udp.h"
@@ -20,7 +20,8 @@ namespace {
 struct AgentSockets {
   std::shared_mutex mutex;  // shared: finding a socket; exclusive: opening or closing one
   std::array<int, kMaxAgentShards> epolls;
-  std::unordered_map<int, std::shared_ptr<const AgentSocket>> sockets;
+  // Indexed by descriptor: descriptors are small and dense, and the lookup is on every request.
+  std::vector<std::shared_ptr<const AgentSocket>> sockets;
   std::function<bool(std::uint16_t)> releaser;
   std::uint32_t nextShard = 0;
   AgentSockets() { epolls.fill(-1); }
@@ -88,7 +89,9 @@ std::int64_t OpenAgentSocket(AgentSession& session) {
   AgentSession copy = session;
   copy.socket = socket;
   copy.transport.socket = socket;
-  sockets.sockets[socket] = std::make_shared<const AgentSocket>(socket, shard, std::move(copy));
+  auto index = static_cast<std::size_t>(socket);
+  if (index >= sockets.sockets.size()) sockets.sockets.resize(index + 1);
+  sockets.sockets[index] = std::make_shared<const AgentSocket>(socket, shard, std::move(copy));
   return socket;
 }
 
@@ -97,10 +100,9 @@ void CloseAgentSocket(std::int64_t socket) {
   AgentSockets& sockets = Sockets();
   {
     std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-    auto found = sockets.sockets.find(static_cast<int>(socket));
-    if (found == sockets.sockets.end()) return;
-    closing = std::move(found->second);
-    sockets.sockets.erase(found);
+    if (socket < 0 || static_cast<std::size_t>(socket) >= sockets.sockets.size()) return;
+    closing = std::move(sockets.sockets[static_cast<std::size_t>(socket)]);
+    if (!closing) return;
     int epoll = sockets.epolls[static_cast<std::size_t>(closing->Shard())];
     if (epoll >= 0) epoll_ctl(epoll, EPOLL_CTL_DEL, closing->Descriptor(), nullptr);
   }
@@ -117,8 +119,8 @@ int AgentSocketsEpoll(int shard) {
 std::shared_ptr<const AgentSocket> FindAgentSocket(int socket) {
   AgentSockets& sockets = Sockets();
   std::shared_lock<std::shared_mutex> lock(sockets.mutex);
-  auto found = sockets.sockets.find(socket);
-  return found == sockets.sockets.end() ? nullptr : found->second;
+  if (socket < 0 || static_cast<std::size_t>(socket) >= sockets.sockets.size()) return nullptr;
+  return sockets.sockets[static_cast<std::size_t>(socket)];
 }
 
 void SetPortReleaser(std::function<bool(std::uint16_t port)> releaser) {

@@ -57,18 +57,20 @@ bool ConfigureSocket(int socket, bool ipv6, const UdpBindOptions& options) {
   return fcntl(socket, F_SETFL, fcntl(socket, F_GETFL) | O_NONBLOCK) == 0;
 }
 
-std::string AddressText(const sockaddr_storage& address, std::uint16_t* port) {
+std::string AddressText(const PeerSocketAddress& address, std::uint16_t* port) {
   char text[INET6_ADDRSTRLEN] = {};
-  if (address.ss_family == AF_INET6) {
-    const auto& v6 = reinterpret_cast<const sockaddr_in6&>(address);
-    inet_ntop(AF_INET6, &v6.sin6_addr, text, sizeof text);
-    *port = ntohs(v6.sin6_port);
+  if (address.any.sa_family == AF_INET6) {
+    inet_ntop(AF_INET6, &address.v6.sin6_addr, text, sizeof text);
+    *port = ntohs(address.v6.sin6_port);
   } else {
-    const auto& v4 = reinterpret_cast<const sockaddr_in&>(address);
-    inet_ntop(AF_INET, &v4.sin_addr, text, sizeof text);
-    *port = ntohs(v4.sin_port);
+    inet_ntop(AF_INET, &address.v4.sin_addr, text, sizeof text);
+    *port = ntohs(address.v4.sin_port);
   }
   return text;
+}
+
+socklen_t AddressLength(const PeerSocketAddress& address) {
+  return address.any.sa_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
 }
 
 // The destination address that IP_PKTINFO / IPV6_PKTINFO reported, if any.
@@ -182,8 +184,9 @@ bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::
 }
 
 void SetPeer(const sockaddr_storage& peer, TransportDomainInfo* transport) {
-  transport->peerSockAddr = peer;
-  transport->peerAddress = AddressText(peer, &transport->peerPort);
+  std::memcpy(&transport->peerSockAddr, &peer,
+              peer.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
+  transport->peerAddress = AddressText(transport->peerSockAddr, &transport->peerPort);
 }
 
 bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::uint8_t* bytes,
@@ -191,13 +194,12 @@ bool SendUdpPacket(const TransportDomainInfo& transport, int socket, const std::
   iovec data{const_cast<std::uint8_t*>(bytes), length};
   alignas(cmsghdr) char control[64];
   msghdr message{};
-  message.msg_name = const_cast<sockaddr_storage*>(&transport.peerSockAddr);
-  message.msg_namelen =
-      transport.peerSockAddr.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
+  message.msg_name = const_cast<PeerSocketAddress*>(&transport.peerSockAddr);
+  message.msg_namelen = AddressLength(transport.peerSockAddr);
   message.msg_iov = &data;
   message.msg_iovlen = 1;
   if (fromLocalAddress) {
-    bool ipv6 = transport.peerSockAddr.ss_family == AF_INET6;
+    bool ipv6 = transport.peerSockAddr.any.sa_family == AF_INET6;
     message.msg_controllen = SourceControl(transport.localAddress, ipv6, control, sizeof control);
     if (message.msg_controllen > 0) message.msg_control = control;
   }
