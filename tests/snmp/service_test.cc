@@ -7,6 +7,8 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <set>
+
 #include "engine/agent_registry.h"
 #include "engine/engine_state.h"
 #include "snmp/message.h"
@@ -38,6 +40,23 @@ class Manager {
   ~Manager() { close(socket_); }
 
   // Sends the datagram and waits (at most two seconds) for one answer; its source in *from.
+  void Send(const std::vector<std::uint8_t>& datagram, const char* agent, std::uint16_t port) {
+    sockaddr_in to = Address(agent, port);
+    sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
+           sizeof to);
+  }
+  // The next answer within two seconds.
+  std::optional<SnmpPdu> Receive() {
+    pollfd ready{socket_, POLLIN, 0};
+    if (poll(&ready, 1, 2000) != 1) return std::nullopt;
+    std::vector<std::uint8_t> reply(kMaxSnmpMessage);
+    ssize_t length = recv(socket_, reply.data(), reply.size(), 0);
+    SnmpPdu pdu;
+    if (length <= 0 || ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1)
+      return std::nullopt;
+    return pdu;
+  }
+
   std::optional<SnmpPdu> Ask(const std::vector<std::uint8_t>& datagram, const char* agent,
                              std::uint16_t port, std::string* from = nullptr) {
     sockaddr_in to = Address(agent, port);
@@ -114,6 +133,33 @@ TEST_F(ServiceTest, EveryAgentAnswersFromItsOwnAddressAndPort) {
   EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.2", kBasePort + 1));
   StopSnmpGeneralServices();
   EXPECT_EQ(LiveServiceThreads(), 0);
+}
+
+// Requests that queue up on one socket are read and answered in batches; a malformed one in
+// between is dropped without disturbing the answers around it.
+TEST_F(ServiceTest, QueuedRequestsAreAllAnsweredToTheirOwnRequestIds) {
+  ASSERT_GT(FillAgentInfoAndStartAgent(Agent("127.77.0.4", kBasePort + 40)), 0);
+  ASSERT_TRUE(InitSnmpGeneralServices());
+  Manager manager;
+  std::set<std::int32_t> expected;
+  for (std::int32_t id = 1; id <= 40; ++id) {
+    if (id == 20) {
+      manager.Send({0x30, 0x03, 0x02, 0x01}, "127.77.0.4", kBasePort + 40);
+      continue;
+    }
+    Request request;
+    request.requestId = id;
+    request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
+    manager.Send(EncodeRequest(request), "127.77.0.4", kBasePort + 40);
+    expected.insert(id);
+  }
+  std::set<std::int32_t> answered;
+  while (std::optional<SnmpPdu> reply = manager.Receive()) {
+    EXPECT_EQ(reply->requestVarBinds.at(0).value, VarValue::Octets(kAsnOctetString, "r1"));
+    answered.insert(reply->requestId);
+    if (answered.size() == expected.size()) break;
+  }
+  EXPECT_EQ(answered, expected);
 }
 
 TEST_F(ServiceTest, WildcardSocketAnswersRegisteredAgentsFromTheirAddress) {
