@@ -1,5 +1,6 @@
 #include "engine/agent_registry.h"
 
+#include <algorithm>
 #include <cstdio>
 #include <memory>
 #include <mutex>
@@ -57,12 +58,9 @@ void CloseSocketLocked(Registry& registry, std::int64_t socket) {
   if (socket != 0 && registry.closer) registry.closer(socket);
 }
 
-// gv_maxSocket only ever grows, as the receive loop sizes its socket sets from it.
-void UpdateMaxSocketLocked(Registry& registry) {
-  for (const auto& session : registry.sessions) {
-    if (session->transport.socket > registry.maxSocket)
-      registry.maxSocket = session->transport.socket;
-  }
+// The largest socket handle seen; it only ever grows.
+void NoteSocketLocked(Registry& registry, std::int64_t socket) {
+  registry.maxSocket = std::max(registry.maxSocket, socket);
 }
 
 std::vector<std::unique_ptr<AgentSession>>::iterator FindSessionLocked(Registry& registry,
@@ -132,7 +130,7 @@ std::int64_t OpenAndKeepLocked(Registry& registry, std::unique_ptr<AgentSession>
   session->transport.socket = socket;
   registry.addressTable.insert_or_assign(address, CopyAgentSession(*session));
   registry.sessions.push_back(std::move(session));
-  UpdateMaxSocketLocked(registry);
+  NoteSocketLocked(registry, socket);
   return socket;
 }
 
@@ -230,7 +228,7 @@ bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t eng
       session.agentInfo->started = 1;
       session.agentInfo->engineBoots = engineBoots;
       LOG_TRACE("The engine boot count value @ start is : %ld\n", static_cast<long>(engineBoots));
-      UpdateMaxSocketLocked(registry);
+      NoteSocketLocked(registry, socket);
       return true;
     }
     session.agentInfo->started = 0;
@@ -253,7 +251,6 @@ bool StopAgent(const std::string& address, std::int32_t port) {
     (*found)->agentInfo->started = 0;
     CloseSocketLocked(registry, (*found)->socket);
     registry.sessions.erase(found);
-    UpdateMaxSocketLocked(registry);
   }
   registry.addressTable.erase(address);
   return true;
@@ -271,7 +268,7 @@ bool RestartAgent(std::int32_t index) {
     session.socket = socket;
     session.transport.socket = socket;
     session.agentInfo->started = 1;
-    UpdateMaxSocketLocked(registry);
+    NoteSocketLocked(registry, socket);
   }
   return true;
 }
