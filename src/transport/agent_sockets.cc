@@ -103,10 +103,13 @@ void CloseAgentSocket(std::int64_t socket) {
     if (socket < 0 || static_cast<std::size_t>(socket) >= sockets.sockets.size()) return;
     closing = std::move(sockets.sockets[static_cast<std::size_t>(socket)]);
     if (!closing) return;
+    // Closing the descriptor takes it out of its epoll; while a service thread still answers
+    // it, it must leave the epoll now. (No new holder can appear once it left the table.)
     int epoll = sockets.epolls[static_cast<std::size_t>(closing->Shard())];
-    if (epoll >= 0) epoll_ctl(epoll, EPOLL_CTL_DEL, closing->Descriptor(), nullptr);
+    if (closing.use_count() > 1 && epoll >= 0)
+      epoll_ctl(epoll, EPOLL_CTL_DEL, closing->Descriptor(), nullptr);
   }
-  // The descriptor closes here, or when a service thread answering it lets go.
+  // The descriptor closes here, or when the service thread answering it lets go.
 }
 
 int AgentSocketsEpoll(int shard) {
