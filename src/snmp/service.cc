@@ -148,14 +148,43 @@ void ServeAgentSocket(int descriptor, ThreadState& state) {
   batch.SendQueued(agent->Descriptor());
 }
 
+bool IsWildcardLocked(const WildcardSockets& wildcards, int socket) {
+  return socket >= 0 && (socket == wildcards.ipv4 || socket == wildcards.ipv6);
+}
+
+// Reads one datagram from a wildcard socket unless the socket has meanwhile been closed (an
+// agent took its port), when its descriptor may already belong to someone else.
+bool ReadWildcard(int socket, ThreadState& state, std::size_t* length,
+                  TransportDomainInfo* received) {
+  WildcardSockets& wildcards = TheService().wildcards;
+  std::lock_guard<std::mutex> lock(wildcards.mutex);
+  return IsWildcardLocked(wildcards, socket) &&
+         ReadUdpPacket(socket, state.buffer.data(), state.buffer.size(), length, received);
+}
+
+// Answers from the agent's address through the wildcard socket, if it is still open.
+void ReplyViaWildcard(const AgentSession& agent, const std::uint8_t* data, std::size_t length) {
+  thread_local std::vector<std::uint8_t> reply(kMaxSnmpMessage);
+  std::size_t replyLength = reply.size();
+  if (ProcessSnmpMessage(data, length, reply.data(), &replyLength, agent) != kMessageReply) {
+    LOG_ERROR("ProcessSnmpPDU() is failed. ");
+    return;
+  }
+  if (replyLength == 0) return;
+  WildcardSockets& wildcards = TheService().wildcards;
+  std::lock_guard<std::mutex> lock(wildcards.mutex);
+  auto socket = static_cast<int>(agent.socket);
+  if (IsWildcardLocked(wildcards, socket))
+    SendUdpPacket(agent.transport, socket, reply.data(), replyLength, true);
+}
+
 // A datagram for any registered agent, which need not have a socket of its own: answered from
 // the address it was sent to.
 void ServeWildcardSocket(int socket, ThreadState& state) {
   for (int batch = 0; batch < 32; ++batch) {
     TransportDomainInfo received;
     std::size_t length = 0;
-    if (!ReadUdpPacket(socket, state.buffer.data(), state.buffer.size(), &length, &received))
-      return;
+    if (!ReadWildcard(socket, state, &length, &received)) return;
     if (received.localAddress.empty()) {
       LOG_ERROR("The agent address is NULL. Hence skipping this packet.");
       continue;
@@ -171,11 +200,7 @@ void ServeWildcardSocket(int socket, ThreadState& state) {
     agent->transport.peerPort = received.peerPort;
     agent->transport.peerSockAddr = received.peerSockAddr;
     agent->transport.localAddress = received.localAddress;
-    try {
-      ProcessRcvdSnmpReq(state.buffer.data(), length, *agent, true);
-    } catch (const std::bad_alloc&) {
-      LOG_ERROR("Unable to allocate buffer !!! \n");
-    }
+    ReplyViaWildcard(*agent, state.buffer.data(), length);
   }
 }
 
@@ -267,21 +292,6 @@ void StopSnmpGeneralServices() {
   }
   service.stopEvent = -1;
   service.wildcardEpoll = -1;
-}
-
-bool ProcessRcvdSnmpReq(const std::uint8_t* data, std::size_t length, const AgentSession& session,
-                        bool viaWildcard) {
-  thread_local std::vector<std::uint8_t> reply(kMaxSnmpMessage);
-  std::size_t replyLength = reply.size();
-  int result = ProcessSnmpMessage(data, length, reply.data(), &replyLength, session);
-  if (result != kMessageReply) {
-    LOG_ERROR("ProcessSnmpPDU() is failed. ");
-    return false;
-  }
-  if (replyLength == 0) return true;
-  LOG_TRACE("The length of the pkt to send is %zu", replyLength);
-  return SendUdpPacket(session.transport, static_cast<int>(session.socket), reply.data(),
-                       replyLength, viaWildcard);
 }
 
 int LiveServiceThreads() { return TheService().liveThreads.load(); }

@@ -19,11 +19,6 @@ bool InitSnmpGeneralServices();
 // Stops whatever InitSnmpGeneralServices started; harmless when nothing runs.
 void StopSnmpGeneralServices();
 
-// Processes one request and sends its reply; false when the request was dropped. viaWildcard:
-// the request came in on a wildcard socket, so the reply names the agent's address as source.
-bool ProcessRcvdSnmpReq(const std::uint8_t* data, std::size_t length, const AgentSession& session,
-                        bool viaWildcard);
-
 // Service threads running now (for observation).
 int LiveServiceThreads();
 
