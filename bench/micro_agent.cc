@@ -30,7 +30,7 @@ void Register(const std::string& label, const std::string& oid, bool isTable,
 
 }  // namespace
 
-MicroAgent::MicroAgent() {
+MicroAgent::MicroAgent(int extraGroups) {
   FreeTreeCells();
   SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
                          TableProcessWriteReq);
@@ -44,6 +44,11 @@ MicroAgent::MicroAgent() {
             {{"6", "4"}},
             {{"7", "2"}}});
   Register("ifEntry", "1.3.6.1.2.1.2.2.1", true, {{{"1", "2"}}, {{"2", "4"}}, {{"10", "65"}}});
+  for (int group = 1; group <= extraGroups; ++group) {
+    const std::string n = std::to_string(group);
+    Register("enterprise" + n, "1.3.6.1.4.1.99999." + n + ".1", false,
+             {{{"1", "4"}}, {{"2", "2"}}});
+  }
   StoreTreeCellsRefInArray();
   constexpr std::array<std::array<const char*, 2>, 7> kSystem{{{"1", "Tessel router"},
                                                                {"2", ".1.3.6.1.4.1.99999"},

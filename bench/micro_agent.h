@@ -1,5 +1,6 @@
 // The small agent the micro-benchmarks run against: the system group and a four-row ifTable
-// registered in the MIB tree, values served by the in-memory host. Requests are encoded with the
+// registered in the MIB tree (optionally after them a number of enterprise scalar groups, to give
+// lookups a larger tree), values served by the in-memory host. Requests are encoded with the
 // load generator's own codec, so the engine's codec is measured on bytes it did not write.
 #pragma once
 
@@ -14,7 +15,7 @@ namespace tessel::bench {
 
 class MicroAgent {
  public:
-  MicroAgent();
+  explicit MicroAgent(int extraGroups = 0);
   ~MicroAgent();
   MicroAgent(const MicroAgent&) = delete;
   MicroAgent& operator=(const MicroAgent&) = delete;

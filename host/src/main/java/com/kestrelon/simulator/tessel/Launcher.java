@@ -17,6 +17,8 @@ import java.nio.file.NoSuchFileException;
 import java.nio.file.Path;
 import java.util.Arrays;
 import java.util.List;
+import java.util.Optional;
+import java.util.function.Supplier;
 
 /**
  * {@code ./tessel run}: loads the device data and the SNMPv3 configuration, registers the
@@ -28,6 +30,10 @@ import java.util.List;
  * (the message on the error stream; a fault in a file reads {@code FILE:LINE: reason}). Both
  * files are read and checked before the engine starts. The engine's status lines go to the output stream; nothing else
  * does. A stop that comes while the network is starting ends the start-up before the next step.
+ *
+ * <p>Every device holds a descriptor. When the open-file limit, as far as the engine could raise
+ * it, leaves room for fewer devices than asked, one line on the error stream says how many and
+ * why, and only the first that many start.
  */
 public final class Launcher {
   /** The most agents one startSnmpNetwork call takes. */
@@ -41,6 +47,16 @@ public final class Launcher {
   private final Object lifecycle = new Object();
   private boolean stopRequested; // guarded by lifecycle
   private NetworkSimulator engine; // guarded by lifecycle: set once the engine is initialised
+  private final Supplier<Optional<DescriptorBudget>> descriptorBudget;
+
+  public Launcher() {
+    this(DescriptorBudget::ofThisProcess);
+  }
+
+  /** A launcher that asks descriptorBudget how many devices fit, once the engine is set up. */
+  Launcher(Supplier<Optional<DescriptorBudget>> descriptorBudget) {
+    this.descriptorBudget = descriptorBudget;
+  }
 
   public static void main(String[] args) {
     Launcher launcher = new Launcher();
@@ -151,15 +167,16 @@ public final class Launcher {
         return fail(err, "the engine refused the objects registered at " + refused);
       }
     }
+    int devices = devicesThatFit(options.devices(), err);
     int started = 0;
     String databaseName = String.valueOf(options.dataFile().getFileName());
-    for (int first = 0; first < options.devices(); first += AGENTS_PER_CALL) {
+    for (int first = 0; first < devices; first += AGENTS_PER_CALL) {
       synchronized (lifecycle) {
         if (stopRequested) {
           return 0;
         }
         started += startAgents(handler, options, databaseName, first,
-            Math.min(AGENTS_PER_CALL, options.devices() - first));
+            Math.min(AGENTS_PER_CALL, devices - first));
       }
     }
     synchronized (lifecycle) {
@@ -175,6 +192,16 @@ public final class Launcher {
     }
     simulator.jniBaseLoop();
     return 0;
+  }
+
+  /** The devices to start: all asked for, or as many as the descriptor limit leaves room for. */
+  private int devicesThatFit(int requested, PrintStream err) {
+    Optional<DescriptorBudget> budget = descriptorBudget.get();
+    if (budget.isEmpty() || budget.get().allowedAgents() >= requested) {
+      return requested;
+    }
+    err.println(budget.get().shortfall(requested));
+    return budget.get().allowedAgents();
   }
 
   /** Reports a failed start-up and stops the engine; the caller holds the lifecycle lock. */

@@ -14,6 +14,7 @@ import java.net.InetSocketAddress;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.Files;
 import java.nio.file.Path;
+import java.util.Optional;
 import java.util.concurrent.atomic.AtomicInteger;
 import org.junit.jupiter.api.Test;
 import org.junit.jupiter.api.io.TempDir;
@@ -63,6 +64,22 @@ class LauncherTest {
       return socket.isBound();
     } catch (IOException e) {
       return false;
+    }
+  }
+
+  /** Runs a launch on a thread of its own; its exit status goes to status. */
+  private Thread startNetwork(Launcher launcher, AtomicInteger status, String... args) {
+    Thread network = new Thread(() -> status.set(run(launcher, args)));
+    network.start();
+    return network;
+  }
+
+  /** Waits, 10 s at most, until devices have said they started or the launch has ended. */
+  private void awaitStarted(Thread network, int devices) throws InterruptedException {
+    long deadline = System.nanoTime() + 10_000_000_000L;
+    while (out().split("Snmp Agent Started").length <= devices && System.nanoTime() < deadline
+        && network.isAlive()) {
+      Thread.sleep(20);
     }
   }
 
@@ -163,14 +180,10 @@ class LauncherTest {
   void servesTheDefaultProfileUntilStopped() throws Exception {
     Launcher launcher = new Launcher();
     AtomicInteger status = new AtomicInteger(-1);
-    Thread network = new Thread(() -> status.set(run(launcher, "--devices", "2", "--address", "127.0.3.1",
-        "--snmp-port", "28162")));
-    network.start();
+    Thread network = startNetwork(launcher, status, "--devices", "2", "--address", "127.0.3.1",
+        "--snmp-port", "28162");
     try {
-      long deadline = System.nanoTime() + 10_000_000_000L;
-      while (out().split("Snmp Agent Started").length < 3 && System.nanoTime() < deadline && network.isAlive()) {
-        Thread.sleep(20);
-      }
+      awaitStarted(network, 2);
       // What the devices answer is the integration tests' part (tests/integration).
       assertTrue(out().contains("Snmp Agent Started at port : 28162 and at IPAddress : 127.0.3.2"), out());
     } finally {
@@ -181,5 +194,26 @@ class LauncherTest {
     assertEquals(0, status.get());
     assertTrue(out().endsWith("Network resources cleared Successfully\n"));
     assertEquals("", err());
+  }
+
+  @Test
+  void startsOnlyTheDevicesTheDescriptorLimitLeavesRoomFor() throws Exception {
+    DescriptorBudget roomForOne = new DescriptorBudget(1000, 1000, 1000 - DescriptorBudget.RESERVE - 1);
+    Launcher launcher = new Launcher(() -> Optional.of(roomForOne));
+    AtomicInteger status = new AtomicInteger(-1);
+    Thread network = startNetwork(launcher, status, "--devices", "3", "--address", "127.0.3.5",
+        "--snmp-port", "28163");
+    try {
+      awaitStarted(network, 1);
+    } finally {
+      // The stop waits for the start-up call in progress: every device it started has said so.
+      launcher.requestStop();
+      network.join(5000);
+    }
+    assertEquals(0, status.get());
+    assertTrue(out().contains("Snmp Agent Started at port : 28163 and at IPAddress : 127.0.3.5"), out());
+    assertEquals(2, out().split("Snmp Agent Started").length, out());
+    assertEquals(roomForOne.shortfall(3), err().strip());
+    assertTrue(err().startsWith("tessel: the open-file limit allows 1 agents, not 3: it is 1000"), err());
   }
 }
