@@ -128,7 +128,8 @@ public final class Launcher {
 
   private int serve(LaunchOptions options, DeviceData data, List<CellDefinition> cells,
       SnmpV3Config snmpV3, PrintStream out, PrintStream err) {
-    NetworkSimulator simulator = new NetworkSimulator(out);
+    // Status lines go to the output stream only: the launcher never reads them back.
+    NetworkSimulator simulator = new NetworkSimulator(out, 0);
     SnmpHandler handler = new SnmpHandler(new DeviceStore(data));
     synchronized (lifecycle) {
       if (stopRequested) {
