@@ -36,8 +36,13 @@ import java.util.function.Supplier;
  * why, and only the first that many start.
  */
 public final class Launcher {
-  /** The most agents one startSnmpNetwork call takes. */
-  static final int AGENTS_PER_CALL = 32_767;
+  /**
+   * Agents registered per startSnmpNetwork call (the engine takes at most 32,767 in one). The
+   * engine copies a call's arrays before it registers the agents, so small calls keep those
+   * copies, and the host's own arrays, small and reused from call to call instead of leaving
+   * freed memory behind in proportion to the network; a stop is also seen between calls.
+   */
+  static final int AGENTS_PER_CALL = 256;
 
   private static final String DEFAULT_PROFILE = "router.snmprec";
   private static final String DEFAULT_SNMPV3 = "snmpv3.conf";
@@ -139,7 +144,8 @@ public final class Launcher {
 
   private int serve(LaunchOptions options, DeviceData data, List<CellDefinition> cells,
       SnmpV3Config snmpV3, PrintStream out, PrintStream err) {
-    NetworkSimulator simulator = new NetworkSimulator(out);
+    // Status lines go to the output stream only: the launcher never reads them back.
+    NetworkSimulator simulator = new NetworkSimulator(out, 0);
     SnmpHandler handler = new SnmpHandler(new DeviceStore(data));
     synchronized (lifecycle) {
       if (stopRequested) {

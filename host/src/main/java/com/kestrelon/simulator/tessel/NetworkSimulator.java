@@ -10,8 +10,8 @@ import java.util.List;
  * The engine's front door: initialisation, the base loop, the stop calls and the request filters.
  * The engine calls back {@link #getBytes} to read Java texts and {@link #printStatus} to report
  * status lines; both may be called from any thread. Status lines are written to the status
- * stream, each flushed as it is written, and the most recent {@value #KEPT_STATUS_LINES} are kept
- * for {@link #statusLines()}.
+ * stream, each flushed as it is written, and the most recent ones (by default
+ * {@value #KEPT_STATUS_LINES}) are kept for {@link #statusLines()}.
  */
 public class NetworkSimulator {
   static {
@@ -22,6 +22,7 @@ public class NetworkSimulator {
 
   private final ArrayDeque<String> statusLines = new ArrayDeque<>();
   private final PrintStream statusStream;
+  private final int keptLines;
 
   /** Status lines go to standard output. */
   public NetworkSimulator() {
@@ -29,7 +30,16 @@ public class NetworkSimulator {
   }
 
   public NetworkSimulator(PrintStream statusStream) {
+    this(statusStream, KEPT_STATUS_LINES);
+  }
+
+  /** Keeps the most recent {@code keptLines} status lines; with 0, {@link #statusLines()} is empty. */
+  public NetworkSimulator(PrintStream statusStream, int keptLines) {
+    if (keptLines < 0) {
+      throw new IllegalArgumentException("keptLines " + keptLines);
+    }
     this.statusStream = statusStream;
+    this.keptLines = keptLines;
   }
 
   public native boolean nativeInitAgentParams(
@@ -61,11 +71,13 @@ public class NetworkSimulator {
   }
 
   public void printStatus(String line) {
-    synchronized (statusLines) {
-      if (statusLines.size() == KEPT_STATUS_LINES) {
-        statusLines.removeFirst();
+    if (keptLines > 0) {
+      synchronized (statusLines) {
+        if (statusLines.size() == keptLines) {
+          statusLines.removeFirst();
+        }
+        statusLines.addLast(line);
       }
-      statusLines.addLast(line);
     }
     synchronized (statusStream) {
       statusStream.println(line);
