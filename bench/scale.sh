@@ -17,7 +17,8 @@
 #   BENCH_SCALE_ADDRESS [127.1.0.1]  BENCH_SCALE_PORT [11191]
 #   BENCH_SCALE_START_TIMEOUT [120]  seconds for the last agent to answer
 #   BENCH_STOP_TIMEOUT [30]  seconds from SIGTERM before the group is killed
-#   BENCH_SCALE_SNMPSIM [yes]  BENCH_SCALE_SNMPSIM_DEVICES [10000]  endpoints of the large snmpsim
+#   BENCH_SKIP [""]  "tessel" or "snmpsim" to leave out
+#   BENCH_SCALE_SNMPSIM_DEVICES [10000]  endpoints of the large snmpsim
 #   BENCH_SCALE_SNMPSIM_ADDRESS [127.3.0.1]
 set -euo pipefail
 
@@ -36,7 +37,7 @@ RESERVE=${BENCH_FD_RESERVE:-300}
 TESSEL_ADDRESS=${BENCH_SCALE_ADDRESS:-127.1.0.1}
 PORT=${BENCH_SCALE_PORT:-11191}
 START_TIMEOUT=${BENCH_SCALE_START_TIMEOUT:-120}
-WITH_SNMPSIM=${BENCH_SCALE_SNMPSIM:-yes}
+SKIP=${BENCH_SKIP:-}
 SNMPSIM_DEVICES=${BENCH_SCALE_SNMPSIM_DEVICES:-10000}
 SNMPSIM_ADDRESS=${BENCH_SCALE_SNMPSIM_ADDRESS:-127.3.0.1}
 TICKS=$(getconf CLK_TCK)
@@ -209,12 +210,12 @@ print_table() {
 main() {
   [ "$DEVICES" -gt "$SMALL" ] || { log "BENCH_SCALE_DEVICES must be above $SMALL"; exit 2; }
   build_tools
-  if build_tessel; then
+  if [[ " $SKIP " != *" tessel "* ]] && build_tessel; then
     fitting_devices "$DEVICES"
     measure_instance tessel "$TESSEL_ADDRESS" "$SMALL" busy
     measure_instance tessel "$TESSEL_ADDRESS" "$FITTING" idle
   fi
-  if [ "$WITH_SNMPSIM" = yes ] && ensure_package snmpsim /usr/bin/snmpsimd; then
+  if [[ " $SKIP " != *" snmpsim "* ]] && ensure_package snmpsim /usr/bin/snmpsimd; then
     fitting_devices "$SNMPSIM_DEVICES"
     measure_instance snmpsim "$SNMPSIM_ADDRESS" "$SMALL" busy
     measure_instance snmpsim "$SNMPSIM_ADDRESS" "$FITTING" idle
