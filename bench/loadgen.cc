@@ -70,7 +70,8 @@ struct GeneratorOptions {
   int timeoutMs = 1000;
   double warmupSeconds = 1;
   double measureSeconds = 5;
-  double rate = 0;  // requests per second; 0 = closed loop
+  double rate = 0;   // requests per second; 0 = closed loop
+  int requests = 0;  // requests in all, warm-up included; 0 = as many as the durations allow
   int cpu = -1;
   bool quiet = false;
   bool untilAnswer = false;
@@ -99,6 +100,7 @@ struct Counters {
   std::uint64_t notResponse = 0;
   std::uint64_t wrongSource = 0;
   std::uint64_t sendFailures = 0;
+  std::uint64_t targetsAnswered = 0;  // targets with at least one measured answer
 };
 
 // A pending sendmmsg batch on one socket.
@@ -120,7 +122,8 @@ struct ReceiveBatch {
 
 class Generator {
  public:
-  explicit Generator(const GeneratorOptions& options) : options_(options), slots_(options.window) {}
+  explicit Generator(const GeneratorOptions& options)
+      : options_(options), slots_(options.window), targetAnswered_(options.targets.size()) {}
   bool Open();
   int Run();
 
@@ -141,7 +144,8 @@ class Generator {
                 const sockaddr_in& source, std::int64_t now);
   void Expire(std::int64_t now);
   std::int64_t WaitNs(std::int64_t now) const;
-  std::uint64_t AllowedByRate(std::int64_t now) const;
+  std::uint64_t Allowed(std::int64_t now) const;
+  bool Exhausted() const;
   void Report(double seconds, double cpuSeconds) const;
   std::uint32_t NextRequestId(int slotIndex);
 
@@ -149,6 +153,7 @@ class Generator {
   std::vector<int> fds_;
   int epoll_ = -1;
   std::vector<Slot> slots_;
+  std::vector<bool> targetAnswered_;
   std::vector<int> freeSlots_;
   std::vector<SendBatch> batches_;
   ReceiveBatch receive_;
@@ -218,10 +223,19 @@ std::uint32_t Generator::NextRequestId(int slotIndex) {
   return next;
 }
 
-std::uint64_t Generator::AllowedByRate(std::int64_t now) const {
-  if (options_.rate <= 0) return UINT64_MAX;
-  double elapsed = static_cast<double>(now - startNs_) / 1e9;
-  return static_cast<std::uint64_t>(elapsed * options_.rate) + 1;
+// How many requests may have been issued by now: the pacing rate's and --requests' bound.
+std::uint64_t Generator::Allowed(std::int64_t now) const {
+  std::uint64_t allowed = UINT64_MAX;
+  if (options_.rate > 0) {
+    double elapsed = static_cast<double>(now - startNs_) / 1e9;
+    allowed = static_cast<std::uint64_t>(elapsed * options_.rate) + 1;
+  }
+  if (options_.requests > 0) allowed = std::min<std::uint64_t>(allowed, options_.requests);
+  return allowed;
+}
+
+bool Generator::Exhausted() const {
+  return options_.requests > 0 && issued_ >= static_cast<std::uint64_t>(options_.requests);
 }
 
 void Generator::Queue(int slotIndex, std::int64_t now) {
@@ -286,7 +300,7 @@ void Generator::Flush(int socketIndex) {
 
 void Generator::FillWindow(std::int64_t now) {
   if (now >= measureEndNs_) return;
-  const std::uint64_t allowed = AllowedByRate(now);
+  const std::uint64_t allowed = Allowed(now);
   while (!freeSlots_.empty() && issued_ < allowed) {
     int slotIndex = freeSlots_.back();
     freeSlots_.pop_back();
@@ -328,6 +342,10 @@ void Generator::Complete(const Slot& slot, const tessel::bench::ReplySummary& re
     ++counters_.wrongSource;
   }
   ++counters_.responses;
+  if (!targetAnswered_[slot.target]) {
+    targetAnswered_[slot.target] = true;
+    ++counters_.targetsAnswered;
+  }
   if (reply.pduType != tessel::bench::kPduResponse) ++counters_.notResponse;
   if (reply.errorStatus != 0) ++counters_.errors;
   histogram_.Record(static_cast<std::uint64_t>(now - slot.sentNs));
@@ -416,7 +434,7 @@ std::int64_t Generator::WaitNs(std::int64_t now) const {
   if (now < measureEndNs_) {
     wakeNs = std::min(wakeNs, measureEndNs_);
     if (now < measureStartNs_) wakeNs = std::min(wakeNs, measureStartNs_);
-    if (!freeSlots_.empty()) {
+    if (!freeSlots_.empty() && !Exhausted()) {
       if (options_.rate <= 0) return 0;
       // The next paced request is due when issued_ / rate seconds have passed since the start.
       double next = static_cast<double>(issued_) / options_.rate * 1e9;
@@ -433,6 +451,7 @@ void Generator::Loop() {
     std::int64_t now = NowNs();
     if (now - lastExpireNs_ >= 10000000) Expire(now);
     if (options_.untilAnswer && answered_) return;
+    if (Exhausted() && busy_ == 0) return;
     if (now >= measureEndNs_ && (busy_ == 0 || now >= measureEndNs_ + timeoutNs)) return;
     FillWindow(now);
     const std::int64_t waitNs = WaitNs(NowNs());
@@ -534,7 +553,7 @@ void Generator::Report(double seconds, double cpuSeconds) const {
       "not_response=%llu "
       "wrong_source=%llu send_failures=%llu seconds=%.3f rate=%.0f p50_us=%.1f p99_us=%.1f "
       "p999_us=%.1f "
-      "max_us=%.1f cpu_pct=%.0f\n",
+      "max_us=%.1f cpu_pct=%.0f targets=%zu targets_answered=%llu\n",
       static_cast<unsigned long long>(counters_.sent),
       static_cast<unsigned long long>(counters_.responses),
       static_cast<unsigned long long>(counters_.lost),
@@ -544,7 +563,8 @@ void Generator::Report(double seconds, double cpuSeconds) const {
       static_cast<unsigned long long>(counters_.notResponse),
       static_cast<unsigned long long>(counters_.wrongSource),
       static_cast<unsigned long long>(counters_.sendFailures), seconds, rate, p50, p99, p999,
-      maximum, 100.0 * cpuSeconds / std::max(wall, 1e-9));
+      maximum, 100.0 * cpuSeconds / std::max(wall, 1e-9), options_.targets.size(),
+      static_cast<unsigned long long>(counters_.targetsAnswered));
   if (options_.quiet) return;
   std::printf(
       "%.0f responses/s over %.1f s (%llu sent, %llu lost, %llu errors, %llu malformed); "
@@ -569,6 +589,7 @@ const char kUsage[] =
     "  --warmup S           seconds before measuring (1, at most 600)\n"
     "  --duration S         measured seconds (5, at most 3600)\n"
     "  --rate R             pace to R requests/s instead of a closed loop\n"
+    "  --requests N         stop after N requests (N = the targets: one to each)\n"
     "  --cpu N              pin to CPU N\n"
     "  --v3-user NAME       SNMPv3 with this USM user (HMAC-SHA-96, AES-128-CFB) instead of "
     "v1/v2c\n"
@@ -665,6 +686,8 @@ bool ParseArguments(int argc, char** argv, GeneratorOptions* options) {
       ok = tessel::bench::ParseSeconds(value, 0.001, 3600, &options->measureSeconds);
     } else if (name == "--rate") {
       ok = tessel::bench::ParseSeconds(value, 0, 1e8, &options->rate);
+    } else if (name == "--requests") {
+      ok = tessel::bench::ParseInt(value, 1, 1 << 30, &options->requests);
     } else if (name == "--cpu") {
       ok = tessel::bench::ParseInt(value, 0, CPU_SETSIZE - 1, &options->cpu);
     } else {

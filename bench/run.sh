@@ -2,29 +2,36 @@
 # ./tessel bench: the same SNMP workloads, in one run, against Tessel, net-snmp snmpd, snmpsim
 # (serving a recording of that snmpd) and a UDP echo server (the machine's ceiling), all on
 # loopback, the server pinned to one CPU and the load generator to another. Prints one table of
-# responses/s, ratios and latency. The SNMPv3 workload (authPriv, SHA + AES) runs against Tessel
-# and snmpd, both given the same user.
+# responses/s, Tessel's ratios to the others and latency. Tessel runs BENCH_DEVICES agents: the
+# workloads go to one of them, as to the other servers' single agent, and "spread" sends the Get
+# round robin to all of them. "get-paced" repeats each server's Get at half the rate it has just
+# sustained, for the latency below saturation. The SNMPv3 workload (authPriv, SHA + AES) runs
+# against Tessel and snmpd, both given the same user. bench/scale.sh measures start, memory, idle
+# CPU and stop with many agents.
 #
 # Environment (defaults in brackets):
 #   BENCH_WARMUP [3]  BENCH_DURATION [10]  seconds of warm-up and of measurement per figure
-#   BENCH_WINDOW [64]  outstanding requests       BENCH_DEVICES [100]  Tessel agents
+#   BENCH_WINDOW [64]  outstanding requests       BENCH_DEVICES [10000]  Tessel agents
 #   BENCH_SERVER_CPU [0]  BENCH_LOADGEN_CPU [1]
 #   BENCH_SNMPD_PORT [11161]  BENCH_TESSEL_PORT [11171]  BENCH_SNMPSIM_PORT [11181]
 #   BENCH_ECHO_PORT [12000]
 #   BENCH_TESSEL_ADDRESS [127.0.1.1]  BENCH_TESSEL_START_TIMEOUT [300] seconds
 #   BENCH_SKIP [""]  any of "tessel snmpd snmpsim echo" to leave out (snmpsim needs snmpd)
-#   BENCH_WORKLOADS ["get getnext getbulk get-v3"]  the workloads to run
+#   BENCH_WORKLOADS ["get get-paced getnext getbulk get-v3 spread"]  the workloads to run, in
+#     order (get-paced needs get before it; spread and get-v3 are run last)
 #   BENCH_V3_USER  BENCH_V3_AUTH  BENCH_V3_PRIV  the SNMPv3 user (SHA, AES) and its passwords
 #     [the first such user of profiles/snmpv3.conf, Tessel's default; without one: bench,
 #     shapassword, aespassword, given to Tessel with --snmpv3]
 set -euo pipefail
 
-ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
-BUILD=${TESSEL_BUILD:-$ROOT/build}
+LOG_TAG=bench
+# shellcheck source=bench/lib.sh
+. "$(dirname "${BASH_SOURCE[0]}")/lib.sh"
+
 WARMUP=${BENCH_WARMUP:-3}
 DURATION=${BENCH_DURATION:-10}
 WINDOW=${BENCH_WINDOW:-64}
-DEVICES=${BENCH_DEVICES:-100}
+DEVICES=${BENCH_DEVICES:-10000}
 SERVER_CPU=${BENCH_SERVER_CPU:-0}
 LOADGEN_CPU=${BENCH_LOADGEN_CPU:-1}
 SNMPD_PORT=${BENCH_SNMPD_PORT:-11161}
@@ -34,89 +41,28 @@ SNMPSIM_PORT=${BENCH_SNMPSIM_PORT:-11181}
 TESSEL_ADDRESS=${BENCH_TESSEL_ADDRESS:-127.0.1.1}
 TESSEL_START_TIMEOUT=${BENCH_TESSEL_START_TIMEOUT:-300}
 SKIP=${BENCH_SKIP:-}
-
-LOADGEN=$BUILD/bench/tessel_loadgen
 ECHO=$BUILD/bench/tessel_echo
-read -r -a WORKLOADS <<<"${BENCH_WORKLOADS:-get getnext getbulk get-v3}"
+SERVER_PIN=(taskset -c "$SERVER_CPU")
+
+read -r -a WORKLOADS <<<"${BENCH_WORKLOADS:-get get-paced getnext getbulk get-v3 spread}"
 declare -A REQUEST=(
   [get]="--get 1.3.6.1.2.1.1.5.0"
   [getnext]="--getnext 1.3.6.1.2.1.1"
   [getbulk]="--getbulk 1.3.6.1.2.1.2.2 --non-repeaters 0 --max-repetitions 10"
 )
+REQUEST[get-paced]=${REQUEST[get]}
+REQUEST[spread]=${REQUEST[get]}
 declare -A RESULT=()  # "server workload" -> RESULT line of the load generator
-declare -a SERVER_GROUPS=()
-WORK=$(mktemp -d /tmp/tessel-bench.XXXXXX)
-chmod 711 "$WORK"  # servers that drop to nobody reach their own subdirectories
 
-log() { printf 'bench: %s\n' "$*" >&2; }
 skipped() { [[ " $SKIP " == *" $1 "* ]]; }
 
-# Stops the load generator and every server this script started (each server leads its own
-# process group) and removes the temporary directory.
-LOADGEN_PID=
-cleanup() {
-  local group
-  [ -n "$LOADGEN_PID" ] && kill -TERM "$LOADGEN_PID" 2>/dev/null
-  for group in "${SERVER_GROUPS[@]}"; do stop_group "$group"; done
-  rm -rf "$WORK"
-}
-trap cleanup EXIT
-trap 'exit 130' INT TERM
-
-# stop_group PGID: SIGTERM, then SIGKILL after 10 s for whatever is left of the group.
-stop_group() {
-  local group=$1 i
-  kill -TERM -- "-$group" 2>/dev/null || return 0
-  for ((i = 0; i < 100; i++)); do
-    kill -0 -- "-$group" 2>/dev/null || return 0
-    sleep 0.1
-  done
-  log "process group $group ignored SIGTERM for 10 s; killing it"
-  kill -KILL -- "-$group" 2>/dev/null || true
-}
-
-# start_server NAME COMMAND...: runs COMMAND pinned to the server CPU in a new process group;
-# sets SERVER_GROUP.
-start_server() {
-  local name=$1; shift
-  setsid taskset -c "$SERVER_CPU" "$@" >"$WORK/$name.log" 2>&1 </dev/null &
-  SERVER_GROUP=$!
-  SERVER_GROUPS+=("$SERVER_GROUP")
-}
-
-finish_server() {
-  stop_group "$1"
-  local kept=() group
-  for group in "${SERVER_GROUPS[@]}"; do [ "$group" = "$1" ] || kept+=("$group"); done
-  SERVER_GROUPS=("${kept[@]+"${kept[@]}"}")
-}
-
-# wait_for_answer TARGETS PORT SECONDS GROUP [LOADGEN OPTIONS...]: true once a Get is answered
-# by every address given (comma list), false on time-out or when the server's group has gone.
-wait_for_answer() {
-  local targets=$1 port=$2 seconds=$3 group=$4 deadline target
-  shift 4
-  deadline=$((SECONDS + seconds))
-  for target in ${targets//,/ }; do
-    until "$LOADGEN" --targets "$target" --port "$port" --get 1.3.6.1.2.1.1.5.0 --window 1 --warmup 0 \
-        --duration 1 --timeout-ms 200 --until-answer --quiet "$@" >/dev/null 2>&1; do
-      kill -0 -- "-$group" 2>/dev/null || return 1
-      [ "$SECONDS" -lt "$deadline" ] || return 1
-      sleep 0.5
-    done
-  done
-}
-
-# measure SERVER WORKLOAD TARGETS PORT
+# measure SERVER WORKLOAD TARGETS PORT [LOADGEN OPTIONS...]
 measure() {
   local server=$1 workload=$2 targets=$3 port=$4 line
+  shift 4
   # shellcheck disable=SC2086  # REQUEST holds several words on purpose
-  # In the background, so that a signal to this script is handled at once, not after the run.
-  "$LOADGEN" --targets "$targets" --port "$port" ${REQUEST[$workload]} --window "$WINDOW" \
-    --warmup "$WARMUP" --duration "$DURATION" --cpu "$LOADGEN_CPU" --quiet >"$WORK/result" &
-  LOADGEN_PID=$!
-  wait "$LOADGEN_PID" || true
-  LOADGEN_PID=
+  interruptibly "$WORK/result" "$LOADGEN" --targets "$targets" --port "$port" ${REQUEST[$workload]} \
+    --window "$WINDOW" --warmup "$WARMUP" --duration "$DURATION" --cpu "$LOADGEN_CPU" --quiet "$@"
   line=$(grep '^RESULT' "$WORK/result" || true)
   RESULT["$server $workload"]=$line
   log "$server $workload: ${line:-no result}"
@@ -125,46 +71,49 @@ measure() {
 # wanted WORKLOAD: true when the workload is among those to run.
 wanted() { [[ " ${WORKLOADS[*]} " == *" $1 "* ]]; }
 
-v2_workloads() {
-  local workload
-  for workload in "${WORKLOADS[@]}"; do [ "$workload" = get-v3 ] || echo "$workload"; done
+# measure_v2c SERVER TARGET PORT: the v2c workloads in the order asked for, against one address.
+# get-paced is the Get again at half the rate the server has just sustained, for its latency
+# below saturation. The echo server returns each request as it is: only its Gets mean something.
+measure_v2c() {
+  local server=$1 target=$2 port=$3 workload rate
+  for workload in "${WORKLOADS[@]}"; do
+    [ "$server" = echo ] && [ "$workload" != get ] && [ "$workload" != get-paced ] && continue
+    case $workload in
+      get-v3 | spread) ;;
+      get-paced)
+        rate=$(half_get_rate "$server")
+        if [ -n "$rate" ]; then
+          measure "$server" get-paced "$target" "$port" --rate "$rate"
+        else
+          log "$server get-paced: no saturated Get figure before it; left out"
+        fi
+        ;;
+      *) measure "$server" "$workload" "$target" "$port" ;;
+    esac
+  done
 }
 
-# measure_v3 SERVER TARGETS PORT GROUP [LAST]: the SNMPv3 workload, once the first target (and
-# the LAST address) answer an SNMPv3 Get.
+# half_get_rate SERVER: half the server's measured Get rate, or nothing.
+half_get_rate() {
+  local rate
+  rate=$(cell "$1" get rate)
+  [ "$rate" != - ] && [ "$rate" -gt 1 ] && echo $((rate / 2))
+  return 0
+}
+
+# measure_v3 SERVER TARGET PORT GROUP: the SNMPv3 workload, once the target answers an SNMPv3 Get.
 measure_v3() {
-  local server=$1 targets=$2 port=$3 group=$4 first
+  local server=$1 target=$2 port=$3 group=$4
   wanted get-v3 || return 0
-  first=${targets%%+*}
   # shellcheck disable=SC2086  # V3_OPTIONS holds several words on purpose
-  if ! wait_for_answer "$first,${5:-$first}" "$port" 10 "$group" $V3_OPTIONS; then
+  if ! wait_for_answer "$target" "$port" 10 "$group" $V3_OPTIONS; then
     log "$server did not answer an SNMPv3 authPriv Get as $V3_USER; what the load generator sees:"
     # shellcheck disable=SC2086
-    "$LOADGEN" --targets "$first" --port "$port" --get 1.3.6.1.2.1.1.5.0 --window 1 --warmup 0 --duration 1 \
+    "$LOADGEN" --targets "$target" --port "$port" --get 1.3.6.1.2.1.1.5.0 --window 1 --warmup 0 --duration 1 \
       $V3_OPTIONS 2>&1 | sed 's/^/  /' >&2 || true
     return 0
   fi
-  measure "$server" get-v3 "$targets" "$port"
-}
-
-field() {  # field "RESULT line" KEY
-  sed -nE "s/.* $2=([^ ]+).*/\1/p" <<<"$1"
-}
-
-# ensure_package PACKAGE PROGRAM
-ensure_package() {
-  [ -x "$2" ] && return 0
-  if [ "$(id -u)" -ne 0 ]; then log "$2 is missing (install the Debian package $1)"; return 1; fi
-  log "installing $1"
-  apt-get update -qq
-  DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends "$1" >/dev/null
-}
-
-build_tools() {
-  if [ ! -f "$BUILD/build.ninja" ]; then
-    cmake -S "$ROOT" -B "$BUILD" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-  fi
-  cmake --build "$BUILD" --target tessel_loadgen tessel_echo -- -j2 >/dev/null
+  measure "$server" get-v3 "$target" "$port"
 }
 
 run_snmpd() {
@@ -177,12 +126,12 @@ run_snmpd() {
   [ "$(id -u)" -eq 0 ] && user=(-u nobody)
   start_server snmpd env SNMP_PERSISTENT_DIR="$WORK/snmpd" /usr/sbin/snmpd -f -Lo -C -c "$WORK/snmpd/snmpd.conf" \
     "${user[@]}"
-  local group=$SERVER_GROUP workload
+  local group=$SERVER_GROUP
   if ! wait_for_answer 127.0.0.1 "$SNMPD_PORT" 30 "$group"; then
     log "snmpd did not answer; its log:"; tail -n 20 "$WORK/snmpd.log" >&2
     finish_server "$group"; return 0
   fi
-  for workload in $(v2_workloads); do measure snmpd "$workload" 127.0.0.1 "$SNMPD_PORT"; done
+  measure_v2c snmpd 127.0.0.1 "$SNMPD_PORT"
   measure_v3 snmpd 127.0.0.1 "$SNMPD_PORT" "$group"
   skipped snmpsim || record_snmpd
   finish_server "$group"
@@ -205,53 +154,46 @@ run_snmpsim() {
   [ "$(id -u)" -eq 0 ] && user=(--process-user=nobody --process-group=nogroup)
   start_server snmpsim snmpsimd --data-dir="$WORK/snmpsim" --agent-udpv4-endpoint=127.0.0.1:"$SNMPSIM_PORT" \
     --cache-dir="$WORK/snmpsim-cache" "${user[@]}"
-  local group=$SERVER_GROUP workload
+  local group=$SERVER_GROUP
   if ! wait_for_answer 127.0.0.1 "$SNMPSIM_PORT" 60 "$group"; then
     log "snmpsim did not answer; its log:"; tail -n 20 "$WORK/snmpsim.log" >&2
     finish_server "$group"; return 0
   fi
-  for workload in $(v2_workloads); do measure snmpsim "$workload" 127.0.0.1 "$SNMPSIM_PORT"; done
+  measure_v2c snmpsim 127.0.0.1 "$SNMPSIM_PORT"
   finish_server "$group"
 }
 
 run_echo() {
   local bound
-  bound=$(awk -v w="$WARMUP" -v d="$DURATION" 'BEGIN { printf "%d", w + d + 30 }')
+  bound=$(awk -v w="$WARMUP" -v d="$DURATION" 'BEGIN { printf "%d", 2 * (w + d) + 30 }')
   start_server echo "$ECHO" --address 127.0.0.1 --port "$ECHO_PORT" --duration "$bound"
   local group=$SERVER_GROUP
   if wait_for_answer 127.0.0.1 "$ECHO_PORT" 10 "$group"; then
-    if wanted get; then measure echo get 127.0.0.1 "$ECHO_PORT"; fi
+    measure_v2c echo 127.0.0.1 "$ECHO_PORT"
   else
     log "the echo server did not answer"
   fi
   finish_server "$group"
 }
 
-tessel_available() {
-  ! grep -q 'simulated network is not available yet' "$ROOT/tessel"
-}
-
+# Tessel serves DEVICES agents; the workloads go to the first, as to the other servers' one
+# agent, and the spread Get round robin to all of them.
 run_tessel() {
-  if ! tessel_available; then log "./tessel run is not available yet: Tessel is pending"; return 0; fi
-  # The launcher builds what it runs; doing that now, unpinned, keeps the build out of the
-  # start-up time-out and off the server CPU.
-  log "building Tessel"
-  "$ROOT/tessel" run --help >/dev/null 2>&1 || { log "./tessel run --help failed: Tessel is pending"; return 0; }
-  local last first
-  first=$TESSEL_ADDRESS
-  last=$(python3 -c 'import ipaddress,sys; print(ipaddress.ip_address(sys.argv[1]) + int(sys.argv[2]) - 1)' \
-    "$first" "$DEVICES")
+  build_tessel || return 0
+  local first=$TESSEL_ADDRESS last
+  last=$(address_plus "$first" $((DEVICES - 1)))
   local v3 with_v3=no
   tessel_v3_options && with_v3=yes
   start_server tessel "$ROOT/tessel" run --devices "$DEVICES" --address "$first" --snmp-port "$TESSEL_PORT" \
     "${v3[@]+"${v3[@]}"}"
-  local group=$SERVER_GROUP workload
+  local group=$SERVER_GROUP
   if ! wait_for_answer "$first,$last" "$TESSEL_PORT" "$TESSEL_START_TIMEOUT" "$group"; then
     log "Tessel did not answer on $first and $last; its log:"; tail -n 30 "$WORK/tessel.log" >&2
     finish_server "$group"; return 0
   fi
-  for workload in $(v2_workloads); do measure tessel "$workload" "$first+$DEVICES" "$TESSEL_PORT"; done
-  if [ "$with_v3" = yes ]; then measure_v3 tessel "$first+$DEVICES" "$TESSEL_PORT" "$group" "$last"; fi
+  measure_v2c tessel "$first" "$TESSEL_PORT"
+  if [ "$with_v3" = yes ]; then measure_v3 tessel "$first" "$TESSEL_PORT" "$group"; fi
+  if wanted spread; then measure tessel spread "$first+$DEVICES" "$TESSEL_PORT"; fi
   finish_server "$group"
 }
 
@@ -295,41 +237,59 @@ tessel_v3_options() {
   if [ -n "$V3_CONFIG" ]; then v3=(--snmpv3 "$V3_CONFIG"); fi
 }
 
-# ratio A B: A / B to two decimals, or "-".
-ratio() {
-  if [ "$1" != - ] && [ "$2" != - ] && [ "$2" != 0 ]; then
-    awk -v a="$1" -v b="$2" 'BEGIN { printf "%.2f", a / b }'
-  else
-    echo -
-  fi
-}
-
 # cell SERVER WORKLOAD KEY: a field of a result, or "-".
 cell() {
   local line=${RESULT["$1 $2"]:-}
   [ -n "$line" ] && field "$line" "$3" || echo -
 }
 
+# latency SERVER WORKLOAD: p50/p99 in microseconds; p50/p99/p99.9 for the paced Get.
 latency() {
   local line=${RESULT["$1 $2"]:-}
-  [ -n "$line" ] && printf '%s/%s' "$(field "$line" p50_us)" "$(field "$line" p99_us)" || echo -
+  if [ -z "$line" ]; then echo -; return; fi
+  printf '%s/%s' "$(field "$line" p50_us)" "$(field "$line" p99_us)"
+  if [ "$2" = get-paced ]; then printf '/%s' "$(field "$line" p999_us)"; fi
+  echo
 }
 
+TABLE_FORMAT='%-9s %9s %9s %9s %9s %8s %8s %8s %22s %22s %22s %22s\n'
+
 print_table() {
-  local workload ratio tessel snmpd
-  printf '\n%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' workload tessel/s snmpd/s snmpsim/s echo/s \
-    tessel/snmpd 'tessel p50/p99 us' 'snmpd p50/p99 us' 'snmpsim p50/p99 us' 'echo p50/p99 us'
+  local workload tessel snmpd snmpsim echo ratios
+  # shellcheck disable=SC2059  # the format is a constant
+  printf "\n$TABLE_FORMAT" workload tessel/s snmpd/s snmpsim/s echo/s 'x snmpd' 'x snmpsim' '% echo' \
+    'tessel p50/p99 us' 'snmpd p50/p99 us' 'snmpsim p50/p99 us' 'echo p50/p99 us'
   for workload in "${WORKLOADS[@]}"; do
     tessel=$(cell tessel "$workload" rate)
     snmpd=$(cell snmpd "$workload" rate)
-    ratio=$(ratio "$tessel" "$snmpd")
-    printf '%-8s %9s %9s %9s %9s %13s %18s %18s %18s %18s\n' "$workload" "$tessel" "$snmpd" \
-      "$(cell snmpsim "$workload" rate)" "$(cell echo "$workload" rate)" "$ratio" \
+    snmpsim=$(cell snmpsim "$workload" rate)
+    echo=$(cell echo "$workload" rate)
+    ratios=(- - -)
+    case $workload in
+      get-paced | spread) ;;  # a rate asked for, and a Tessel-only figure: nothing to compare
+      *) ratios=("$(ratio "$tessel" "$snmpd")" "$(ratio "$tessel" "$snmpsim")" "$(ratio "$tessel" "$echo" 100)") ;;
+    esac
+    # shellcheck disable=SC2059
+    printf "$TABLE_FORMAT" "$workload" "$tessel" "$snmpd" "$snmpsim" "$echo" "${ratios[@]}" \
       "$(latency tessel "$workload")" "$(latency snmpd "$workload")" "$(latency snmpsim "$workload")" \
       "$(latency echo "$workload")"
   done
-  printf '\nwindow %s, %s s warm-up + %s s measured, server on CPU %s, load generator on CPU %s, %s Tessel agents\n' \
-    "$WINDOW" "$WARMUP" "$DURATION" "$SERVER_CPU" "$LOADGEN_CPU" "$DEVICES"
+  printf '\nwindow %s, %s s warm-up + %s s measured, server on CPU %s, load generator on CPU %s\n' \
+    "$WINDOW" "$WARMUP" "$DURATION" "$SERVER_CPU" "$LOADGEN_CPU"
+  printf 'Tessel runs %s agents: every workload but spread goes to one of them (%s), as to the other\n' \
+    "$DEVICES" "$TESSEL_ADDRESS"
+  printf "servers' one agent; spread sends the Get round robin to all %s. get-paced: the Get paced at\n" \
+    "$DEVICES"
+  printf 'half the rate each server sustained in get.\n'
+  printf 'targets: Get and GetNext >= 1.5 x snmpd, GetBulk >= 2 x snmpd, all >= 50 x snmpsim, Get >= 40 %% of echo\n'
+  if wanted spread; then
+    printf 'spread: Tessel Get over %s agents / over one: %s (target >= 0.90)\n' "$DEVICES" \
+      "$(ratio "$(cell tessel spread rate)" "$(cell tessel get rate)")"
+  fi
+  if wanted get-paced; then
+    printf 'latency: Tessel p99 at %s Gets/s (half its saturated rate): %s us (target <= 2000 us)\n' \
+      "$(cell tessel get-paced rate)" "$(cell tessel get-paced p99_us)"
+  fi
   if wanted get-v3; then
     printf 'get-v3: SNMPv3 authPriv (HMAC-SHA-96, AES-128) Get of sysName.0; v3/v2c Get in this run: tessel %s, snmpd %s\n' \
       "$(ratio "$(cell tessel get-v3 rate)" "$(cell tessel get rate)")" \
