@@ -14,7 +14,8 @@
 #   BENCH_WINDOW [64]  outstanding requests       BENCH_DEVICES [10000]  Tessel agents
 #   BENCH_SERVER_CPU [0]  BENCH_LOADGEN_CPU [1]
 #   BENCH_SNMPD_PORT [11161]  BENCH_TESSEL_PORT [11171]  BENCH_SNMPSIM_PORT [11181]
-#   BENCH_ECHO_PORT [12000]
+#   BENCH_ECHO_PORT [12000]  BENCH_ECHO_SPREAD_ADDRESS [127.4.0.1]  first of the echo server's
+#     sockets for spread (as many as Tessel has agents)
 #   BENCH_TESSEL_ADDRESS [127.0.1.1]  BENCH_TESSEL_START_TIMEOUT [300] seconds
 #   BENCH_SKIP [""]  any of "tessel snmpd snmpsim echo" to leave out (snmpsim needs snmpd)
 #   BENCH_WORKLOADS ["get get-paced getnext getbulk get-v3 spread"]  the workloads to run, in
@@ -38,6 +39,7 @@ SNMPD_PORT=${BENCH_SNMPD_PORT:-11161}
 TESSEL_PORT=${BENCH_TESSEL_PORT:-11171}
 ECHO_PORT=${BENCH_ECHO_PORT:-12000}
 SNMPSIM_PORT=${BENCH_SNMPSIM_PORT:-11181}
+ECHO_SPREAD_ADDRESS=${BENCH_ECHO_SPREAD_ADDRESS:-127.4.0.1}
 TESSEL_ADDRESS=${BENCH_TESSEL_ADDRESS:-127.0.1.1}
 TESSEL_START_TIMEOUT=${BENCH_TESSEL_START_TIMEOUT:-300}
 SKIP=${BENCH_SKIP:-}
@@ -174,6 +176,22 @@ run_echo() {
     log "the echo server did not answer"
   fi
   finish_server "$group"
+  if wanted spread; then run_echo_spread "$bound"; fi
+}
+
+# The echo server on as many sockets as Tessel has agents, the Get round robin over them: the
+# machine's own ceiling when every request comes to another socket.
+run_echo_spread() {
+  local first=$ECHO_SPREAD_ADDRESS last
+  last=$(address_plus "$first" $((DEVICES - 1)))
+  start_server echo "$ECHO" --address "$first+$DEVICES" --port "$ECHO_PORT" --duration "$1"
+  local group=$SERVER_GROUP
+  if wait_for_answer "$first,$last" "$ECHO_PORT" 30 "$group"; then
+    measure echo spread "$first+$DEVICES" "$ECHO_PORT"
+  else
+    log "the echo server on $DEVICES sockets did not answer"
+  fi
+  finish_server "$group"
 }
 
 # Tessel serves DEVICES agents; the workloads go to the first, as to the other servers' one
@@ -266,7 +284,8 @@ print_table() {
     echo=$(cell echo "$workload" rate)
     ratios=(- - -)
     case $workload in
-      get-paced | spread) ;;  # a rate asked for, and a Tessel-only figure: nothing to compare
+      get-paced) ;;  # a rate asked for: nothing to compare
+      spread) ratios=(- - "$(ratio "$tessel" "$echo" 100)") ;;
       *) ratios=("$(ratio "$tessel" "$snmpd")" "$(ratio "$tessel" "$snmpsim")" "$(ratio "$tessel" "$echo" 100)") ;;
     esac
     # shellcheck disable=SC2059
@@ -283,8 +302,10 @@ print_table() {
   printf 'half the rate each server sustained in get.\n'
   printf 'targets: Get and GetNext >= 1.5 x snmpd, GetBulk >= 2 x snmpd, all >= 50 x snmpsim, Get >= 40 %% of echo\n'
   if wanted spread; then
-    printf 'spread: Tessel Get over %s agents / over one: %s (target >= 0.90)\n' "$DEVICES" \
-      "$(ratio "$(cell tessel spread rate)" "$(cell tessel get rate)")"
+    printf 'spread: Tessel Get over %s agents / over one: %s (target >= 0.90); the echo server over %s\n' \
+      "$DEVICES" "$(ratio "$(cell tessel spread rate)" "$(cell tessel get rate)")" "$DEVICES"
+    printf 'sockets / over one: %s (the cost of a socket per request on this machine)\n' \
+      "$(ratio "$(cell echo spread rate)" "$(cell echo get rate)")"
   fi
   if wanted get-paced; then
     printf 'latency: Tessel p99 at %s Gets/s (half its saturated rate): %s us (target <= 2000 us)\n' \
