@@ -131,6 +131,11 @@ TEST_F(ServiceTest, EveryAgentAnswersFromItsOwnAddressAndPort) {
   EXPECT_TRUE(StopAgent("127.77.0.1", kBasePort));
   EXPECT_FALSE(manager.Ask(GetSysName(), "127.77.0.1", kBasePort));
   EXPECT_TRUE(manager.Ask(GetSysName(), "127.77.0.2", kBasePort + 1));
+  // Its socket is closed: the address and port are free again.
+  int other = socket(AF_INET, SOCK_DGRAM, 0);
+  sockaddr_in released = Address("127.77.0.1", kBasePort);
+  EXPECT_EQ(bind(other, reinterpret_cast<sockaddr*>(&released), sizeof released), 0);
+  close(other);
   StopSnmpGeneralServices();
   EXPECT_EQ(LiveServiceThreads(), 0);
 }
