@@ -20,6 +20,7 @@
 #include "snmp/message.h"
 #include "snmp/statistics.h"
 #include "transport/agent_sockets.h"
+#include "transport/socket_batch.h"
 #include "transport/udp.h"
 #include "transport/udp_batch.h"
 
@@ -30,6 +31,10 @@ namespace {
 constexpr std::uint64_t kStopTag = 1ull << 32;
 constexpr std::uint64_t kWildcardTag = 2ull << 32;
 constexpr std::uint64_t kDescriptorMask = 0xFFFFFFFFull;
+
+// Up to this many ready agent sockets are read socket by socket, each with one recvmmsg (busy
+// agents hold many requests each); more are read together, one request each.
+constexpr std::size_t kFewSockets = 8;
 
 // The engine-wide sockets: IPv4 and IPv6 wildcards on the SNMP port and the notification socket.
 struct WildcardSockets {
@@ -118,9 +123,27 @@ bool ReleaseWildcardPort(std::uint16_t port) {
 // What one service thread reuses from request to request.
 struct ThreadState {
   UdpBatch batch;
+  std::unique_ptr<SocketBatch> spread = SocketBatch::Create();  // null without io_uring
   AgentSession request;  // the agent's session with the peer of the request at hand
   std::vector<std::uint8_t> buffer = std::vector<std::uint8_t>(kUdpReceiveBuffer);
 };
+
+// Runs one request through message processing into reply (capacity *length). request is the
+// agent's session; it gets the datagram's peer. False when nothing is to be sent.
+bool Answer(const sockaddr_storage& peer, std::span<const std::uint8_t> datagram,
+            std::uint8_t* reply, std::size_t* length, AgentSession& request) {
+  SetPeer(peer, &request.transport);
+  LOG_TRACE("Received Packet from %s : at %d", request.transport.peerAddress.c_str(),
+            request.transport.peerPort);
+  if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply, length, request) !=
+      kMessageReply) {
+    LOG_ERROR("ProcessSnmpPDU() is failed. ");
+    return false;
+  }
+  if (*length == 0) return false;
+  LOG_TRACE("The length of the pkt to send is %zu", *length);
+  return true;
+}
 
 // Answers what a ready agent socket holds: one batch in, one batch out. One batch per wake-up,
 // so that one busy agent cannot starve the others of its shard.
@@ -132,20 +155,36 @@ void ServeAgentSocket(int descriptor, ThreadState& state) {
   if (count == 0) return;
   state.request = agent->Session();
   for (std::size_t i = 0; i < count; ++i) {
-    SetPeer(batch.Peer(i), &state.request.transport);
-    std::span<const std::uint8_t> datagram = batch.Datagram(i);
-    LOG_TRACE("Received Packet from %s : at %d", state.request.transport.peerAddress.c_str(),
-              state.request.transport.peerPort);
-    std::size_t replyLength = batch.ReplyCapacity();
-    if (ProcessSnmpMessage(datagram.data(), datagram.size(), batch.ReplyBuffer(i), &replyLength,
-                           state.request) != kMessageReply) {
-      LOG_ERROR("ProcessSnmpPDU() is failed. ");
-    } else if (replyLength > 0) {
-      LOG_TRACE("The length of the pkt to send is %zu", replyLength);
-      batch.QueueReply(i, replyLength);
-    }
+    std::size_t length = batch.ReplyCapacity();
+    if (Answer(batch.Peer(i), batch.Datagram(i), batch.ReplyBuffer(i), &length, state.request))
+      batch.QueueReply(i, length);
   }
   batch.SendQueued(agent->Descriptor());
+}
+
+// Answers one request from each of many ready agent sockets with two system calls in all.
+void ServeAgentSockets(std::span<const int> descriptors, ThreadState& state) {
+  std::array<std::shared_ptr<const AgentSocket>, SocketBatch::kSize> agents;
+  std::array<int, SocketBatch::kSize> sockets;
+  std::size_t count = 0;
+  for (int descriptor : descriptors) {
+    if (count == SocketBatch::kSize) break;
+    if (std::shared_ptr<const AgentSocket> agent = FindAgentSocket(descriptor)) {
+      sockets[count] = agent->Descriptor();
+      agents[count++] = std::move(agent);
+    }
+  }
+  SocketBatch& batch = *state.spread;
+  std::size_t received = batch.Receive(std::span<const int>(sockets.data(), count));
+  for (std::size_t i = 0; i < received; ++i) {
+    const AgentSocket& agent = *agents[batch.Source(i)];
+    state.request = agent.Session();
+    std::size_t length = batch.ReplyCapacity();
+    if (Answer(batch.Peer(i), batch.Datagram(i), batch.ReplyBuffer(i), &length, state.request))
+      batch.QueueReply(i, length);
+  }
+  batch.SendQueued();
+  if (batch.Broken()) state.spread.reset();
 }
 
 bool IsWildcardLocked(const WildcardSockets& wildcards, int socket) {
@@ -204,27 +243,41 @@ void ServeWildcardSocket(int socket, ThreadState& state) {
   }
 }
 
+// Runs serve; a failed allocation drops what it was answering, never the thread.
+template <typename Serve>
+void Guarded(Serve serve) {
+  try {
+    serve();
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("Unable to allocate buffer !!! \n");
+  }
+}
+
 // Waits on the shard's epoll until the stop event; serves each ready socket on this thread.
 void ServiceThread(int epoll) {
   auto state = std::make_unique<ThreadState>();
-  std::array<epoll_event, 64> events;
+  std::array<epoll_event, SocketBatch::kSize> events;
+  std::vector<int> agentSockets;
+  agentSockets.reserve(events.size());
   for (bool running = true; running;) {
     int ready = epoll_wait(epoll, events.data(), static_cast<int>(events.size()), -1);
     if (ready < 0 && errno != EINTR) LOG_ERROR("Error in response select %d", errno);
+    agentSockets.clear();
     for (int i = 0; i < ready; ++i) {
       std::uint64_t tag = events[static_cast<std::size_t>(i)].data.u64;
       auto descriptor = static_cast<int>(tag & kDescriptorMask);
-      try {
-        if (tag == (kStopTag | static_cast<std::uint64_t>(TheService().stopEvent))) {
-          running = false;
-        } else if ((tag & ~kDescriptorMask) == kWildcardTag) {
-          ServeWildcardSocket(descriptor, *state);
-        } else {
-          ServeAgentSocket(descriptor, *state);
-        }
-      } catch (const std::bad_alloc&) {
-        LOG_ERROR("Unable to allocate buffer !!! \n");
+      if (tag == (kStopTag | static_cast<std::uint64_t>(TheService().stopEvent))) {
+        running = false;
+      } else if ((tag & ~kDescriptorMask) == kWildcardTag) {
+        Guarded([&] { ServeWildcardSocket(descriptor, *state); });
+      } else {
+        agentSockets.push_back(descriptor);
       }
+    }
+    if (agentSockets.size() > kFewSockets && state->spread) {
+      Guarded([&] { ServeAgentSockets(agentSockets, *state); });
+    } else {
+      for (int descriptor : agentSockets) Guarded([&] { ServeAgentSocket(descriptor, *state); });
     }
   }
   TheService().liveThreads.fetch_sub(1);

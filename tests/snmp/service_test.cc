@@ -7,6 +7,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <map>
 #include <set>
 
 #include "engine/agent_registry.h"
@@ -30,6 +31,12 @@ sockaddr_in Address(const char* text, std::uint16_t port) {
   return address;
 }
 
+std::string SourceText(const sockaddr_in& source) {
+  char text[INET_ADDRSTRLEN] = {};
+  inet_ntop(AF_INET, &source.sin_addr, text, sizeof text);
+  return std::string(text) + ":" + std::to_string(ntohs(source.sin_port));
+}
+
 // A manager's socket on loopback.
 class Manager {
  public:
@@ -45,12 +52,16 @@ class Manager {
     sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
            sizeof to);
   }
-  // The next answer within two seconds.
-  std::optional<SnmpPdu> Receive() {
+  // The next answer within two seconds; its source in *from.
+  std::optional<SnmpPdu> Receive(std::string* from = nullptr) {
     pollfd ready{socket_, POLLIN, 0};
     if (poll(&ready, 1, 2000) != 1) return std::nullopt;
     std::vector<std::uint8_t> reply(kMaxSnmpMessage);
-    ssize_t length = recv(socket_, reply.data(), reply.size(), 0);
+    sockaddr_in source{};
+    socklen_t sourceLength = sizeof source;
+    ssize_t length = recvfrom(socket_, reply.data(), reply.size(), 0,
+                              reinterpret_cast<sockaddr*>(&source), &sourceLength);
+    if (from) *from = SourceText(source);
     SnmpPdu pdu;
     if (length <= 0 || ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1)
       return std::nullopt;
@@ -70,9 +81,7 @@ class Manager {
     ssize_t length = recvfrom(socket_, reply.data(), reply.size(), 0,
                               reinterpret_cast<sockaddr*>(&source), &sourceLength);
     if (length <= 0) return std::nullopt;
-    char text[INET_ADDRSTRLEN] = {};
-    inet_ntop(AF_INET, &source.sin_addr, text, sizeof text);
-    if (from) *from = std::string(text) + ":" + std::to_string(ntohs(source.sin_port));
+    if (from) *from = SourceText(source);
     SnmpPdu pdu;
     if (ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1)
       return std::nullopt;
@@ -162,6 +171,36 @@ TEST_F(ServiceTest, QueuedRequestsAreAllAnsweredToTheirOwnRequestIds) {
   while (std::optional<SnmpPdu> reply = manager.Receive()) {
     EXPECT_EQ(reply->requestVarBinds.at(0).value, VarValue::Octets(kAsnOctetString, "r1"));
     answered.insert(reply->requestId);
+    if (answered.size() == expected.size()) break;
+  }
+  EXPECT_EQ(answered, expected);
+}
+
+// Requests to many agents at once, each agent's socket holding one: every one is answered from
+// the address it was sent to, whether the sockets are read together or one by one.
+TEST_F(ServiceTest, RequestsToManyAgentsAtOnceAreAnsweredByEach) {
+  constexpr int kAgents = 12;
+  for (int i = 0; i < kAgents; ++i) {
+    std::string address = "127.77.1." + std::to_string(i + 1);
+    ASSERT_GT(FillAgentInfoAndStartAgent(Agent(address.c_str(), kBasePort + 50)), 0);
+  }
+  ASSERT_TRUE(InitSnmpGeneralServices());
+  Manager manager;
+  std::map<std::int32_t, std::string> expected;
+  for (int round = 0; round < 3; ++round) {
+    for (int i = 0; i < kAgents; ++i) {
+      Request request;
+      request.requestId = round * 100 + i;
+      request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
+      std::string address = "127.77.1." + std::to_string(i + 1);
+      manager.Send(EncodeRequest(request), address.c_str(), kBasePort + 50);
+      expected[request.requestId] = address + ":" + std::to_string(kBasePort + 50);
+    }
+  }
+  std::map<std::int32_t, std::string> answered;
+  std::string from;
+  while (std::optional<SnmpPdu> reply = manager.Receive(&from)) {
+    answered[reply->requestId] = from;
     if (answered.size() == expected.size()) break;
   }
   EXPECT_EQ(answered, expected);
