@@ -1,6 +1,9 @@
 #include "transport/socket_batch.h"
 
+#include <sys/utsname.h>
+
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 
@@ -19,9 +22,22 @@ struct SocketBatch::Ring {
   ~Ring() { io_uring_queue_exit(&ring); }
 };
 
+namespace {
+
+// Reads that honour MSG_DONTWAIT (never left waiting for data) need a kernel of 6.0 or later.
+bool KernelSuffices() {
+  utsname system{};
+  int major = 0;
+  int minor = 0;
+  return uname(&system) == 0 && std::sscanf(system.release, "%d.%d", &major, &minor) == 2 &&
+         major >= 6;
+}
+
+}  // namespace
+
 std::unique_ptr<SocketBatch> SocketBatch::Create() {
   const char* choice = std::getenv("TESSEL_IO");
-  if (choice != nullptr && std::strcmp(choice, "epoll") == 0) return nullptr;
+  if ((choice != nullptr && std::strcmp(choice, "epoll") == 0) || !KernelSuffices()) return nullptr;
   auto ring = std::make_unique<Ring>();
   // Every entry of a batch completes during its submission (MSG_DONTWAIT): twice the batch
   // leaves room without ever filling the completion queue.
@@ -83,11 +99,13 @@ std::size_t SocketBatch::Receive(std::span<const int> sockets) {
   Complete(count);
   std::size_t received = 0;
   for (std::size_t k = 0; k < count; ++k) {
-    if (results_[k] < 0) {
-      if (results_[k] != -EAGAIN && results_[k] != -ECANCELED)
-        LOG_ERROR("Error while receiving a SNMP messge !!!!");
-      continue;
+    if (results_[k] == -EINVAL || results_[k] == -EOPNOTSUPP) {
+      LOG_ERROR("io_uring cannot read sockets here: sockets are read one by one from now");
+      broken_ = true;
+    } else if (results_[k] < 0 && results_[k] != -EAGAIN && results_[k] != -ECANCELED) {
+      LOG_ERROR("Error while receiving a SNMP messge !!!!");
     }
+    if (results_[k] < 0) continue;
     Slot& slot = slots_[k];
     slot.length =
         (slot.header.msg_flags & MSG_TRUNC) ? kBufferSize : static_cast<std::size_t>(results_[k]);
