@@ -65,14 +65,7 @@ MicroAgent::MicroAgent(int extraGroups) {
     host_.SetValue("1.3.6.1.2.1.2.2.1.2." + n, "eth" + n);
     host_.SetValue("1.3.6.1.2.1.2.2.1.10." + n, std::to_string(1000 * i));
   }
-  auto info = std::make_shared<AgentInfo>();
-  info->readCommunities.Append("public");
-  info->databaseName = "db";
-  info->tableName = "agent1";
-  info->agentId = 1;
-  session_.agentInfo = info;
-  session_.transport.localAddress = "127.0.0.1";
-  session_.transport.localPort = 160;
+  session_ = LocalAgent(1);
   session_.transport.peerAddress = "127.0.0.2";
 }
 

@@ -47,13 +47,7 @@ AgentSession* SetUpAgent() {
     host.SetValue(std::string("1.3.6.1.2.1.2.2.1.6.") + row, "10.0.0.1");
     host.SetValue(std::string("1.3.6.1.2.1.2.2.1.10.") + row, "18446744073709551615");
   }
-  static AgentSession agent;
-  auto info = std::make_shared<AgentInfo>();
-  info->readCommunities.Append("public");
-  info->writeCommunities.Append("private");
-  agent.agentInfo = info;
-  agent.transport.localAddress = "127.0.0.1";
-  agent.transport.localPort = 160;
+  static AgentSession agent = LocalAgent(1);
   return &agent;
 }
 

@@ -44,12 +44,8 @@ AgentSession* SetUpAgent() {
   CreateAndAddSnmpVacmViewTreeFamilyTableEntry("all", "1.3", "", 1, 3);
   CreateLCDVacmAccessTable();
   CreateLCDVacmViewTreeFamilyTable();
-  static AgentSession agent;
-  auto info = std::make_shared<AgentInfo>();
-  info->engineBoots = 1;
-  agent.agentInfo = info;
-  agent.transport.localAddress = "127.0.0.1";
-  agent.transport.localPort = 160;
+  static AgentSession agent = LocalAgent(1);
+  agent.agentInfo->engineBoots = 1;
   return &agent;
 }
 

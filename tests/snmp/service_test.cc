@@ -46,7 +46,6 @@ class Manager {
   }
   ~Manager() { close(socket_); }
 
-  // Sends the datagram and waits (at most two seconds) for one answer; its source in *from.
   void Send(const std::vector<std::uint8_t>& datagram, const char* agent, std::uint16_t port) {
     sockaddr_in to = Address(agent, port);
     sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
@@ -68,24 +67,11 @@ class Manager {
     return pdu;
   }
 
+  // Sends the datagram and waits for one answer.
   std::optional<SnmpPdu> Ask(const std::vector<std::uint8_t>& datagram, const char* agent,
                              std::uint16_t port, std::string* from = nullptr) {
-    sockaddr_in to = Address(agent, port);
-    sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
-           sizeof to);
-    pollfd ready{socket_, POLLIN, 0};
-    if (poll(&ready, 1, 2000) != 1) return std::nullopt;
-    std::vector<std::uint8_t> reply(kMaxSnmpMessage);
-    sockaddr_in source{};
-    socklen_t sourceLength = sizeof source;
-    ssize_t length = recvfrom(socket_, reply.data(), reply.size(), 0,
-                              reinterpret_cast<sockaddr*>(&source), &sourceLength);
-    if (length <= 0) return std::nullopt;
-    if (from) *from = SourceText(source);
-    SnmpPdu pdu;
-    if (ParseSnmpMessage(reply.data(), static_cast<std::size_t>(length), &pdu) != 1)
-      return std::nullopt;
-    return pdu;
+    Send(datagram, agent, port);
+    return Receive(from);
   }
 
  private:

@@ -102,4 +102,18 @@ HostAnswer MemoryHost::TableSetOidVal(const HostValueQuery& query) {
   return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
 }
 
+AgentSession LocalAgent(std::int32_t agentId) {
+  auto info = std::make_shared<AgentInfo>();
+  info->readCommunities.Append("public");
+  info->writeCommunities.Append("private");
+  info->databaseName = "db";
+  info->tableName = "agent1";
+  info->agentId = agentId;
+  AgentSession agent;
+  agent.agentInfo = std::move(info);
+  agent.transport.localAddress = "127.0.0.1";
+  agent.transport.localPort = 160;
+  return agent;
+}
+
 }  // namespace tessel

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "base/conversions.h"
+#include "engine/agent.h"
 #include "engine/host_bridge.h"
 
 namespace tessel {
@@ -47,5 +48,9 @@ class MemoryHost : public HostBridge {
   std::vector<std::string> statusLines_;
   std::vector<HostValueQuery> setCalls_;
 };
+
+// The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community
+// "public", the write community "private", database "db" and table "agent1".
+AgentSession LocalAgent(std::int32_t agentId);
 
 }  // namespace tessel

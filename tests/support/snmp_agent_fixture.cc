@@ -103,15 +103,7 @@ void SnmpAgentTest::SetUp() {
     host_.SetValue("1.3.6.1.2.1.31.1.1.1.1." + n, "eth" + n);
     host_.SetValue("1.3.6.1.2.1.31.1.1.1.6." + n, "4294967296");
   }
-  auto info = std::make_shared<AgentInfo>();
-  info->readCommunities.Append("public");
-  info->writeCommunities.Append("private");
-  info->databaseName = "db";
-  info->tableName = "agent1";
-  info->agentId = 7;
-  agent_.agentInfo = info;
-  agent_.transport.localAddress = "127.0.0.1";
-  agent_.transport.localPort = 160;
+  agent_ = LocalAgent(7);
   agent_.transport.peerAddress = "127.0.0.9";
 }
 
