@@ -8,6 +8,7 @@
 #include <cstring>
 
 #include "engine/log.h"
+#include "transport/udp.h"
 
 #if TESSEL_HAVE_URING
 #include <liburing.h>
@@ -120,8 +121,7 @@ void SocketBatch::QueueReply(std::size_t i, std::size_t length) {
   slot.data = {slot.reply.data(), length};
   slot.header = msghdr{};
   slot.header.msg_name = &slot.peer;
-  slot.header.msg_namelen =
-      slot.peer.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
+  slot.header.msg_namelen = SocketAddressLength(slot.peer.ss_family);
   slot.header.msg_iov = &slot.data;
   slot.header.msg_iovlen = 1;
   queued_[queuedCount_++] = k;

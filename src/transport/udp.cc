@@ -70,7 +70,7 @@ std::string AddressText(const PeerSocketAddress& address, std::uint16_t* port) {
 }
 
 socklen_t AddressLength(const PeerSocketAddress& address) {
-  return address.any.sa_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
+  return SocketAddressLength(address.any.sa_family);
 }
 
 // The destination address that IP_PKTINFO / IPV6_PKTINFO reported, if any.
@@ -184,8 +184,7 @@ bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::
 }
 
 void SetPeer(const sockaddr_storage& peer, TransportDomainInfo* transport) {
-  std::memcpy(&transport->peerSockAddr, &peer,
-              peer.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
+  std::memcpy(&transport->peerSockAddr, &peer, SocketAddressLength(peer.ss_family));
   transport->peerAddress = AddressText(transport->peerSockAddr, &transport->peerPort);
 }
 

@@ -3,6 +3,9 @@
 // reply from a chosen local address. Sockets are non-blocking. Stateless; safe from any thread.
 #pragma once
 
+#include <netinet/in.h>
+#include <sys/socket.h>
+
 #include <cstddef>
 #include <cstdint>
 #include <string>
@@ -29,6 +32,11 @@ void CloseUdpSocket(int socket);
 // could be read.
 bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::size_t* length,
                    TransportDomainInfo* transport);
+
+// The length of a socket address of this family (IPv6, else IPv4).
+inline socklen_t SocketAddressLength(sa_family_t family) {
+  return family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
+}
 
 // Makes peer the transport's peer: its socket address, address text and port.
 void SetPeer(const sockaddr_storage& peer, TransportDomainInfo* transport);

@@ -3,6 +3,7 @@
 #include <cerrno>
 
 #include "engine/log.h"
+#include "transport/udp.h"
 
 namespace tessel {
 
@@ -47,7 +48,7 @@ void UdpBatch::QueueReply(std::size_t i, std::size_t length) {
   msghdr& header = outgoing_[queued_].msg_hdr;
   header = msghdr{};
   header.msg_name = &peers_[i];
-  header.msg_namelen = peers_[i].ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
+  header.msg_namelen = SocketAddressLength(peers_[i].ss_family);
   header.msg_iov = &replyData_[queued_];
   header.msg_iovlen = 1;
   ++queued_;
