@@ -24,10 +24,14 @@ union PeerSocketAddress {
   sockaddr_in6 v6;
 };
 
+// The socket of an agent that has none.
+inline constexpr std::int64_t kNoSocket = -1;
+
 struct TransportDomainInfo {
-  std::uint16_t localPort = 0;  // agents: the configured port minus one
+  // Agents keep their configured port minus one here (the host's Set calls are given it as kept).
+  std::uint16_t configuredPortMinusOne = 0;
   std::uint16_t peerPort = 0;
-  std::int64_t socket = 0;
+  std::int64_t socket = kNoSocket;
   std::int32_t isIPv6 = 0;
   std::string localAddress;
   std::string peerAddress;
@@ -68,16 +72,26 @@ struct AgentInfo {
   CommunityList writeCommunities;
   std::int32_t agentId = 0;
   std::atomic<std::uint32_t> engineTime{0};
-  std::string agentKey;  // "address#port", at most 47 characters
+  std::string agentKey;  // AgentKey of its address and configured port
   std::atomic<std::uint32_t> engineBoots{0};
   std::uint32_t startTime = 0;  // wall-clock seconds at registration: the base of its uptime
 };
 
 struct AgentSession {
-  std::int64_t socket = 0;
+  std::int64_t socket = kNoSocket;
   TransportDomainInfo transport;
   std::shared_ptr<AgentInfo> agentInfo;
 };
+
+// The port an agent was configured with.
+inline std::uint16_t ConfiguredPort(const TransportDomainInfo& transport) {
+  return static_cast<std::uint16_t>(transport.configuredPortMinusOne + 1u);
+}
+
+// "address#port", the name of an agent (also its default SNMPv3 engine ID, cut to size there).
+inline std::string AgentKey(const std::string& address, std::uint16_t port) {
+  return address + "#" + std::to_string(port);
+}
 
 // A session copy for one request or for the address table: own transport, shared AgentInfo.
 inline AgentSession CopyAgentSession(const AgentSession& session) { return session; }

@@ -1,6 +1,7 @@
 #include "engine/agent_registry.h"
 
-#include <algorithm>
+#include <unistd.h>
+
 #include <cstdio>
 #include <memory>
 #include <mutex>
@@ -16,17 +17,14 @@
 namespace tessel {
 namespace {
 
-constexpr std::size_t kAgentKeyLength = 47;
-
-// One mutex guards the ordered session list, the address table and the socket bookkeeping.
-// The transport's opener and closer run under it, so they must not call back into the registry.
+// One mutex guards the ordered session list and the address table. The transport's opener and
+// closer run under it, so they must not call back into the registry.
 struct Registry {
   std::mutex mutex;
   std::vector<std::unique_ptr<AgentSession>> sessions;  // registration order
   std::unordered_map<std::string, AgentSession> addressTable;
   SessionOpener opener;
   SessionCloser closer;
-  std::int64_t maxSocket = 0;
 };
 
 Registry& TheRegistry() {
@@ -44,23 +42,36 @@ void ApplyTrapPortRule(std::uint16_t port) {
   if (trapPort == port || trapPort == 0) gv_trapPort = static_cast<std::uint16_t>(port + 1u);
 }
 
-std::string AgentKey(const std::string& address, std::uint16_t port) {
-  std::string key = address + "#" + std::to_string(port);
-  if (key.size() > kAgentKeyLength) key.resize(kAgentKeyLength);
-  return key;
-}
-
+// An agent socket never sits on a standard descriptor, so an opener's 0 is a failure too.
 std::int64_t OpenSessionLocked(Registry& registry, AgentSession& session) {
-  return registry.opener ? registry.opener(session) : 0;
+  std::int64_t socket = registry.opener ? registry.opener(session) : kNoSocket;
+  return socket > STDERR_FILENO ? socket : kNoSocket;
 }
 
 void CloseSocketLocked(Registry& registry, std::int64_t socket) {
-  if (socket != 0 && registry.closer) registry.closer(socket);
+  if (socket != kNoSocket && registry.closer) registry.closer(socket);
 }
 
-// The largest socket handle seen; it only ever grows.
-void NoteSocketLocked(Registry& registry, std::int64_t socket) {
-  registry.maxSocket = std::max(registry.maxSocket, socket);
+// The session now holds socket (kNoSocket: none) and is started exactly when it holds one.
+void HoldSocket(AgentSession& session, std::int64_t socket) {
+  session.socket = socket;
+  session.transport.socket = socket;
+  session.agentInfo->started = socket != kNoSocket ? 1 : 0;
+}
+
+// Drops the address entry of a session that leaves the registry, if the entry is its own: the
+// latest remaining registration on that address takes it over, else it goes.
+void ForgetAddressLocked(Registry& registry, const AgentSession& leaving) {
+  const std::string& address = leaving.transport.localAddress;
+  auto entry = registry.addressTable.find(address);
+  if (entry == registry.addressTable.end() || entry->second.agentInfo != leaving.agentInfo) return;
+  for (auto it = registry.sessions.rbegin(); it != registry.sessions.rend(); ++it) {
+    if (it->get() != &leaving && (*it)->transport.localAddress == address) {
+      entry->second = CopyAgentSession(**it);
+      return;
+    }
+  }
+  registry.addressTable.erase(entry);
 }
 
 std::vector<std::unique_ptr<AgentSession>>::iterator FindSessionLocked(Registry& registry,
@@ -69,7 +80,8 @@ std::vector<std::unique_ptr<AgentSession>>::iterator FindSessionLocked(Registry&
   std::uint16_t storedPort = StoredPort(port);
   for (auto it = registry.sessions.begin(); it != registry.sessions.end(); ++it) {
     const TransportDomainInfo& transport = (*it)->transport;
-    if (transport.localAddress == address && transport.localPort == storedPort) return it;
+    if (transport.localAddress == address && transport.configuredPortMinusOne == storedPort)
+      return it;
   }
   return registry.sessions.end();
 }
@@ -80,7 +92,7 @@ std::unique_ptr<AgentSession> NewSession(const AgentRegistration& registration) 
   session->transport.isIPv6 = registration.ipv6Flag;
   session->transport.localAddress = registration.address;
   ApplyTrapPortRule(registration.port);
-  session->transport.localPort = StoredPort(registration.port);
+  session->transport.configuredPortMinusOne = StoredPort(registration.port);
   gv_snmpPort = registration.port;
   auto info = std::make_shared<AgentInfo>();
   info->databaseName = registration.databaseName;
@@ -116,21 +128,15 @@ std::string NotStartedText(std::int32_t port, const std::string& address) {
   return line;
 }
 
-// Stores the session's socket and publishes it; returns the socket (0: not opened, the agent
-// then leaves the address table and is not kept).
+// Opens the session's socket and, when it opened, keeps and publishes the session; returns the
+// socket (kNoSocket: not opened, and nothing changed).
 std::int64_t OpenAndKeepLocked(Registry& registry, std::unique_ptr<AgentSession> session) {
-  const std::string address = session->transport.localAddress;
-  registry.addressTable.insert_or_assign(address, CopyAgentSession(*session));
   std::int64_t socket = OpenSessionLocked(registry, *session);
-  if (socket == 0) {
-    registry.addressTable.erase(address);
-    return 0;
-  }
-  session->socket = socket;
-  session->transport.socket = socket;
-  registry.addressTable.insert_or_assign(address, CopyAgentSession(*session));
+  if (socket == kNoSocket) return kNoSocket;
+  HoldSocket(*session, socket);
+  registry.addressTable.insert_or_assign(session->transport.localAddress,
+                                         CopyAgentSession(*session));
   registry.sessions.push_back(std::move(session));
-  NoteSocketLocked(registry, socket);
   return socket;
 }
 
@@ -157,23 +163,22 @@ void InstallSessionTransport(SessionOpener opener, SessionCloser closer) {
 
 std::int64_t FillAgentInfoAndStartAgent(const AgentRegistration& registration) {
   LOG_TRACE("\n\t@@@@@ Inside FillAgentInfoAndStartAgent() @@@@@ \n");
-  std::int64_t socket = 0;
+  std::int64_t socket = kNoSocket;
   try {
     std::unique_ptr<AgentSession> session = NewSession(registration);
     AgentInfo& info = *session->agentInfo;
     AppendSplit(info.readCommunities, registration.readCommunities);
     AppendSplit(info.writeCommunities, registration.writeCommunities);
     info.engineBoots = registration.engineBoots;
-    info.started = 1;
     Registry& registry = TheRegistry();
     std::lock_guard<std::mutex> lock(registry.mutex);
     socket = OpenAndKeepLocked(registry, std::move(session));
   } catch (const std::bad_alloc&) {
     LOG_ERROR("Memory allocation failure ...\n");
-    return -1;
+    return kOutOfMemory;
   }
-  PrintStatus(socket != 0 ? StartedText(registration.port, registration.address)
-                          : NotStartedText(registration.port, registration.address));
+  PrintStatus(socket != kNoSocket ? StartedText(registration.port, registration.address)
+                                  : NotStartedText(registration.port, registration.address));
   return socket;
 }
 
@@ -219,19 +224,15 @@ bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t eng
       return false;
     }
     AgentSession& session = **found;
-    std::int64_t socket = OpenSessionLocked(registry, session);
-    if (socket != 0) {
-      // A second start replaces the agent's socket; the one it replaces would otherwise leak.
-      if (session.agentInfo->started.load()) CloseSocketLocked(registry, session.socket);
-      session.socket = socket;
-      session.transport.socket = socket;
-      session.agentInfo->started = 1;
+    // A running agent stays on its socket: a second bind of its port could only fail.
+    if (!session.agentInfo->started.load())
+      HoldSocket(session, OpenSessionLocked(registry, session));
+    if (session.agentInfo->started.load()) {
       session.agentInfo->engineBoots = engineBoots;
       LOG_TRACE("The engine boot count value @ start is : %ld\n", static_cast<long>(engineBoots));
-      NoteSocketLocked(registry, socket);
       return true;
     }
-    session.agentInfo->started = 0;
+    ForgetAddressLocked(registry, session);
     registry.sessions.erase(found);
   }
   PrintStatus(NotStartedText(port, address));
@@ -248,8 +249,8 @@ bool StopAgent(const std::string& address, std::int32_t port) {
     return false;
   }
   if ((*found)->agentInfo->started.load()) {
-    (*found)->agentInfo->started = 0;
     CloseSocketLocked(registry, (*found)->socket);
+    HoldSocket(**found, kNoSocket);
     registry.sessions.erase(found);
   }
   registry.addressTable.erase(address);
@@ -262,14 +263,7 @@ bool RestartAgent(std::int32_t index) {
   std::lock_guard<std::mutex> lock(registry.mutex);
   if (index < 0 || static_cast<std::size_t>(index) >= registry.sessions.size()) return false;
   AgentSession& session = *registry.sessions[static_cast<std::size_t>(index)];
-  if (session.agentInfo->started.load()) return true;
-  std::int64_t socket = OpenSessionLocked(registry, session);
-  if (socket != 0) {
-    session.socket = socket;
-    session.transport.socket = socket;
-    session.agentInfo->started = 1;
-    NoteSocketLocked(registry, socket);
-  }
+  if (!session.agentInfo->started.load()) HoldSocket(session, OpenSessionLocked(registry, session));
   return true;
 }
 
@@ -323,16 +317,10 @@ std::vector<AgentSession> RegisteredAgents() {
   return copies;
 }
 
-std::int64_t MaxSocket() {
-  Registry& registry = TheRegistry();
-  std::lock_guard<std::mutex> lock(registry.mutex);
-  return registry.maxSocket;
-}
-
 std::optional<std::string> GetModeInfo(const std::string& address, const std::string& port) {
   std::optional<AgentSession> session = LookupAgentByAddress(address);
   if (!session || session->transport.localAddress != address ||
-      session->transport.localPort != StoredPort(TextToInt(port))) {
+      session->transport.configuredPortMinusOne != StoredPort(TextToInt(port))) {
     return std::nullopt;
   }
   return session->agentInfo->databaseName + ":" + session->agentInfo->tableName;
@@ -349,8 +337,8 @@ void FreeSimulatorResources() {
   std::lock_guard<std::mutex> lock(registry.mutex);
   for (const auto& session : registry.sessions) {
     if (session->agentInfo->started.load()) {
-      session->agentInfo->started = 0;
       CloseSocketLocked(registry, session->socket);
+      HoldSocket(*session, kNoSocket);
     }
   }
   registry.sessions.clear();

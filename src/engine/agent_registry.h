@@ -28,17 +28,26 @@ struct AgentRegistration {
   std::int32_t ipv6Flag = 0;
 };
 
-// Opens the UDP socket of a session; returns the socket handle, 0 when it cannot be opened.
-// The transport installs the real opener; without one no socket is opened.
+// Opens the UDP socket of a session; returns the socket, kNoSocket when it cannot be opened (an
+// agent socket is never a standard descriptor 0..2, so 0 also tells a failure). The transport
+// installs the real opener; without one no socket is opened.
+// A failed start, stop or release never leaves an opened socket behind: the closer gets each
+// socket an agent gives up.
 using SessionOpener = std::function<std::int64_t(AgentSession&)>;
 using SessionCloser = std::function<void(std::int64_t socket)>;
 void InstallSessionTransport(SessionOpener opener, SessionCloser closer);
 
-// Registers an agent and opens its socket. Returns the socket, 0 when it could not be opened
-// (the agent is then discarded and the host told), -1 when memory ran out.
+inline constexpr std::int64_t kOutOfMemory = -2;
+
+// Registers an agent and opens its socket. Returns the socket; kNoSocket when it could not be
+// opened (the agent is then discarded, nothing of other agents changes, and the host is told);
+// kOutOfMemory.
 std::int64_t FillAgentInfoAndStartAgent(const AgentRegistration& registration);
-// Registers an agent without opening its socket; returns its agentId.
+// Registers an agent without opening its socket; returns its agentId, -1 when memory ran out.
 std::int32_t RegisterAgentInfo(const AgentRegistration& registration);
+// Opens a registered agent's socket, or, when it runs, keeps it on its socket; either way it
+// takes engineBoots. An agent that cannot be opened is dropped (and the host told); its address
+// entry goes to the latest other agent registered on that address.
 bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t engineBoots);
 bool StopAgent(const std::string& address, std::int32_t port);
 bool RestartAgent(std::int32_t index);
@@ -53,7 +62,6 @@ std::optional<AgentSession> FindAgentSession(const std::string& address, std::in
 std::int32_t RegisteredAgentCount();
 // Copies of every registered session, in registration order.
 std::vector<AgentSession> RegisteredAgents();
-std::int64_t MaxSocket();
 
 // "database:table" of the agent on address when its configured port is port; else nothing.
 std::optional<std::string> GetModeInfo(const std::string& address, const std::string& port);

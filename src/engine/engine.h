@@ -27,7 +27,7 @@ void InitAgentRegistry();
 // Starts the SNMP service when it does not run, rebuilds the MIB search array and marks the
 // service started.
 bool InitSnmpThread();
-// Registers and opens each agent; one socket handle per agent (0 not opened, -1 out of memory).
+// Registers and opens each agent; the result of FillAgentInfoAndStartAgent for each.
 // Marks the service started; the service itself starts with InitSnmpThread.
 std::vector<std::int64_t> StartSnmpNetwork(const std::vector<AgentRegistration>& agents);
 // Opens a registered agent, then starts the SNMP service if it was not started.

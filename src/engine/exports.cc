@@ -61,6 +61,12 @@ jintArray IntArray(JNIEnv* env, const std::vector<std::int32_t>& values) {
   return IntsToJava(env, values);
 }
 
+// The host's handle of an agent socket: 0 for an agent not opened, -1 when memory ran out.
+jint HostSocketHandle(std::int64_t socket) {
+  if (socket == kOutOfMemory) return -1;
+  return socket == kNoSocket ? 0 : static_cast<jint>(socket);
+}
+
 // The host's arrays for one startSnmpNetwork call; every array must cover every agent.
 struct NetworkArrays {
   std::vector<std::int32_t> agentIds, ports, engineBoots, ipv6Flags;
@@ -212,7 +218,7 @@ JNIEXPORT jintArray JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler
       agents.push_back(arrays.Agent(i, database));
     std::vector<std::int32_t> results;
     for (std::int64_t socket : StartSnmpNetwork(agents))
-      results.push_back(static_cast<std::int32_t>(socket));
+      results.push_back(HostSocketHandle(socket));
     return IntArray(env, results);
   });
 }

@@ -282,8 +282,8 @@ HostValueQuery BaseQuery(const TesselStruct& target, std::uint32_t subId, CallKi
   if (target.agent != nullptr) {
     const AgentSession& agent = *target.agent;
     query.agentAddress = agent.transport.localAddress;
-    query.agentPort =
-        static_cast<std::int32_t>(agent.transport.localPort) + (kind == CallKind::kRead ? 1 : 0);
+    query.agentPort = static_cast<std::int32_t>(agent.transport.configuredPortMinusOne) +
+                      (kind == CallKind::kRead ? 1 : 0);
     if (agent.agentInfo) {
       query.databaseName = agent.agentInfo->databaseName;
       query.tableName = agent.agentInfo->tableName;

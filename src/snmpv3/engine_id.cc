@@ -69,8 +69,7 @@ void ClearEngineId() {
 }
 
 std::string AgentEngineId(const AgentSession& agent) {
-  std::string id =
-      agent.transport.localAddress + "#" + std::to_string(agent.transport.localPort + 1u);
+  std::string id = AgentKey(agent.transport.localAddress, ConfiguredPort(agent.transport));
   if (id.size() > kMaxEngineIdLength) id.erase(0, id.size() - kMaxEngineIdLength);
   return id;
 }

@@ -64,7 +64,7 @@ int AgentSocketShards() {
 
 std::int64_t OpenAgentSocket(AgentSession& session) {
   // Agents keep their configured port minus one; each binds its own configured port.
-  auto port = static_cast<std::uint16_t>(session.transport.localPort + 1u);
+  auto port = static_cast<std::uint16_t>(session.transport.configuredPortMinusOne + 1u);
   int error = 0;
   int socket = BindAgent(session, port, &error);
   AgentSockets& sockets = Sockets();

@@ -117,6 +117,17 @@ socklen_t SourceControl(const std::string& address, bool ipv6, char* buffer, std
   return CMSG_SPACE(sizeof info);
 }
 
+// Moves a socket that took a standard descriptor (0..2, free when the process closed one) above
+// them: to the engine a socket is never 0, and never one that stdio may write to.
+int AboveStandardDescriptors(int socket) {
+  if (socket < 0 || socket > STDERR_FILENO) return socket;
+  int moved = fcntl(socket, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+  int error = errno;
+  ::close(socket);
+  errno = error;
+  return moved;
+}
+
 }  // namespace
 
 int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6,
@@ -127,7 +138,8 @@ int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6,
     *error = EINVAL;
     return -1;
   }
-  int socket = ::socket(ipv6 ? AF_INET6 : AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, IPPROTO_UDP);
+  int socket = AboveStandardDescriptors(
+      ::socket(ipv6 ? AF_INET6 : AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, IPPROTO_UDP));
   if (socket < 0) {
     *error = errno;
     LOG_ERROR("Unable to open socket on port number %d ", port);
@@ -152,7 +164,7 @@ int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6,
 }
 
 void CloseUdpSocket(int socket) {
-  if (socket > 0) ::close(socket);
+  if (socket >= 0) ::close(socket);
 }
 
 bool ReadUdpPacket(int socket, std::uint8_t* buffer, std::size_t capacity, std::size_t* length,

@@ -21,7 +21,8 @@ struct UdpBindOptions {
   bool wantDestination = false;      // IP_PKTINFO / IPV6_RECVPKTINFO
 };
 
-// A socket bound to address:port, or -1 with *error set to the errno of the failing step.
+// A socket bound to address:port (never on descriptors 0..2), or -1 with *error set to the errno
+// of the failing step.
 int OpenUdpSocket(const std::string& address, std::uint16_t port, bool ipv6,
                   const UdpBindOptions& options, int* error);
 void CloseUdpSocket(int socket);

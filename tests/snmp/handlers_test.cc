@@ -51,7 +51,7 @@ class HandlersTest : public ::testing::Test {
   void SetUp() override {
     InstallHost(&host_);
     agent_.transport.localAddress = "127.0.0.1";
-    agent_.transport.localPort = 160;
+    agent_.transport.configuredPortMinusOne = 160;
     agent_.agentInfo = std::make_shared<AgentInfo>();
     agent_.agentInfo->databaseName = "db";
     agent_.agentInfo->tableName = "devices";

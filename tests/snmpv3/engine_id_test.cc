@@ -41,10 +41,10 @@ TEST_F(EngineIdTest, FileGivesTheEngineIdWithoutBlanks) {
 TEST_F(EngineIdTest, AgentsHaveTheirOwnEngineIds) {
   AgentSession agent;
   agent.transport.localAddress = "10.0.0.5";
-  agent.transport.localPort = 160;
+  agent.transport.configuredPortMinusOne = 160;
   EXPECT_EQ(AgentEngineId(agent), "10.0.0.5#161");
   agent.transport.localAddress = "2001:db8:1234:5678:9abc:def0:1234:5678";
-  agent.transport.localPort = 1160;
+  agent.transport.configuredPortMinusOne = 1160;
   std::string id = AgentEngineId(agent);
   EXPECT_EQ(id.size(), kMaxEngineIdLength);
   EXPECT_EQ(id, "34:5678:9abc:def0:1234:5678#1161");  // the last 32 octets

@@ -112,7 +112,7 @@ AgentSession LocalAgent(std::int32_t agentId) {
   AgentSession agent;
   agent.agentInfo = std::move(info);
   agent.transport.localAddress = "127.0.0.1";
-  agent.transport.localPort = 160;
+  agent.transport.configuredPortMinusOne = 160;
   return agent;
 }
 
