@@ -8,6 +8,7 @@
 
 #include "engine/engine.h"
 #include "engine/engine_state.h"
+#include "engine/exports_marshal.h"
 #include "engine/jni_host.h"
 #include "engine/log.h"
 #include "snmp/mib_tree.h"
@@ -55,10 +56,6 @@ std::vector<std::string> Texts(JNIEnv* env, jobjectArray array) {
 
 jstring OptionalText(JNIEnv* env, const std::optional<std::string>& text) {
   return text ? StringToJava(env, *text) : nullptr;
-}
-
-jintArray IntArray(JNIEnv* env, const std::vector<std::int32_t>& values) {
-  return IntsToJava(env, values);
 }
 
 // The host's handle of an agent socket: 0 for an agent not opened, -1 when memory ran out.
@@ -219,7 +216,7 @@ JNIEXPORT jintArray JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler
     std::vector<std::int32_t> results;
     for (std::int64_t socket : StartSnmpNetwork(agents))
       results.push_back(HostSocketHandle(socket));
-    return IntArray(env, results);
+    return IntsToJava(env, results);
   });
 }
 
@@ -405,12 +402,12 @@ Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeCreateLCDVectors(
 
 JNIEXPORT jintArray JNICALL
 Java_com_kestrelon_simulator_nqx_ReportsUI_getReportOverviewDetails(JNIEnv* env, jobject) {
-  return Guarded<jintArray>(nullptr, [&] { return IntArray(env, GetReportOverviewDetails()); });
+  return Guarded<jintArray>(nullptr, [&] { return IntsToJava(env, GetReportOverviewDetails()); });
 }
 
 JNIEXPORT jintArray JNICALL Java_com_kestrelon_simulator_nqx_ReportsUI_getErrorLogs(JNIEnv* env,
                                                                                     jobject) {
-  return Guarded<jintArray>(nullptr, [&] { return IntArray(env, GetErrorLogs()); });
+  return Guarded<jintArray>(nullptr, [&] { return IntsToJava(env, GetErrorLogs()); });
 }
 
 JNIEXPORT jobjectArray JNICALL Java_com_kestrelon_simulator_nqx_ReportsUI_getIpAddrArr(JNIEnv* env,

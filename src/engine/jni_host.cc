@@ -12,7 +12,6 @@ namespace tessel {
 namespace {
 
 constexpr jint kJniVersion = JNI_VERSION_1_8;
-constexpr jsize kMaxArrayElements = 65535;
 constexpr jint kFrameCapacity = 64;
 
 // Detaches, when the thread ends, a thread that AttachedEnv attached; threads the host attached
@@ -115,8 +114,11 @@ const JavaStrings* LoadJavaStrings(JNIEnv* env) {
   return loaded ? &strings : nullptr;
 }
 
+// Bytes 1..127 read the same in UTF-8 and in the JVM's modified UTF-8; every other byte must be
+// decoded by the JVM's own UTF-8 decoder. (char may be signed or not: compare the octet.)
 bool IsPlainAscii(const std::string& text) {
-  return std::all_of(text.begin(), text.end(), [](char c) { return c > 0; });
+  return std::all_of(text.begin(), text.end(),
+                     [](unsigned char octet) { return octet != 0 && octet < 0x80; });
 }
 
 // Copies a byte[] (local reference, deleted here) into a string.
@@ -127,19 +129,6 @@ std::optional<std::string> BytesFromJava(JNIEnv* env, jbyteArray bytes) {
                           reinterpret_cast<jbyte*>(text.data()));
   env->DeleteLocalRef(bytes);
   return text;
-}
-
-// Runs body with element i of array as a local reference that is dropped afterwards.
-template <typename Body>
-bool ForEachElement(JNIEnv* env, jobjectArray array, Body body) {
-  jsize count = std::min(env->GetArrayLength(array), kMaxArrayElements);
-  for (jsize i = 0; i < count; ++i) {
-    jobject element = env->GetObjectArrayElement(array, i);
-    bool ok = body(element);
-    if (element != nullptr) env->DeleteLocalRef(element);
-    if (!ok) return false;
-  }
-  return true;
 }
 
 // Java strings for the texts that recur in value calls (labels, OIDs, agent names and
@@ -359,59 +348,9 @@ jstring StringToJava(JNIEnv* env, const std::string& text) {
   return result;
 }
 
-std::optional<std::vector<std::string>> StringsFromJava(JNIEnv* env, jobjectArray array) {
-  if (array == nullptr) return std::nullopt;
-  std::vector<std::string> texts;
-  bool ok = ForEachElement(env, array, [&](jobject element) {
-    if (element == nullptr) {
-      texts.emplace_back();
-      return true;
-    }
-    std::optional<std::string> text = JniHost::Instance().ToCpp(env, static_cast<jstring>(element));
-    if (text) texts.push_back(std::move(*text));
-    return text.has_value();
-  });
-  if (!ok) return std::nullopt;
-  return texts;
-}
-
-std::optional<std::vector<std::int32_t>> IntsFromJava(JNIEnv* env, jintArray array) {
-  if (array == nullptr) return std::nullopt;
-  std::vector<std::int32_t> values(
-      static_cast<std::size_t>(std::min(env->GetArrayLength(array), kMaxArrayElements)));
-  env->GetIntArrayRegion(array, 0, static_cast<jsize>(values.size()),
-                         reinterpret_cast<jint*>(values.data()));
-  return values;
-}
-
-jintArray IntsToJava(JNIEnv* env, std::span<const std::int32_t> values) {
-  jintArray array = env->NewIntArray(static_cast<jsize>(values.size()));
-  if (array == nullptr) {
-    env->ExceptionClear();
-    LOG_ERROR("unable to alloc memory \n");
-    return nullptr;
-  }
-  env->SetIntArrayRegion(array, 0, static_cast<jsize>(values.size()),
-                         reinterpret_cast<const jint*>(values.data()));
-  return array;
-}
-
-jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size) {
+jclass JavaStringClass(JNIEnv* env) {
   const JavaStrings* strings = LoadJavaStrings(env);
-  if (strings == nullptr) return nullptr;
-  jobjectArray array = env->NewObjectArray(static_cast<jsize>(size), strings->stringClass, nullptr);
-  if (array == nullptr) {
-    env->ExceptionClear();
-    LOG_ERROR("unable to alloc memory \n");
-    return nullptr;
-  }
-  for (std::size_t i = 0; i < texts.size() && i < size; ++i) {
-    jstring text = StringToJava(env, texts[i]);
-    if (text == nullptr) return nullptr;
-    env->SetObjectArrayElement(array, static_cast<jsize>(i), text);
-    env->DeleteLocalRef(text);
-  }
-  return array;
+  return strings == nullptr ? nullptr : strings->stringClass;
 }
 
 JniHost& JniHost::Instance() {

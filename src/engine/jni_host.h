@@ -1,17 +1,17 @@
-// The JNI implementation of the host bridge, and the conversions of texts and arrays between
-// Java and C++ that the exports use. Everything here is safe from any thread: a thread that is
-// not yet attached to the JVM attaches once, as a daemon, and detaches when it ends. Host objects
-// are held by global references that live as long as their binding; every call runs in its own
-// local frame and clears any exception the host raised (the call then answers nothing).
+// The JNI implementation of the host bridge, and the conversion of texts between Java and C++.
+// Everything here is safe from any thread: a thread that is not yet attached to the JVM attaches
+// once, as a daemon, and detaches when it ends. Host objects are held by global references that
+// live as long as their binding; every call runs in its own local frame and clears any exception
+// the host raised (the call then answers nothing).
 #pragma once
 
 #include <jni.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <memory>
 #include <mutex>
 #include <optional>
-#include <span>
 #include <string>
 #include <vector>
 
@@ -65,13 +65,24 @@ class JniHost final : public HostBridge {
 // C++ bytes to a Java String (local reference), decoded as UTF-8; bytes that are not plain
 // ASCII never reach NewStringUTF. nullptr (exception cleared) on failure.
 jstring StringToJava(JNIEnv* env, const std::string& text);
-// Copies at most 65535 elements (the engine's array counts are 16-bit); a null element becomes
-// the empty text. Nothing for a null array or a failed conversion.
-std::optional<std::vector<std::string>> StringsFromJava(JNIEnv* env, jobjectArray array);
-std::optional<std::vector<std::int32_t>> IntsFromJava(JNIEnv* env, jintArray array);
-// nullptr on failure.
-jintArray IntsToJava(JNIEnv* env, std::span<const std::int32_t> values);
-// A String[size] holding texts in order and null after them; nullptr on failure.
-jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size);
+// java.lang.String's class, held for the life of the process; nullptr when it cannot be had.
+jclass JavaStringClass(JNIEnv* env);
+
+// The engine's array counts are 16-bit: longer host arrays are read up to this many elements.
+inline constexpr jsize kMaxJavaArrayElements = 65535;
+
+// Runs body (returning false to stop) with each element of array as a local reference that is
+// dropped afterwards; false when body stopped.
+template <typename Body>
+bool ForEachElement(JNIEnv* env, jobjectArray array, Body body) {
+  jsize count = std::min(env->GetArrayLength(array), kMaxJavaArrayElements);
+  for (jsize i = 0; i < count; ++i) {
+    jobject element = env->GetObjectArrayElement(array, i);
+    bool ok = body(element);
+    if (element != nullptr) env->DeleteLocalRef(element);
+    if (!ok) return false;
+  }
+  return true;
+}
 
 }  // namespace tessel

@@ -97,11 +97,13 @@ TEST_F(JniHostTest, ScalarValuesCrossAsUtf8Bytes) {
   EXPECT_EQ(host.ScalarGetNextOidVal(Scalar("5")), stored);
   EXPECT_EQ(host.ScalarGetOidVal(Scalar("6")), std::nullopt);
 
-  host.PrintStatus("\xC3\xA9tat");
+  // A character outside the BMP is four octets in UTF-8 but six in the JVM's modified UTF-8.
+  const std::string status = "\xC3\xA9tat \xF0\x9F\x98\x80";
+  host.PrintStatus(status);
   auto line = static_cast<jstring>(ProbeCall(
       "lastStatus", "(Lcom/kestrelon/simulator/tessel/NetworkSimulator;)Ljava/lang/String;",
       simulator_));
-  EXPECT_EQ(host.ToCpp(env_, line), "\xC3\xA9tat");
+  EXPECT_EQ(host.ToCpp(env_, line), status);
 }
 
 TEST_F(JniHostTest, TableValuesAreSetAndWalkedInColumnOrder) {
