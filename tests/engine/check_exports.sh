@@ -1,54 +1,20 @@
 #!/bin/sh
-# The engine library must export exactly the JNI functions the host binds to and nothing else:
-# every other symbol stays hidden so that it cannot clash with anything the JVM loads.
+# The engine library must export exactly the native methods the Java host declares, and nothing
+# else: every other symbol stays hidden so that it cannot clash with anything the JVM loads.
 set -eu
 library=$1
-expected=$(cat <<'LIST'
-Java_com_kestrelon_simulator_nqx_ReportsUI_getErrorLogs
-Java_com_kestrelon_simulator_nqx_ReportsUI_getIpAddrArr
-Java_com_kestrelon_simulator_nqx_ReportsUI_getReportOverviewDetails
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_AdapterJniStopNetwork
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_AdapterJniStopSnmp
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_GetIPv6InterfaceIndex
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_GetTL1AgentID
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_dropV1V2Requests
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_jniBaseLoop
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_jniGetEngineBootCounts
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_nativeInitAgentParams
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_processV1RequestsOnly
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_processV2RequestsOnly
-Java_com_kestrelon_simulator_tessel_NetworkSimulator_scramblePdu
-Java_com_kestrelon_simulator_tessel_snmp_GetModeInfoImpl_GetAgentID
-Java_com_kestrelon_simulator_tessel_snmp_GetModeInfoImpl_GetModeInfo
-Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddAccessEntry
-Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddContextEntry
-Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddSecurityToGroupEntry
-Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddUsmUserEntry
-Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeAddViewTreeEntry
-Java_com_kestrelon_simulator_tessel_snmp_SerToCConverter_nativeCreateLCDVectors
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_GetNextGroupOid
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_SetTrapPort
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_initSnmpThread
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_jniJVMparams
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_jnistoreTreeCellReferences
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_nativePassOneAgentInfo
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_restartAgent
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_setCommunitiesValue
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_setEngineBootCount
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_startAgent
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_startSnmpNetwork
-Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_stopAgent
-Java_com_kestrelon_simulator_tessel_snmp_SnmpRegister_JniCreateTreeCell
-Java_com_kestrelon_simulator_tessel_snmp_SnmpRegister_isAlreadyRegistered
-Java_com_kestrelon_simulator_tessel_utils_DebugScheduler_setDebugFile
-LIST
-)
+sources=$(cd "$(dirname "$0")/../../host/src/main/java" && pwd)
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
-printf '%s\n' "$expected" | LC_ALL=C sort >"$work/expected"
+# Java_<package with _ for .>_<Class>_<method>: no host package, class or method has a '_'.
+(cd "$sources" && grep -rlw native --include='*.java' .) | while read -r file; do
+  class=$(printf '%s' "${file#./}" | sed 's/\.java$//; s#/#_#g')
+  grep -o ' native [^(]*(' "$sources/$file" | sed 's/($//; s/.* //' |
+    while read -r method; do echo "Java_${class}_${method}"; done
+done | LC_ALL=C sort >"$work/expected"
 nm -D --defined-only "$library" | awk 'NF == 3 { print $3 }' | LC_ALL=C sort >"$work/actual"
-if ! diff "$work/expected" "$work/actual"; then
-  echo "the library's exports differ from the JNI export list (< missing, > unexpected)"
+if [ ! -s "$work/expected" ] || ! diff "$work/expected" "$work/actual"; then
+  echo "the library's exports differ from the host's native methods (< missing, > unexpected)"
   exit 1
 fi
 echo "$(wc -l <"$work/actual") JNI exports, nothing else"

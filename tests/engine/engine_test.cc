@@ -33,10 +33,7 @@ class EngineTest : public ::testing::Test {
   }
 
   static AgentRegistration Agent(const std::string& address) {
-    AgentRegistration agent;
-    agent.address = address;
-    agent.port = 161;
-    return agent;
+    return {0, address, 161, {}, {}, 0, "", "", 0};
   }
 
   MemoryHost host_;
@@ -66,13 +63,11 @@ TEST_F(EngineTest, StopSnmpReleasesAgentsAndTheServiceStartsAgain) {
             (std::vector<std::int64_t>{50, 51}));
   EXPECT_EQ(gv_snmpServiceStarted.load(), 1);
   ASSERT_TRUE(InitSnmpThread());
-  gv_virtualIpBase = 140;
 
   EXPECT_TRUE(AdapterJniStopSnmp());
   EXPECT_EQ(closed_, (std::vector<std::int64_t>{50, 51}));
   EXPECT_EQ(RegisteredAgentCount(), 0);
   EXPECT_EQ(gv_snmpServiceStarted.load(), 0);
-  EXPECT_EQ(gv_virtualIpBase.load(), 100);
   EXPECT_THAT(host_.StatusLines(), Contains("SNMP resources cleared Successfully"));
 
   // The first agent started after a stop brings the service back.

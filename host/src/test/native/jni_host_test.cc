@@ -57,25 +57,24 @@ class JniHostTest : public ::testing::Test {
     return count;
   }
 
-  static HostValueQuery Scalar(const std::string& subId) {
+  static HostValueQuery Scalar(const std::string& subId, const std::string& value = "") {
     HostValueQuery query;
     query.label = "system";
     query.objectOid = ".1.3.6.1.2.1.1";
     query.subId = subId;
     query.instance = ".0";
+    query.valueText = value;
     return query;
   }
 
   static HostValueQuery Column(const std::optional<std::string>& instance,
                                const std::string& value = "") {
-    HostValueQuery query;
+    HostValueQuery query = Scalar("2", value);
     query.label = "ifEntry";
     query.objectOid = ".1.3.6.1.2.1.2.2.1";
-    query.subId = "2";
     query.column = 2;
     query.nextColumn = 3;
     query.instance = instance;
-    query.valueText = value;
     return query;
   }
 
@@ -88,8 +87,7 @@ class JniHostTest : public ::testing::Test {
 TEST_F(JniHostTest, ScalarValuesCrossAsUtf8Bytes) {
   JniHost& host = JniHost::Instance();
   const std::string name = std::string("h\xC3\xA9llo \xE2\x82\xAC", 10) + std::string("\0x", 2);
-  HostValueQuery set = Scalar("5");
-  set.valueText = name;
+  HostValueQuery set = Scalar("5", name);
   // The host stores the octets it received, and answers them as hex.
   const Texts stored = {"'68c3a96c6c6f20e282ac0078'h", "-1"};
   EXPECT_EQ(host.SetOidVal(set), stored);
@@ -123,18 +121,15 @@ TEST_F(JniHostTest, HostExceptionIsNoAnswer) {
       env_, NewObject("com/kestrelon/simulator/tessel/NativeProbe$ThrowingHandler")));
   EXPECT_EQ(host.ScalarGetOidVal(Scalar("1")), std::nullopt);
   EXPECT_FALSE(env_->ExceptionCheck());
-  HostValueQuery set = Scalar("1");
-  set.valueText = "still answers";
-  EXPECT_EQ(host.SetOidVal(set), (Texts{"'7374696c6c20616e7377657273'h", "-1"}));
+  EXPECT_EQ(host.SetOidVal(Scalar("1", "still answers")),
+            (Texts{"'7374696c6c20616e7377657273'h", "-1"}));
 }
 
 TEST_F(JniHostTest, EngineThreadAttachesOnceAndDetachesAtItsEnd) {
   JniHost& host = JniHost::Instance();
-  HostValueQuery set = Scalar("4");
-  set.valueText = "from a thread";
   int attachedDuring = -1;
   std::thread engineThread([&] {
-    host.SetOidVal(set);
+    host.SetOidVal(Scalar("4", "from a thread"));
     HostAnswer answer = host.ScalarGetOidVal(Scalar("4"));
     EXPECT_EQ(answer, (Texts{"'66726f6d206120746872656164'h", "-1"}));
     attachedDuring = ThreadsNamed(AttachedEnv(vm_), "tessel-engine");
