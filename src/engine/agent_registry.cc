@@ -134,9 +134,15 @@ std::int64_t OpenAndKeepLocked(Registry& registry, std::unique_ptr<AgentSession>
   std::int64_t socket = OpenSessionLocked(registry, *session);
   if (socket == kNoSocket) return kNoSocket;
   HoldSocket(*session, socket);
-  registry.addressTable.insert_or_assign(session->transport.localAddress,
-                                         CopyAgentSession(*session));
-  registry.sessions.push_back(std::move(session));
+  try {
+    registry.sessions.reserve(registry.sessions.size() + 1);
+    registry.addressTable.insert_or_assign(session->transport.localAddress,
+                                           CopyAgentSession(*session));
+  } catch (const std::bad_alloc&) {
+    CloseSocketLocked(registry, socket);  // the agent is not kept: neither is its socket
+    throw;
+  }
+  registry.sessions.push_back(std::move(session));  // room reserved: cannot throw
   return socket;
 }
 
