@@ -7,7 +7,6 @@
 #include <array>
 #include <atomic>
 #include <memory>
-#include <mutex>
 #include <new>
 #include <optional>
 #include <span>
@@ -23,6 +22,7 @@
 #include "transport/socket_batch.h"
 #include "transport/udp.h"
 #include "transport/udp_batch.h"
+#include "transport/wildcard_sockets.h"
 
 namespace tessel {
 namespace {
@@ -36,21 +36,11 @@ constexpr std::uint64_t kDescriptorMask = 0xFFFFFFFFull;
 // agents hold many requests each); more are read together, one request each.
 constexpr std::size_t kFewSockets = 8;
 
-// The engine-wide sockets: IPv4 and IPv6 wildcards on the SNMP port and the notification socket.
-struct WildcardSockets {
-  std::mutex mutex;
-  int ipv4 = -1;
-  int ipv6 = -1;
-  int notify = -1;
-  std::uint16_t port = 0;
-};
-
 struct Service {
   std::vector<std::thread> threads;
   std::atomic<int> liveThreads{0};
   int stopEvent = -1;
   int wildcardEpoll = -1;  // the first shard's epoll
-  WildcardSockets wildcards;
 };
 
 Service& TheService() {
@@ -65,57 +55,18 @@ bool Readable(int epoll, int descriptor, std::uint64_t tag) {
   return epoll_ctl(epoll, EPOLL_CTL_ADD, descriptor, &event) == 0;
 }
 
-// ---- Engine-wide sockets ----
-
-int OpenWildcard(const char* address, std::uint16_t port, bool ipv6, bool wantDestination) {
-  int error = 0;
-  int socket = OpenUdpSocket(address, port, ipv6, UdpBindOptions{true, wantDestination}, &error);
-  if (socket < 0)
-    LOG_ERROR("Bind Failed : udp port %d Address %s, the engine carries on without it", port,
-              address);
-  return socket;
-}
-
-void CloseWildcardsLocked(Service& service) {
-  WildcardSockets& wildcards = service.wildcards;
-  for (int* socket : {&wildcards.ipv4, &wildcards.ipv6, &wildcards.notify}) {
-    if (*socket < 0) continue;
-    if (service.wildcardEpoll >= 0)
-      epoll_ctl(service.wildcardEpoll, EPOLL_CTL_DEL, *socket, nullptr);
-    CloseUdpSocket(*socket);
-    *socket = -1;
-  }
-  wildcards.port = 0;
-}
-
 // Opens the wildcard sockets on the SNMP port and the notification socket; each is best effort.
-void StartSnmpAgentService(Service& service) {
-  WildcardSockets& wildcards = service.wildcards;
-  std::lock_guard<std::mutex> lock(wildcards.mutex);
+void StartSnmpAgentService(const Service& service) {
   std::uint16_t port = gv_snmpPort.load();
-  if (port == 0 || wildcards.port == port) return;
-  CloseWildcardsLocked(service);
-  wildcards.port = port;
-  wildcards.ipv4 = OpenWildcard("0.0.0.0", port, false, true);
-  wildcards.ipv6 = OpenWildcard("::", port, true, true);
   std::uint16_t trapPort = gv_trapPort.load();
   if (trapPort == 0 || trapPort == port) trapPort = static_cast<std::uint16_t>(port + 1u);
-  wildcards.notify = OpenWildcard("0.0.0.0", trapPort, false, false);
-  for (int socket : {wildcards.ipv4, wildcards.ipv6}) {
-    if (socket >= 0) Readable(service.wildcardEpoll, socket, kWildcardTag);
-  }
-}
-
-// An agent that needs the port gets it: the wildcards give way.
-bool ReleaseWildcardPort(std::uint16_t port) {
-  Service& service = TheService();
-  std::lock_guard<std::mutex> lock(service.wildcards.mutex);
-  if (service.wildcards.port != port || (service.wildcards.ipv4 < 0 && service.wildcards.ipv6 < 0))
-    return false;
-  LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
-  CloseWildcardsLocked(service);
-  service.wildcards.port = port;  // not reopened for this port
-  return true;
+  int failures =
+      OpenWildcardSockets(port, trapPort, WildcardWatch{service.wildcardEpoll, kWildcardTag});
+  if (failures > 0)
+    LOG_ERROR(
+        "%d of the wildcard sockets of udp port %d could not be bound, the engine carries "
+        "on without them",
+        failures, port);
 }
 
 // ---- Threads ----
@@ -187,20 +138,6 @@ void ServeAgentSockets(std::span<const int> descriptors, ThreadState& state) {
   if (batch.Broken()) state.spread.reset();
 }
 
-bool IsWildcardLocked(const WildcardSockets& wildcards, int socket) {
-  return socket >= 0 && (socket == wildcards.ipv4 || socket == wildcards.ipv6);
-}
-
-// Reads one datagram from a wildcard socket unless the socket has meanwhile been closed (an
-// agent took its port), when its descriptor may already belong to someone else.
-bool ReadWildcard(int socket, ThreadState& state, std::size_t* length,
-                  TransportDomainInfo* received) {
-  WildcardSockets& wildcards = TheService().wildcards;
-  std::lock_guard<std::mutex> lock(wildcards.mutex);
-  return IsWildcardLocked(wildcards, socket) &&
-         ReadUdpPacket(socket, state.buffer.data(), state.buffer.size(), length, received);
-}
-
 // Answers from the agent's address through the wildcard socket, if it is still open.
 void ReplyViaWildcard(const AgentSession& agent, const std::uint8_t* data, std::size_t length) {
   thread_local std::vector<std::uint8_t> reply(kMaxSnmpMessage);
@@ -210,11 +147,7 @@ void ReplyViaWildcard(const AgentSession& agent, const std::uint8_t* data, std::
     return;
   }
   if (replyLength == 0) return;
-  WildcardSockets& wildcards = TheService().wildcards;
-  std::lock_guard<std::mutex> lock(wildcards.mutex);
-  auto socket = static_cast<int>(agent.socket);
-  if (IsWildcardLocked(wildcards, socket))
-    SendUdpPacket(agent.transport, socket, reply.data(), replyLength, true);
+  SendViaWildcard(static_cast<int>(agent.socket), agent.transport, reply.data(), replyLength);
 }
 
 // A datagram for any registered agent, which need not have a socket of its own: answered from
@@ -223,7 +156,7 @@ void ServeWildcardSocket(int socket, ThreadState& state) {
   for (int batch = 0; batch < 32; ++batch) {
     TransportDomainInfo received;
     std::size_t length = 0;
-    if (!ReadWildcard(socket, state, &length, &received)) return;
+    if (!ReadWildcard(socket, state.buffer.data(), state.buffer.size(), &length, &received)) return;
     if (received.localAddress.empty()) {
       LOG_ERROR("The agent address is NULL. Hence skipping this packet.");
       continue;
@@ -298,10 +231,7 @@ bool StartThreads(Service& service) {
 
 }  // namespace
 
-void InitSnmpParams() {
-  SetPortReleaser(ReleaseWildcardPort);
-  InstallSessionTransport(OpenAgentSocket, CloseAgentSocket);
-}
+void InitSnmpParams() { InstallSessionTransport(OpenAgentSocket, CloseAgentSocket); }
 
 bool InitSnmpGeneralServices() {
   LOG_TRACE("\n\t@@@@@ Inside InitSnmpGeneralServices() @@@@@ \n");
@@ -334,10 +264,7 @@ void StopSnmpGeneralServices() {
   }
   for (std::thread& thread : service.threads) thread.join();
   service.threads.clear();
-  {
-    std::lock_guard<std::mutex> lock(service.wildcards.mutex);
-    CloseWildcardsLocked(service);
-  }
+  CloseWildcardSockets();
   if (service.stopEvent >= 0) {
     for (int shard = 0; shard < AgentSocketShards(); ++shard)
       epoll_ctl(AgentSocketsEpoll(shard), EPOLL_CTL_DEL, service.stopEvent, nullptr);

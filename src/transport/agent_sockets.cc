@@ -13,6 +13,7 @@
 
 #include "engine/log.h"
 #include "transport/udp.h"
+#include "transport/wildcard_sockets.h"
 
 namespace tessel {
 namespace {
@@ -22,7 +23,6 @@ struct AgentSockets {
   std::array<int, kMaxAgentShards> epolls;
   // Indexed by descriptor: descriptors are small and dense, and the lookup is on every request.
   std::vector<std::shared_ptr<const AgentSocket>> sockets;
-  std::function<bool(std::uint16_t)> releaser;
   std::uint32_t nextShard = 0;
   AgentSockets() { epolls.fill(-1); }
 };
@@ -50,6 +50,15 @@ int BindAgent(const AgentSession& session, std::uint16_t port, int* error) {
                        error);
 }
 
+// Binds the agent's port; when the engine's wildcard sockets hold it, they give way.
+int BindTakingWildcardPort(const AgentSession& session, std::uint16_t port) {
+  int error = 0;
+  int socket = BindAgent(session, port, &error);
+  if (socket >= 0 || error != EADDRINUSE || !ReleaseWildcardPort(port)) return socket;
+  LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
+  return BindAgent(session, port, &error);
+}
+
 }  // namespace
 
 AgentSocket::AgentSocket(int descriptor, int shard, AgentSession session)
@@ -65,16 +74,10 @@ int AgentSocketShards() {
 std::int64_t OpenAgentSocket(AgentSession& session) {
   // Agents keep their configured port minus one; each binds its own configured port.
   auto port = static_cast<std::uint16_t>(session.transport.localPort + 1u);
-  int error = 0;
-  int socket = BindAgent(session, port, &error);
+  int socket = BindTakingWildcardPort(session, port);
+  if (socket < 0) return 0;
   AgentSockets& sockets = Sockets();
   std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-  if (socket < 0 && error == EADDRINUSE && sockets.releaser) {
-    lock.unlock();
-    if (sockets.releaser(port)) socket = BindAgent(session, port, &error);
-    lock.lock();
-  }
-  if (socket < 0) return 0;
   int shard =
       static_cast<int>(sockets.nextShard++ % static_cast<std::uint32_t>(AgentSocketShards()));
   int epoll = EpollLocked(sockets, shard);
@@ -124,12 +127,6 @@ std::shared_ptr<const AgentSocket> FindAgentSocket(int socket) {
   std::shared_lock<std::shared_mutex> lock(sockets.mutex);
   if (socket < 0 || static_cast<std::size_t>(socket) >= sockets.sockets.size()) return nullptr;
   return sockets.sockets[static_cast<std::size_t>(socket)];
-}
-
-void SetPortReleaser(std::function<bool(std::uint16_t port)> releaser) {
-  AgentSockets& sockets = Sockets();
-  std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-  sockets.releaser = std::move(releaser);
 }
 
 }  // namespace tessel

@@ -7,7 +7,6 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <memory>
 
 #include "engine/agent.h"
@@ -47,9 +46,5 @@ int AgentSocketsEpoll(int shard);
 
 // The open agent socket with that descriptor, or null.
 std::shared_ptr<const AgentSocket> FindAgentSocket(int socket);
-
-// Called when an agent's bind finds the port taken: releases the engine's own wildcard sockets
-// on that port, if any; true when it did (the bind is then tried again).
-void SetPortReleaser(std::function<bool(std::uint16_t port)> releaser);
 
 }  // namespace tessel
