@@ -50,13 +50,19 @@ int BindAgent(const AgentSession& session, std::uint16_t port, int* error) {
                        error);
 }
 
-// Binds the agent's port; when the engine's wildcard sockets hold it, they give way.
+// Binds the agent's port; when the engine's wildcard sockets hold it, they give way, and come
+// back if the port is taken by someone else as well.
 int BindTakingWildcardPort(const AgentSession& session, std::uint16_t port) {
   int error = 0;
   int socket = BindAgent(session, port, &error);
   if (socket >= 0 || error != EADDRINUSE || !ReleaseWildcardPort(port)) return socket;
-  LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
-  return BindAgent(session, port, &error);
+  socket = BindAgent(session, port, &error);
+  if (socket >= 0) {
+    LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
+  } else {
+    RestoreWildcardPort(port);
+  }
+  return socket;
 }
 
 }  // namespace

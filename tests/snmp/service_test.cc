@@ -209,15 +209,23 @@ TEST_F(ServiceTest, WildcardSocketAnswersRegisteredAgentsFromTheirAddress) {
   EXPECT_EQ(from, "127.77.0.9:" + std::to_string(kBasePort + 10));
 }
 
-TEST_F(ServiceTest, PortServedByAnotherSocketIsRefused) {
+// A port that another socket serves on the agent's address is refused; the wildcard sockets,
+// which gave way for the attempt, come back and go on answering for the registered agents.
+TEST_F(ServiceTest, PortServedByAnotherSocketIsRefusedAndTheWildcardsStay) {
+  const std::uint16_t port = kBasePort + 20;
+  ASSERT_EQ(RegisterAgentInfo(Agent("127.77.0.6", port)), 1);
+  ASSERT_TRUE(InitSnmpGeneralServices());
   int other = socket(AF_INET, SOCK_DGRAM, 0);
-  sockaddr_in taken = Address("127.77.0.5", kBasePort + 20);
+  int on = 1;
+  setsockopt(other, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on);  // shares with the wildcards
+  sockaddr_in taken = Address("127.77.0.5", port);
   ASSERT_EQ(bind(other, reinterpret_cast<sockaddr*>(&taken), sizeof taken), 0);
-  EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.77.0.5", kBasePort + 20)), 0);
+  EXPECT_EQ(FillAgentInfoAndStartAgent(Agent("127.77.0.5", port)), 0);
   EXPECT_EQ(host_.StatusLines().back(),
-            "Unable to start SNMP Agent at Port : " + std::to_string(kBasePort + 20) +
+            "Unable to start SNMP Agent at Port : " + std::to_string(port) +
                 " and at IpAddress : 127.77.0.5 ");
   close(other);
+  EXPECT_TRUE(Manager().Ask(GetSysName(), "127.77.0.6", port));
 }
 
 TEST_F(ServiceTest, StopEndsEveryThreadAndTheServiceStartsAgain) {
