@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cerrno>
 #include <atomic>
 #include <memory>
 #include <new>
@@ -194,7 +195,12 @@ void ServiceThread(int epoll) {
   agentSockets.reserve(events.size());
   for (bool running = true; running;) {
     int ready = epoll_wait(epoll, events.data(), static_cast<int>(events.size()), -1);
-    if (ready < 0 && errno != EINTR) LOG_ERROR("Error in response select %d", errno);
+    if (ready < 0 && errno != EINTR) {
+      // Only an epoll descriptor that is no longer one fails here, and it stays so: waiting on
+      // it again would spin. The thread ends; the stop joins it as any other.
+      LOG_ERROR("Error in response select %d, the service thread ends", errno);
+      break;
+    }
     agentSockets.clear();
     for (int i = 0; i < ready; ++i) {
       std::uint64_t tag = events[static_cast<std::size_t>(i)].data.u64;

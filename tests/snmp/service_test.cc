@@ -4,11 +4,13 @@
 #include <gtest/gtest.h>
 #include <netinet/in.h>
 #include <poll.h>
+#include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <map>
 #include <set>
+#include <thread>
 
 #include "engine/agent_registry.h"
 #include "engine/engine_state.h"
@@ -238,6 +240,34 @@ TEST_F(ServiceTest, StopEndsEveryThreadAndTheServiceStartsAgain) {
     StopSnmpGeneralServices();
     EXPECT_EQ(LiveServiceThreads(), 0);
   }
+}
+
+// An epoll that fails for good (here: its descriptor now names an eventfd) ends its service
+// thread, which would otherwise spin on the error; the stop still joins every thread.
+TEST_F(ServiceTest, ThreadWhoseEpollFailsEndsInsteadOfSpinning) {
+  const int shards = AgentSocketShards();
+  for (int i = 0; i < shards; ++i) {  // agents go to the shards in turn: one wakes each thread
+    std::string address = "127.77.2." + std::to_string(i + 1);
+    ASSERT_GT(FillAgentInfoAndStartAgent(Agent(address.c_str(), kBasePort + 70)), 0);
+  }
+  ASSERT_TRUE(InitSnmpGeneralServices());
+  int junk = eventfd(0, EFD_CLOEXEC);
+  std::vector<int> saved;
+  for (int shard = 0; shard < shards; ++shard) {
+    saved.push_back(dup(AgentSocketsEpoll(shard)));
+    dup2(junk, AgentSocketsEpoll(shard));
+  }
+  Manager manager;
+  for (int i = 0; i < shards; ++i)
+    manager.Send(GetSysName(), ("127.77.2." + std::to_string(i + 1)).c_str(), kBasePort + 70);
+  for (int wait = 0; wait < 200 && LiveServiceThreads() > 0; ++wait)
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  EXPECT_EQ(LiveServiceThreads(), 0);
+  for (int shard = 0; shard < shards; ++shard) {
+    dup2(saved[static_cast<std::size_t>(shard)], AgentSocketsEpoll(shard));
+    close(saved[static_cast<std::size_t>(shard)]);
+  }
+  close(junk);
 }
 
 }  // namespace
