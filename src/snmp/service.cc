@@ -5,8 +5,8 @@
 #include <unistd.h>
 
 #include <array>
-#include <cerrno>
 #include <atomic>
+#include <cerrno>
 #include <memory>
 #include <new>
 #include <optional>
@@ -42,6 +42,8 @@ struct Service {
   std::atomic<int> liveThreads{0};
   int stopEvent = -1;
   int wildcardEpoll = -1;  // the first shard's epoll
+  std::atomic<std::uint64_t> manySocketWakeups{0};
+  std::atomic<std::uint64_t> socketBatches{0};
 };
 
 Service& TheService() {
@@ -128,6 +130,7 @@ void ServeAgentSockets(std::span<const int> descriptors, ThreadState& state) {
   }
   SocketBatch& batch = *state.spread;
   std::size_t received = batch.Receive(std::span<const int>(sockets.data(), count));
+  if (received > 0) TheService().socketBatches.fetch_add(1, std::memory_order_relaxed);
   for (std::size_t i = 0; i < received; ++i) {
     const AgentSocket& agent = *agents[batch.Source(i)];
     state.request = agent.Session();
@@ -187,6 +190,19 @@ void Guarded(Serve serve) {
   }
 }
 
+// Serves the agent sockets that one wake-up found ready: one by one when they are few, or else
+// together in one io_uring batch where there is one.
+void ServeReadySockets(std::span<const int> descriptors, ThreadState& state) {
+  if (descriptors.size() > kFewSockets) {
+    TheService().manySocketWakeups.fetch_add(1, std::memory_order_relaxed);
+    if (state.spread) {
+      Guarded([&] { ServeAgentSockets(descriptors, state); });
+      return;
+    }
+  }
+  for (int descriptor : descriptors) Guarded([&] { ServeAgentSocket(descriptor, state); });
+}
+
 // Waits on the shard's epoll until the stop event; serves each ready socket on this thread.
 void ServiceThread(int epoll) {
   auto state = std::make_unique<ThreadState>();
@@ -213,11 +229,7 @@ void ServiceThread(int epoll) {
         agentSockets.push_back(descriptor);
       }
     }
-    if (agentSockets.size() > kFewSockets && state->spread) {
-      Guarded([&] { ServeAgentSockets(agentSockets, *state); });
-    } else {
-      for (int descriptor : agentSockets) Guarded([&] { ServeAgentSocket(descriptor, *state); });
-    }
+    ServeReadySockets(agentSockets, *state);
   }
   TheService().liveThreads.fetch_sub(1);
 }
@@ -281,5 +293,10 @@ void StopSnmpGeneralServices() {
 }
 
 int LiveServiceThreads() { return TheService().liveThreads.load(); }
+
+ServiceReadCounts ServiceReads() {
+  const Service& service = TheService();
+  return {service.manySocketWakeups.load(), service.socketBatches.load()};
+}
 
 }  // namespace tessel
