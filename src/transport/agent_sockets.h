@@ -2,7 +2,7 @@
 // fixed number of epoll instances (shards), one per service thread. Opening binds the agent's
 // own address and configured port, exclusively: a port that another socket already serves on
 // that address is refused (the only sharing allowed is with the engine's own wildcard sockets,
-// which give way to an agent). Safe from any thread.
+// which give way to an agent, and come back when its bind fails). Safe from any thread.
 #pragma once
 
 #include <cstddef>
