@@ -11,7 +11,7 @@
 #include <shared_mutex>
 #include <vector>
 
-#include "engine/log.h"
+#include "base/log.h"
 #include "transport/udp.h"
 #include "transport/wildcard_sockets.h"
 
