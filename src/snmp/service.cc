@@ -6,8 +6,8 @@
 
 #include <array>
 #include <atomic>
+#include <cerrno>
 #include <memory>
-#include <mutex>
 #include <new>
 #include <optional>
 #include <span>
@@ -23,6 +23,7 @@
 #include "transport/socket_batch.h"
 #include "transport/udp.h"
 #include "transport/udp_batch.h"
+#include "transport/wildcard_sockets.h"
 
 namespace tessel {
 namespace {
@@ -36,21 +37,13 @@ constexpr std::uint64_t kDescriptorMask = 0xFFFFFFFFull;
 // agents hold many requests each); more are read together, one request each.
 constexpr std::size_t kFewSockets = 8;
 
-// The engine-wide sockets: IPv4 and IPv6 wildcards on the SNMP port and the notification socket.
-struct WildcardSockets {
-  std::mutex mutex;
-  int ipv4 = -1;
-  int ipv6 = -1;
-  int notify = -1;
-  std::uint16_t port = 0;
-};
-
 struct Service {
   std::vector<std::thread> threads;
   std::atomic<int> liveThreads{0};
   int stopEvent = -1;
   int wildcardEpoll = -1;  // the first shard's epoll
-  WildcardSockets wildcards;
+  std::atomic<std::uint64_t> manySocketWakeups{0};
+  std::atomic<std::uint64_t> socketBatches{0};
 };
 
 Service& TheService() {
@@ -65,57 +58,18 @@ bool Readable(int epoll, int descriptor, std::uint64_t tag) {
   return epoll_ctl(epoll, EPOLL_CTL_ADD, descriptor, &event) == 0;
 }
 
-// ---- Engine-wide sockets ----
-
-int OpenWildcard(const char* address, std::uint16_t port, bool ipv6, bool wantDestination) {
-  int error = 0;
-  int socket = OpenUdpSocket(address, port, ipv6, UdpBindOptions{true, wantDestination}, &error);
-  if (socket < 0)
-    LOG_ERROR("Bind Failed : udp port %d Address %s, the engine carries on without it", port,
-              address);
-  return socket;
-}
-
-void CloseWildcardsLocked(Service& service) {
-  WildcardSockets& wildcards = service.wildcards;
-  for (int* socket : {&wildcards.ipv4, &wildcards.ipv6, &wildcards.notify}) {
-    if (*socket < 0) continue;
-    if (service.wildcardEpoll >= 0)
-      epoll_ctl(service.wildcardEpoll, EPOLL_CTL_DEL, *socket, nullptr);
-    CloseUdpSocket(*socket);
-    *socket = -1;
-  }
-  wildcards.port = 0;
-}
-
 // Opens the wildcard sockets on the SNMP port and the notification socket; each is best effort.
-void StartSnmpAgentService(Service& service) {
-  WildcardSockets& wildcards = service.wildcards;
-  std::lock_guard<std::mutex> lock(wildcards.mutex);
+void StartSnmpAgentService(const Service& service) {
   std::uint16_t port = gv_snmpPort.load();
-  if (port == 0 || wildcards.port == port) return;
-  CloseWildcardsLocked(service);
-  wildcards.port = port;
-  wildcards.ipv4 = OpenWildcard("0.0.0.0", port, false, true);
-  wildcards.ipv6 = OpenWildcard("::", port, true, true);
   std::uint16_t trapPort = gv_trapPort.load();
   if (trapPort == 0 || trapPort == port) trapPort = static_cast<std::uint16_t>(port + 1u);
-  wildcards.notify = OpenWildcard("0.0.0.0", trapPort, false, false);
-  for (int socket : {wildcards.ipv4, wildcards.ipv6}) {
-    if (socket >= 0) Readable(service.wildcardEpoll, socket, kWildcardTag);
-  }
-}
-
-// An agent that needs the port gets it: the wildcards give way.
-bool ReleaseWildcardPort(std::uint16_t port) {
-  Service& service = TheService();
-  std::lock_guard<std::mutex> lock(service.wildcards.mutex);
-  if (service.wildcards.port != port || (service.wildcards.ipv4 < 0 && service.wildcards.ipv6 < 0))
-    return false;
-  LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
-  CloseWildcardsLocked(service);
-  service.wildcards.port = port;  // not reopened for this port
-  return true;
+  int failures =
+      OpenWildcardSockets(port, trapPort, WildcardWatch{service.wildcardEpoll, kWildcardTag});
+  if (failures > 0)
+    LOG_ERROR(
+        "%d of the wildcard sockets of udp port %d could not be bound, the engine carries "
+        "on without them",
+        failures, port);
 }
 
 // ---- Threads ----
@@ -176,6 +130,7 @@ void ServeAgentSockets(std::span<const int> descriptors, ThreadState& state) {
   }
   SocketBatch& batch = *state.spread;
   std::size_t received = batch.Receive(std::span<const int>(sockets.data(), count));
+  if (received > 0) TheService().socketBatches.fetch_add(1, std::memory_order_relaxed);
   for (std::size_t i = 0; i < received; ++i) {
     const AgentSocket& agent = *agents[batch.Source(i)];
     state.request = agent.Session();
@@ -187,20 +142,6 @@ void ServeAgentSockets(std::span<const int> descriptors, ThreadState& state) {
   if (batch.Broken()) state.spread.reset();
 }
 
-bool IsWildcardLocked(const WildcardSockets& wildcards, int socket) {
-  return socket >= 0 && (socket == wildcards.ipv4 || socket == wildcards.ipv6);
-}
-
-// Reads one datagram from a wildcard socket unless the socket has meanwhile been closed (an
-// agent took its port), when its descriptor may already belong to someone else.
-bool ReadWildcard(int socket, ThreadState& state, std::size_t* length,
-                  TransportDomainInfo* received) {
-  WildcardSockets& wildcards = TheService().wildcards;
-  std::lock_guard<std::mutex> lock(wildcards.mutex);
-  return IsWildcardLocked(wildcards, socket) &&
-         ReadUdpPacket(socket, state.buffer.data(), state.buffer.size(), length, received);
-}
-
 // Answers from the agent's address through the wildcard socket, if it is still open.
 void ReplyViaWildcard(const AgentSession& agent, const std::uint8_t* data, std::size_t length) {
   thread_local std::vector<std::uint8_t> reply(kMaxSnmpMessage);
@@ -210,11 +151,7 @@ void ReplyViaWildcard(const AgentSession& agent, const std::uint8_t* data, std::
     return;
   }
   if (replyLength == 0) return;
-  WildcardSockets& wildcards = TheService().wildcards;
-  std::lock_guard<std::mutex> lock(wildcards.mutex);
-  auto socket = static_cast<int>(agent.socket);
-  if (IsWildcardLocked(wildcards, socket))
-    SendUdpPacket(agent.transport, socket, reply.data(), replyLength, true);
+  SendViaWildcard(static_cast<int>(agent.socket), agent.transport, reply.data(), replyLength);
 }
 
 // A datagram for any registered agent, which need not have a socket of its own: answered from
@@ -223,7 +160,7 @@ void ServeWildcardSocket(int socket, ThreadState& state) {
   for (int batch = 0; batch < 32; ++batch) {
     TransportDomainInfo received;
     std::size_t length = 0;
-    if (!ReadWildcard(socket, state, &length, &received)) return;
+    if (!ReadWildcard(socket, state.buffer.data(), state.buffer.size(), &length, &received)) return;
     if (received.localAddress.empty()) {
       LOG_ERROR("The agent address is NULL. Hence skipping this packet.");
       continue;
@@ -253,6 +190,19 @@ void Guarded(Serve serve) {
   }
 }
 
+// Serves the agent sockets that one wake-up found ready: one by one when they are few, or else
+// together in one io_uring batch where there is one.
+void ServeReadySockets(std::span<const int> descriptors, ThreadState& state) {
+  if (descriptors.size() > kFewSockets) {
+    TheService().manySocketWakeups.fetch_add(1, std::memory_order_relaxed);
+    if (state.spread) {
+      Guarded([&] { ServeAgentSockets(descriptors, state); });
+      return;
+    }
+  }
+  for (int descriptor : descriptors) Guarded([&] { ServeAgentSocket(descriptor, state); });
+}
+
 // Waits on the shard's epoll until the stop event; serves each ready socket on this thread.
 void ServiceThread(int epoll) {
   auto state = std::make_unique<ThreadState>();
@@ -261,7 +211,12 @@ void ServiceThread(int epoll) {
   agentSockets.reserve(events.size());
   for (bool running = true; running;) {
     int ready = epoll_wait(epoll, events.data(), static_cast<int>(events.size()), -1);
-    if (ready < 0 && errno != EINTR) LOG_ERROR("Error in response select %d", errno);
+    if (ready < 0 && errno != EINTR) {
+      // Only an epoll descriptor that is no longer one fails here, and it stays so: waiting on
+      // it again would spin. The thread ends; the stop joins it as any other.
+      LOG_ERROR("Error in response select %d, the service thread ends", errno);
+      break;
+    }
     agentSockets.clear();
     for (int i = 0; i < ready; ++i) {
       std::uint64_t tag = events[static_cast<std::size_t>(i)].data.u64;
@@ -274,11 +229,7 @@ void ServiceThread(int epoll) {
         agentSockets.push_back(descriptor);
       }
     }
-    if (agentSockets.size() > kFewSockets && state->spread) {
-      Guarded([&] { ServeAgentSockets(agentSockets, *state); });
-    } else {
-      for (int descriptor : agentSockets) Guarded([&] { ServeAgentSocket(descriptor, *state); });
-    }
+    ServeReadySockets(agentSockets, *state);
   }
   TheService().liveThreads.fetch_sub(1);
 }
@@ -298,10 +249,7 @@ bool StartThreads(Service& service) {
 
 }  // namespace
 
-void InitSnmpParams() {
-  SetPortReleaser(ReleaseWildcardPort);
-  InstallSessionTransport(OpenAgentSocket, CloseAgentSocket);
-}
+void InitSnmpParams() { InstallSessionTransport(OpenAgentSocket, CloseAgentSocket); }
 
 bool InitSnmpGeneralServices() {
   LOG_TRACE("\n\t@@@@@ Inside InitSnmpGeneralServices() @@@@@ \n");
@@ -334,10 +282,7 @@ void StopSnmpGeneralServices() {
   }
   for (std::thread& thread : service.threads) thread.join();
   service.threads.clear();
-  {
-    std::lock_guard<std::mutex> lock(service.wildcards.mutex);
-    CloseWildcardsLocked(service);
-  }
+  CloseWildcardSockets();
   if (service.stopEvent >= 0) {
     for (int shard = 0; shard < AgentSocketShards(); ++shard)
       epoll_ctl(AgentSocketsEpoll(shard), EPOLL_CTL_DEL, service.stopEvent, nullptr);
@@ -348,5 +293,10 @@ void StopSnmpGeneralServices() {
 }
 
 int LiveServiceThreads() { return TheService().liveThreads.load(); }
+
+ServiceReadCounts ServiceReads() {
+  const Service& service = TheService();
+  return {service.manySocketWakeups.load(), service.socketBatches.load()};
+}
 
 }  // namespace tessel

@@ -22,6 +22,15 @@ void StopSnmpGeneralServices();
 // Service threads running now (for observation).
 int LiveServiceThreads();
 
+// How the agent sockets have been read since the process started (for observation): wake-ups
+// that found more ready sockets than are read one by one, and io_uring batches that read one
+// request from each of many sockets.
+struct ServiceReadCounts {
+  std::uint64_t manySocketWakeups = 0;
+  std::uint64_t socketBatches = 0;
+};
+ServiceReadCounts ServiceReads();
+
 // Opens the SessionOpener/SessionCloser of the agent registry on the UDP transport.
 void InitSnmpParams();
 

@@ -8,11 +8,13 @@
 #include <array>
 #include <cerrno>
 #include <mutex>
+#include <new>
 #include <shared_mutex>
 #include <vector>
 
-#include "engine/log.h"
+#include "base/log.h"
 #include "transport/udp.h"
+#include "transport/wildcard_sockets.h"
 
 namespace tessel {
 namespace {
@@ -22,7 +24,6 @@ struct AgentSockets {
   std::array<int, kMaxAgentShards> epolls;
   // Indexed by descriptor: descriptors are small and dense, and the lookup is on every request.
   std::vector<std::shared_ptr<const AgentSocket>> sockets;
-  std::function<bool(std::uint16_t)> releaser;
   std::uint32_t nextShard = 0;
   AgentSockets() { epolls.fill(-1); }
 };
@@ -50,6 +51,21 @@ int BindAgent(const AgentSession& session, std::uint16_t port, int* error) {
                        error);
 }
 
+// Binds the agent's port; when the engine's wildcard sockets hold it, they give way, and come
+// back if the port is taken by someone else as well.
+int BindTakingWildcardPort(const AgentSession& session, std::uint16_t port) {
+  int error = 0;
+  int socket = BindAgent(session, port, &error);
+  if (socket >= 0 || error != EADDRINUSE || !ReleaseWildcardPort(port)) return socket;
+  socket = BindAgent(session, port, &error);
+  if (socket >= 0) {
+    LOG_ERROR("The wildcard sockets of port %d give way to an agent", port);
+  } else {
+    RestoreWildcardPort(port);
+  }
+  return socket;
+}
+
 }  // namespace
 
 AgentSocket::AgentSocket(int descriptor, int shard, AgentSession session)
@@ -65,33 +81,34 @@ int AgentSocketShards() {
 std::int64_t OpenAgentSocket(AgentSession& session) {
   // Agents keep their configured port minus one; each binds its own configured port.
   auto port = static_cast<std::uint16_t>(session.transport.configuredPortMinusOne + 1u);
-  int error = 0;
-  int socket = BindAgent(session, port, &error);
+  int socket = BindTakingWildcardPort(session, port);
+  if (socket < 0) return kNoSocket;
   AgentSockets& sockets = Sockets();
   std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-  if (socket < 0 && error == EADDRINUSE && sockets.releaser) {
-    lock.unlock();
-    if (sockets.releaser(port)) socket = BindAgent(session, port, &error);
-    lock.lock();
-  }
-  if (socket < 0) return 0;
   int shard =
       static_cast<int>(sockets.nextShard++ % static_cast<std::uint32_t>(AgentSocketShards()));
+  std::shared_ptr<const AgentSocket> agent;
+  try {
+    AgentSession copy = session;
+    copy.socket = socket;
+    copy.transport.socket = socket;
+    agent = std::make_shared<const AgentSocket>(socket, shard, std::move(copy));
+  } catch (const std::bad_alloc&) {
+    CloseUdpSocket(socket);
+    throw;
+  }
+  // From here on the record owns the descriptor: any way out without keeping it closes it.
+  auto index = static_cast<std::size_t>(socket);
+  if (index >= sockets.sockets.size()) sockets.sockets.resize(index + 1);
   int epoll = EpollLocked(sockets, shard);
   epoll_event event{};
   event.events = EPOLLIN;
   event.data.u64 = static_cast<std::uint64_t>(socket);
   if (epoll < 0 || epoll_ctl(epoll, EPOLL_CTL_ADD, socket, &event) != 0) {
     LOG_ERROR("Unable to watch the socket of %s", session.transport.localAddress.c_str());
-    CloseUdpSocket(socket);
-    return 0;
+    return kNoSocket;
   }
-  AgentSession copy = session;
-  copy.socket = socket;
-  copy.transport.socket = socket;
-  auto index = static_cast<std::size_t>(socket);
-  if (index >= sockets.sockets.size()) sockets.sockets.resize(index + 1);
-  sockets.sockets[index] = std::make_shared<const AgentSocket>(socket, shard, std::move(copy));
+  sockets.sockets[index] = std::move(agent);
   return socket;
 }
 
@@ -124,12 +141,6 @@ std::shared_ptr<const AgentSocket> FindAgentSocket(int socket) {
   std::shared_lock<std::shared_mutex> lock(sockets.mutex);
   if (socket < 0 || static_cast<std::size_t>(socket) >= sockets.sockets.size()) return nullptr;
   return sockets.sockets[static_cast<std::size_t>(socket)];
-}
-
-void SetPortReleaser(std::function<bool(std::uint16_t port)> releaser) {
-  AgentSockets& sockets = Sockets();
-  std::unique_lock<std::shared_mutex> lock(sockets.mutex);
-  sockets.releaser = std::move(releaser);
 }
 
 }  // namespace tessel

@@ -2,12 +2,11 @@
 // fixed number of epoll instances (shards), one per service thread. Opening binds the agent's
 // own address and configured port, exclusively: a port that another socket already serves on
 // that address is refused (the only sharing allowed is with the engine's own wildcard sockets,
-// which give way to an agent). Safe from any thread.
+// which give way to an agent, and come back when its bind fails). Safe from any thread.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <memory>
 
 #include "engine/agent.h"
@@ -34,7 +33,8 @@ class AgentSocket {
   AgentSession session_;
 };
 
-// Opens and registers the session's socket; the socket handle, or 0 when it cannot be bound.
+// Opens and registers the session's socket; the socket handle, or kNoSocket when it cannot be
+// bound or watched.
 std::int64_t OpenAgentSocket(AgentSession& session);
 void CloseAgentSocket(std::int64_t socket);
 
@@ -47,9 +47,5 @@ int AgentSocketsEpoll(int shard);
 
 // The open agent socket with that descriptor, or null.
 std::shared_ptr<const AgentSocket> FindAgentSocket(int socket);
-
-// Called when an agent's bind finds the port taken: releases the engine's own wildcard sockets
-// on that port, if any; true when it did (the bind is then tried again).
-void SetPortReleaser(std::function<bool(std::uint16_t port)> releaser);
 
 }  // namespace tessel

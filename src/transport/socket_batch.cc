@@ -7,7 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "engine/log.h"
+#include "base/log.h"
 #include "transport/udp.h"
 
 #if TESSEL_HAVE_URING

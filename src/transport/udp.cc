@@ -9,7 +9,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "engine/log.h"
+#include "base/log.h"
 
 namespace tessel {
 namespace {

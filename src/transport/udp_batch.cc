@@ -2,7 +2,7 @@
 
 #include <cerrno>
 
-#include "engine/log.h"
+#include "base/log.h"
 #include "transport/udp.h"
 
 namespace tessel {
