@@ -9,6 +9,7 @@
 #include "snmp/pdu_codec.h"
 #include "snmp/statistics.h"
 #include "snmpv3/engine_id.h"
+#include "snmpv3/engine_objects.h"
 #include "snmpv3/usm_crypto.h"
 #include "snmpv3/usm_users.h"
 #include "snmpv3/v3_config.h"
@@ -278,6 +279,49 @@ TEST_F(V3MessageTest, InvalidMessagesAreDroppedAndCounted) {
   EXPECT_TRUE(Send(v2c));
   gv_dropV1V2Requests = 1;
   EXPECT_FALSE(Send(v2c));
+}
+
+TEST_F(V3MessageTest, EngineObjectsAreServedByTheEngineAndReadOnly) {
+  RegisterEngineObjects();
+  StoreTreeCellsRefInArray();
+  V3Request unknown = Authenticated();
+  unknown.user = "mallory";
+  ASSERT_TRUE(Exchange3(Encode(unknown)));
+  Request get;
+  for (const char* name : {"10.2.1.1.0", "10.2.1.2.0", "10.2.1.4.0", "15.1.1.3.0", "11.2.1.2.0"})
+    get.bindings.push_back({O(std::string("1.3.6.1.6.3.") + name), VarValue::Empty(kAsnNull)});
+  auto reply = Send(get);
+  ASSERT_TRUE(reply);
+  ASSERT_EQ(reply->requestVarBinds.size(), 5u);
+  EXPECT_EQ(reply->requestVarBinds[0].value, VarValue::Octets(kAsnOctetString, engineId_));
+  EXPECT_EQ(reply->requestVarBinds[1].value, VarValue::Integer(3));
+  EXPECT_EQ(reply->requestVarBinds[2].value, VarValue::Integer(19989));
+  EXPECT_EQ(reply->requestVarBinds[3].value, VarValue::Unsigned(kAsnCounter, 1));
+  EXPECT_EQ(reply->requestVarBinds[4].value, VarValue::Unsigned(kAsnCounter, 0));
+  // A walk visits the engine time (1000 s since the agent started) and every counter in order.
+  Request next;
+  next.type = kGetNextRequest;
+  next.bindings = {{O("1.3.6.1.6.3"), VarValue::Empty(kAsnNull)}};
+  std::vector<std::string> walked;
+  std::int32_t engineTime = -1;
+  for (reply = Send(next); reply && reply->requestVarBinds.at(0).value.type != kEndOfMibView;
+       reply = Send(next)) {
+    next.bindings[0].first = reply->requestVarBinds[0].name;
+    walked.push_back(OidToPlainText(next.bindings[0].first).substr(12));
+    if (walked.back() == "10.2.1.3.0") engineTime = reply->requestVarBinds[0].value.AsInt32();
+  }
+  EXPECT_NEAR(engineTime, 1000, 1);
+  EXPECT_EQ(walked, (std::vector<std::string>{
+                        "10.2.1.1.0", "10.2.1.2.0", "10.2.1.3.0", "10.2.1.4.0", "11.2.1.1.0",
+                        "11.2.1.2.0", "11.2.1.3.0", "15.1.1.1.0", "15.1.1.2.0", "15.1.1.3.0",
+                        "15.1.1.4.0", "15.1.1.5.0", "15.1.1.6.0"}));
+  Request set;
+  set.type = kSetRequest;
+  set.community = "private";
+  set.bindings = {{O("1.3.6.1.6.3.10.2.1.2.0"), VarValue::Integer(9)}};
+  reply = Send(set);
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->errorStatus, kNotWritable);
 }
 
 }  // namespace
