@@ -115,6 +115,17 @@ std::vector<std::uint8_t> Encode(const V3Request& r) {
   return m.bytes;
 }
 
+// The message with one octet more at the end of the innermost of the given containers (each a
+// four-octet header, outermost first), or behind the message when none is given.
+std::vector<std::uint8_t> WithOctetAtEnd(std::vector<std::uint8_t> bytes,
+                                         const std::vector<std::size_t>& containers) {
+  std::size_t end =
+      containers.empty() ? bytes.size() : containers.back() + 4 + bytes[containers.back() + 3];
+  bytes.insert(bytes.begin() + static_cast<std::ptrdiff_t>(end), 0);
+  for (std::size_t at : containers) ++bytes[at + 3];
+  return bytes;
+}
+
 class V3MessageTest : public SnmpAgentTest {
  protected:
   void SetUp() override {
@@ -273,6 +284,28 @@ TEST_F(V3MessageTest, InvalidMessagesAreDroppedAndCounted) {
   privWithoutAuth.flags = 0x06;
   EXPECT_FALSE(Exchange3(Encode(privWithoutAuth)));
   EXPECT_EQ(V3Count(V3Counter::kInvalidMsgs), 2u);
+  // Every field ends within its container, and a container holds its fields and nothing else.
+  V3Request plain = Authenticated();
+  plain.flags = 0x04, plain.authKey.clear();  // no digest: every field is read before an answer
+  const std::vector<std::uint8_t> good = Encode(plain);
+  const std::size_t global = 7;  // behind the outer header and msgVersion
+  const std::size_t wrapper = global + 4 + good[global + 3];
+  const std::size_t usm = wrapper + 4;
+  const std::size_t scoped = wrapper + 4 + good[wrapper + 3];
+  std::vector<std::vector<std::uint8_t>> malformed(2, good);
+  --malformed[0][global + 3];  // msgSecurityModel runs past msgGlobalData
+  --malformed[1][usm + 3];     // msgPrivacyParameters runs past the USM SEQUENCE
+  for (std::vector<std::size_t> around : std::vector<std::vector<std::size_t>>{
+           {0, global}, {0, wrapper}, {0, wrapper, usm}, {0, scoped}})
+    malformed.push_back(WithOctetAtEnd(good, around));
+  // Behind the scoped PDU or behind the message: refused before the digest is checked.
+  malformed.push_back(WithOctetAtEnd(Encode(Authenticated()), {0}));
+  malformed.push_back(WithOctetAtEnd(Encode(Authenticated()), {}));
+  for (std::size_t i = 0; i < malformed.size(); ++i) {
+    EXPECT_FALSE(Exchange3(malformed[i])) << i;
+    EXPECT_EQ(SnmpCount(SnmpCounter::kAsnParseErrors), i + 1);
+  }
+  EXPECT_TRUE(Exchange3(good));
   // A v3 engine still answers v2c unless told to drop it.
   Request v2c;
   v2c.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
