@@ -140,7 +140,8 @@ class V3MessageTest : public SnmpAgentTest {
     CreateLCDVacmAccessTable();
     CreateLCDVacmViewTreeFamilyTable();
     agent_.agentInfo->engineBoots = 3;
-    agent_.agentInfo->startTime = GetCurrentSeconds() - 1000;  // its engine time is 1000 s
+    engineTime_ = std::min(1000u, GetCurrentSeconds());  // the monotonic clock may be young
+    agent_.agentInfo->startTime = GetCurrentSeconds() - engineTime_;
     engineId_ = AgentEngineId(agent_);
   }
   void TearDown() override {
@@ -154,7 +155,7 @@ class V3MessageTest : public SnmpAgentTest {
     r.flags = 0x05;
     r.engineId = engineId_;
     r.boots = 3;
-    r.time = 1000;
+    r.time = static_cast<std::int32_t>(engineTime_);
     r.user = "alice";
     r.authKey = GetLocalKeyValue("alicepassword", AuthProtocol::kMd5, engineId_);
     r.name = O("1.3.6.1.2.1.1.5.0");
@@ -207,6 +208,7 @@ class V3MessageTest : public SnmpAgentTest {
   }
 
   std::string engineId_;
+  std::uint32_t engineTime_ = 0;
   std::vector<std::uint8_t> reply_;
   std::uint8_t replyFlags_ = 0xFF;
 };
@@ -237,7 +239,7 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   tooHigh.flags = 0x07;
   EXPECT_EQ(ReportedName(tooHigh), O("1.3.6.1.6.3.15.1.1.1.0"));
   V3Request stale = Authenticated();
-  stale.time = 1000 + 152;
+  stale.time += 152;
   EXPECT_EQ(ReportedName(stale), O("1.3.6.1.6.3.15.1.1.2.0"));
   V3Request otherBoots = Authenticated();
   otherBoots.boots = 4;
@@ -248,7 +250,7 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   EXPECT_EQ(replyFlags_ & 0x03, 0x01);
   std::string text(reply_.begin(), reply_.end());
   EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 3), "\x02\x01\x03");
-  stale.time = 1000 - 149;
+  stale.time -= 152 + 149;
   auto inWindow = Exchange3(Encode(stale));
   ASSERT_TRUE(inWindow);
   EXPECT_EQ(inWindow->type, kGetResponse);
@@ -331,7 +333,7 @@ TEST_F(V3MessageTest, EngineObjectsAreServedByTheEngineAndReadOnly) {
   EXPECT_EQ(reply->requestVarBinds[2].value, VarValue::Integer(19989));
   EXPECT_EQ(reply->requestVarBinds[3].value, VarValue::Unsigned(kAsnCounter, 1));
   EXPECT_EQ(reply->requestVarBinds[4].value, VarValue::Unsigned(kAsnCounter, 0));
-  // A walk visits the engine time (1000 s since the agent started) and every counter in order.
+  // A walk visits the engine time (seconds since the agent started) and every counter in order.
   Request next;
   next.type = kGetNextRequest;
   next.bindings = {{O("1.3.6.1.6.3"), VarValue::Empty(kAsnNull)}};
@@ -343,7 +345,7 @@ TEST_F(V3MessageTest, EngineObjectsAreServedByTheEngineAndReadOnly) {
     walked.push_back(OidToPlainText(next.bindings[0].first).substr(12));
     if (walked.back() == "10.2.1.3.0") engineTime = reply->requestVarBinds[0].value.AsInt32();
   }
-  EXPECT_NEAR(engineTime, 1000, 1);
+  EXPECT_NEAR(engineTime, engineTime_, 1);
   EXPECT_EQ(walked, (std::vector<std::string>{
                         "10.2.1.1.0", "10.2.1.2.0", "10.2.1.3.0", "10.2.1.4.0", "11.2.1.1.0",
                         "11.2.1.2.0", "11.2.1.3.0", "15.1.1.1.0", "15.1.1.2.0", "15.1.1.3.0",
