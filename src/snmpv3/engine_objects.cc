@@ -42,6 +42,13 @@ std::optional<VarValue> CounterValue(V3Counter first, std::uint32_t last, std::u
   return VarValue::Unsigned(kAsnCounter, V3Count(counter));
 }
 
+// Each group's counters are consecutive in V3Counter, in the order of the group's scalars.
+constexpr int Position(V3Counter counter) { return static_cast<int>(counter); }
+static_assert(Position(V3Counter::kDecryptionErrors) ==
+              Position(V3Counter::kUnsupportedSecLevels) + 5);
+static_assert(Position(V3Counter::kUnknownPduHandlers) ==
+              Position(V3Counter::kUnknownSecurityModels) + 2);
+
 // snmpUnknownSecurityModels, snmpInvalidMsgs, snmpUnknownPDUHandlers.
 std::optional<VarValue> MpdStatsValue(std::uint32_t subId, const AgentSession&) {
   return CounterValue(V3Counter::kUnknownSecurityModels, 3, subId);
