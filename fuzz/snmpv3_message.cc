@@ -1,5 +1,6 @@
 // Fuzzes the SNMPv3 path of an agent: message header, USM security parameters, the security
-// checks and Reports, decryption and the scoped PDU, with one user per security level.
+// checks and Reports, decryption and the scoped PDU, with one user per security level, over a
+// MIB that holds the engine's own objects.
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
@@ -8,6 +9,7 @@
 #include "snmp/handlers.h"
 #include "snmp/message.h"
 #include "snmp/mib_tree.h"
+#include "snmpv3/engine_objects.h"
 #include "snmpv3/v3_config.h"
 #include "snmpv3/vacm.h"
 #include "support/memory_host.h"
@@ -29,6 +31,7 @@ AgentSession* SetUpAgent() {
   system.dataTypes = {"4", "4"};
   system.access = {"43706", "43706"};
   CreateAndRegisterCell(system);
+  RegisterEngineObjects();
   StoreTreeCellsRefInArray();
   host.SetValue("1.3.6.1.2.1.1.1.0", "fuzz");
   host.SetValue("1.3.6.1.2.1.1.5.0", "name");

@@ -12,14 +12,15 @@ std::atomic<std::uint32_t> clockBaseSeconds{0};
 }  // namespace
 
 std::uint32_t GetCurrentSeconds() {
-  auto now = std::chrono::system_clock::now().time_since_epoch();
+  auto now = std::chrono::steady_clock::now().time_since_epoch();
   return static_cast<std::uint32_t>(std::chrono::duration_cast<std::chrono::seconds>(now).count());
 }
 
 void SetClockBase() { clockBaseSeconds.store(GetCurrentSeconds()); }
 
 std::uint32_t UptimeSince(std::uint32_t startSeconds, bool hundredths) {
-  std::uint32_t seconds = GetCurrentSeconds() - startSeconds;
+  std::uint32_t now = GetCurrentSeconds();
+  std::uint32_t seconds = now > startSeconds ? now - startSeconds : 0;
   return hundredths ? seconds * 100u : seconds;
 }
 

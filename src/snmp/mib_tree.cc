@@ -116,6 +116,7 @@ std::unique_ptr<TreeCell> BuildCell(const TreeCellRegistration& registration) {
   cell->smiVersion = SmiVersionFromText(registration.versionText);
   cell->isTable = registration.isTable;
   cell->rowStatusColumn = registration.rowStatusColumn;
+  cell->engineRead = registration.engineRead;
   cell->oid = CellOidFromText(registration);
   if (cell->oid.empty()) {
     LOG_ERROR("unable to register %s: malformed OID %s\n", registration.label.c_str(),
@@ -262,6 +263,10 @@ void PrintTreeCell(const TreeCell& cell) {
 }
 
 void SetHandlers(const DefaultHandlers& handlers, TreeCell* cell) {
+  if (cell->engineRead != nullptr) {
+    cell->readHandler = cell->engineRead;
+    return;
+  }
   cell->readHandler = cell->isTable ? handlers.tableRead : handlers.scalarRead;
   cell->writeHandler = cell->isTable ? handlers.tableWrite : handlers.scalarWrite;
 }
@@ -282,6 +287,7 @@ std::unique_ptr<TreeCell> SliceCell(const TreeCell& cell, std::size_t begin, std
   part->oid = cell.oid;
   part->isTable = cell.isTable;
   part->rowStatusColumn = cell.rowStatusColumn;
+  part->engineRead = cell.engineRead;
   std::vector<Column> columns = ColumnsOf(cell);
   SetColumns(part.get(),
              std::vector<Column>(columns.begin() + static_cast<std::ptrdiff_t>(begin),

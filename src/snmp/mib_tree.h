@@ -57,6 +57,7 @@ struct TreeCell {
   bool hasSyntaxes = false;
   ReadHandler readHandler = nullptr;
   WriteHandler writeHandler = nullptr;
+  ReadHandler engineRead = nullptr;  // set: the engine answers the cell itself (read-only)
   TreeCell* prev = nullptr;
   TreeCell* next = nullptr;
 
@@ -85,6 +86,9 @@ struct TreeCellRegistration {
   bool isTable = false;
   std::int32_t rowStatusColumn = 0;
   std::optional<std::vector<std::string>> syntaxes;
+  // Objects the engine answers itself keep this read handler and have no write handler; every
+  // other cell takes the default handlers.
+  ReadHandler engineRead = nullptr;
 };
 
 bool CreateAndRegisterCell(const TreeCellRegistration& registration);

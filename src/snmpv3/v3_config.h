@@ -16,8 +16,8 @@ int AddUsmUserFromHost(std::string_view userName, std::string_view authProtocol,
                        std::string_view privPassword, std::int32_t discoveryTimeFlag);
 
 // At a service start: sets the engine ID unless set, creates the VACM tables unless they exist,
-// resets the SNMPv3 statistics and registers the snmpEngine, snmpMPDStats and usmStats groups
-// (their values come from the host like those of any registered object).
+// resets the SNMPv3 statistics and registers the engine's own objects (snmpEngine, snmpMPDStats
+// and usmStats, served by the engine).
 void InitSnmpV3Params();
 
 // At a stop: every user, VACM row and the engine ID go; the engine speaks SNMPv3 again only once

@@ -110,18 +110,22 @@ class Builder {
 
 // ---- Parsing ----
 
+// Reads the fields of one container: every field must end within it, and Enter gives a nested
+// container a reader of its own, bounded by that container's length.
 struct Reader {
   const std::uint8_t* cursor;
   std::int32_t remaining;
 
-  bool Header(std::uint8_t expected, std::int32_t* contents) {
+  // Reads a header of the expected type; *inner covers exactly its contents and this reader
+  // moves behind the whole field.
+  bool Enter(std::uint8_t expected, Reader* inner) {
     std::int32_t length = remaining;
     std::uint8_t type = 0;
-    const std::uint8_t* inside = AsnParseHeader(cursor, &length, &type);
-    if (inside == nullptr || type != expected) return false;
-    remaining -= static_cast<std::int32_t>(inside - cursor);
-    cursor = inside;
-    *contents = length;
+    const std::uint8_t* contents = AsnParseHeader(cursor, &length, &type);
+    if (contents == nullptr || type != expected) return false;
+    *inner = Reader{contents, length};
+    remaining -= static_cast<std::int32_t>(contents - cursor) + length;
+    cursor = contents + length;
     return true;
   }
   bool Integer(std::int32_t* value) {
@@ -140,6 +144,14 @@ struct Reader {
     out->assign(reinterpret_cast<const char*>(buffer.data()), length);
     cursor = next;
     return true;
+  }
+  bool AtEnd() const { return remaining == 0; }
+  // What is left is exactly one field, of any type.
+  bool HoldsOneField() const {
+    std::int32_t length = remaining;
+    std::uint8_t type = 0;
+    const std::uint8_t* contents = AsnParseHeader(cursor, &length, &type);
+    return contents != nullptr && contents + length == cursor + remaining;
   }
 };
 
@@ -182,14 +194,15 @@ struct V3Request {
   std::uint32_t agentTime = 0;
 };
 
-bool ParseHeader(Reader* reader, MessageHeader* header) {
-  std::int32_t contents = 0;
+// msgVersion and msgGlobalData, which holds its four fields and nothing else.
+bool ParseHeader(Reader* message, MessageHeader* header) {
+  Reader global{};
   std::int32_t version = 0;
   std::string flags;
-  if (!reader->Integer(&version) || version != 3 || !reader->Header(kAsnSequence, &contents) ||
-      !reader->Integer(&header->msgId) || !reader->Integer(&header->msgMaxSize) ||
-      !reader->Octets(&flags, 10) || flags.size() != 1 ||
-      !reader->Integer(&header->securityModel)) {
+  if (!message->Integer(&version) || version != 3 || !message->Enter(kAsnSequence, &global) ||
+      !global.Integer(&header->msgId) || !global.Integer(&header->msgMaxSize) ||
+      !global.Octets(&flags, 10) || flags.size() != 1 || !global.Integer(&header->securityModel) ||
+      !global.AtEnd()) {
     LOG_ERROR("Unable to parse SNMPV3 Message header...\n");
     return false;
   }
@@ -207,23 +220,26 @@ bool LevelFromFlags(std::uint8_t flags, std::uint8_t* level) {
   return true;
 }
 
-bool ParseSecurityParameters(Reader* reader, const std::uint8_t* start, std::uint8_t level,
+// msgSecurityParameters: an OCTET STRING that holds exactly the USM SEQUENCE, which holds its six
+// fields and nothing else.
+bool ParseSecurityParameters(Reader* message, const std::uint8_t* start, std::uint8_t level,
                              SecurityParameters* security) {
-  std::int32_t contents = 0;
-  if (!reader->Header(kAsnOctetString, &contents) || !reader->Header(kAsnSequence, &contents) ||
-      !reader->Octets(&security->engineId, 255) || !reader->Integer(&security->boots) ||
-      !reader->Integer(&security->time) || !reader->Octets(&security->userName, 255)) {
+  Reader wrapper{};
+  Reader usm{};
+  if (!message->Enter(kAsnOctetString, &wrapper) || !wrapper.Enter(kAsnSequence, &usm) ||
+      !wrapper.AtEnd() || !usm.Octets(&security->engineId, 255) || !usm.Integer(&security->boots) ||
+      !usm.Integer(&security->time) || !usm.Octets(&security->userName, 255)) {
     LOG_ERROR("Parsing failed in Security parameters. \n");
     return false;
   }
-  if (!reader->Octets(&security->authParameters, kDigestLength)) {
+  if (!usm.Octets(&security->authParameters, kDigestLength)) {
     LOG_ERROR("Unable to decode authParams (digest) !!!\n");
     return false;
   }
   // The contents of an OCTET STRING end at the cursor.
   security->authOffset =
-      static_cast<std::size_t>(reader->cursor - start) - security->authParameters.size();
-  if (!reader->Octets(&security->privParameters, kSaltLength)) {
+      static_cast<std::size_t>(usm.cursor - start) - security->authParameters.size();
+  if (!usm.Octets(&security->privParameters, kSaltLength) || !usm.AtEnd()) {
     LOG_ERROR("Unable to parse the priv params %d .\n", 0);
     return false;
   }
@@ -238,12 +254,14 @@ bool ParseSecurityParameters(Reader* reader, const std::uint8_t* start, std::uin
   return true;
 }
 
-// The scoped PDU from its plaintext: contextEngineID, contextName and the PDU.
+// The scoped PDU from its plaintext: a SEQUENCE of contextEngineID, contextName and the PDU,
+// nothing else. Decrypted plaintext may run on behind it (the cipher's padding); ParseRequest has
+// made sure that an unencrypted one fills the rest of the message.
 bool ParseScopedPdu(ScopedPdu* scoped, bool countIncoming) {
-  Reader reader{scoped->plaintext.data(), static_cast<std::int32_t>(scoped->plaintext.size())};
-  std::int32_t contents = 0;
-  if (!reader.Header(kAsnSequence, &contents) || !reader.Octets(&scoped->contextEngineId, 255) ||
-      !reader.Octets(&scoped->contextName, 255)) {
+  Reader plaintext{scoped->plaintext.data(), static_cast<std::int32_t>(scoped->plaintext.size())};
+  Reader reader{};
+  if (!plaintext.Enter(kAsnSequence, &reader) || !reader.Octets(&scoped->contextEngineId, 255) ||
+      !reader.Octets(&scoped->contextName, 255) || !reader.HoldsOneField()) {
     LOG_ERROR("Error in Parsing  Scoped pdu\n");
     return false;
   }
@@ -443,14 +461,14 @@ bool ScopedPlaintext(const V3Request& request, std::vector<std::uint8_t>* plaint
     plaintext->assign(at, at + length);
     return true;
   }
-  Reader reader{at, static_cast<std::int32_t>(length)};
-  std::int32_t contents = 0;
-  if (!reader.Header(kAsnOctetString, &contents)) return false;
+  Reader msgData{at, static_cast<std::int32_t>(length)};
+  Reader encrypted{};
+  if (!msgData.Enter(kAsnOctetString, &encrypted)) return false;
   return DecryptScopedPdu(
       request.user->priv, PrivKey(request), static_cast<std::uint32_t>(request.security.boots),
       static_cast<std::uint32_t>(request.security.time),
-      reinterpret_cast<const std::uint8_t*>(request.security.privParameters.data()), reader.cursor,
-      static_cast<std::size_t>(contents), plaintext);
+      reinterpret_cast<const std::uint8_t*>(request.security.privParameters.data()),
+      encrypted.cursor, static_cast<std::size_t>(encrypted.remaining), plaintext);
 }
 
 // ---- The request ----
@@ -534,11 +552,13 @@ int ProcessScopedPdu(V3Request& request, std::uint8_t* reply, std::size_t* reply
   return Respond(request, scoped, reply, replyLength);
 }
 
-// Header and security parameters; false when the message is dropped (counted).
+// Header and security parameters; false when the message is dropped (counted). The message is
+// the whole datagram; what follows the security parameters in it is the scoped PDU field.
 bool ParseRequest(V3Request& request) {
-  Reader reader{request.message.data(), static_cast<std::int32_t>(request.message.size())};
-  std::int32_t contents = 0;
-  if (!reader.Header(kAsnSequence, &contents) || !ParseHeader(&reader, &request.header)) {
+  Reader datagram{request.message.data(), static_cast<std::int32_t>(request.message.size())};
+  Reader reader{};
+  if (!datagram.Enter(kAsnSequence, &reader) || !datagram.AtEnd() ||
+      !ParseHeader(&reader, &request.header)) {
     CountSnmp(SnmpCounter::kAsnParseErrors);
     return false;
   }
@@ -554,6 +574,11 @@ bool ParseRequest(V3Request& request) {
   }
   if (!ParseSecurityParameters(&reader, request.message.data(), request.level, &request.security)) {
     CountV3(V3Counter::kInvalidMsgs);
+    CountSnmp(SnmpCounter::kAsnParseErrors);
+    return false;
+  }
+  if (!reader.HoldsOneField()) {  // msgData: the scoped PDU, plaintext or encrypted, alone
+    LOG_ERROR("Error in Parsing  Scoped pdu\n");
     CountSnmp(SnmpCounter::kAsnParseErrors);
     return false;
   }

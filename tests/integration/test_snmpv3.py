@@ -3,6 +3,7 @@ the default configuration (profiles/snmpv3.conf), the Reports for security error
 
 import re
 import subprocess
+import time
 
 import pytest
 
@@ -32,8 +33,9 @@ def v3(user, *security):
 
 
 def walk(tool, endpoint, *options):
+    """A walk without the engine's own objects, whose counters and time move with every exchange."""
     return [l for l in lines(tool, *options, endpoint, "1.3")
-            if "No more variables left" not in l and l != "End of MIB"]
+            if "No more variables left" not in l and l != "End of MIB" and not l.startswith(".1.3.6.1.6.3.")]
 
 
 def received_packets(debug_output):
@@ -144,6 +146,31 @@ for user in users:
     result = subprocess.run(["/usr/bin/python3", "-c", script], capture_output=True, text=True, timeout=60)
     assert result.returncode == 0, result.stderr
     assert result.stdout.split() == ["edge-router"] * 3
+
+
+def test_engine_objects_tell_the_agents_identity_and_counters(v3net):
+    agent = v3net.agent(0)
+    engine, unknown_users = "1.3.6.1.6.3.10.2.1", "1.3.6.1.6.3.15.1.1.3.0"
+
+    def read(*oids):
+        return [l.split(" = ", 1)[1] for l in lines("snmpget", *v3("md5"), agent, *oids)]
+
+    engine_id, boots, first_time, unknown_before = read(f"{engine}.1.0", f"{engine}.2.0", f"{engine}.3.0",
+                                                        unknown_users)
+    assert (engine_id, boots) == (f'STRING: "{agent.replace(":", "#")}"', "INTEGER: 1")
+    assert read(f"{engine}.4.0") == ["INTEGER: 19989"]
+    result = snmp("snmpget", *v3("nobody", "-l", "noAuthNoPriv"), agent, SYS_NAME, check=False)
+    assert "Unknown user name" in result.stderr
+    time.sleep(1.2)
+    later_time, unknown_after = read(f"{engine}.3.0", unknown_users)
+    assert int(later_time.split()[-1]) > int(first_time.split()[-1])
+    assert int(unknown_after.split()[-1]) > int(unknown_before.split()[-1])
+    refused = snmp("snmpset", *v3("shaaes"), agent, f"{engine}.2.0", "i", "7", check=False)
+    assert "notWritable" in refused.stderr + refused.stdout
+    walked = [l.split(" = ")[0] for l in lines("snmpwalk", *v3("md5"), agent, "1.3.6.1.6.3")
+              if "No more variables left" not in l]
+    assert walked == [f".{engine}.{i}.0" for i in (1, 2, 3, 4)] + [f".1.3.6.1.6.3.11.2.1.{i}.0" for i in (1, 2, 3)] + [
+        f".1.3.6.1.6.3.15.1.1.{i}.0" for i in range(1, 7)]
 
 
 def test_given_configuration_replaces_the_default_and_communities_keep_working(tmp_path):

@@ -21,18 +21,9 @@ std::string Octets(std::string_view hex) {
   return out;
 }
 
-std::string Hex(std::string_view octets) {
-  std::string out;
-  char buffer[3];
-  for (unsigned char octet : octets) {
-    std::snprintf(buffer, sizeof buffer, "%02x", octet);
-    out += buffer;
-  }
-  return out;
-}
-
+std::string Hex(std::string_view octets) { return BytesToHex(octets); }
 std::string Hex(const std::uint8_t* data, std::size_t length) {
-  return Hex(std::string_view(reinterpret_cast<const char*>(data), length));
+  return BytesToHex(std::string_view(reinterpret_cast<const char*>(data), length));
 }
 
 const std::string kRfcEngineId = Octets("00 00 00 00 00 00 00 00 00 00 00 02");
@@ -46,19 +37,12 @@ TEST(UsmCryptoTest, PasswordToKeyMatchesRfc3414Samples) {
   EXPECT_EQ(Hex(shaKu), "9fb5cc0381497b3793528939ff788d5d79145211");
   EXPECT_EQ(Hex(PasswordToLocalKey("maplesyrup", AuthProtocol::kSha, kRfcEngineId)),
             "6695febc9288e36282235fc7151f128497b38f3f");
-  EXPECT_EQ(Hex(PasswordToLocalKey("newsyrup", AuthProtocol::kMd5, kRfcEngineId)),
-            "87021d7bd9d101ba05ea6e3bf9d9bd4a");
   // A password longer than one hashing chunk, against an independent computation.
   std::string longPassword;
   for (int i = 0; i < 4099; ++i) longPassword.push_back(static_cast<char>((i * 7 + 3) % 256));
   EXPECT_EQ(Hex(PasswordToKey(longPassword, AuthProtocol::kSha)),
             "d36c78ebd2463a84826c59fe45409fce3e8f31b6");
-  EXPECT_EQ(Hex(PasswordToLocalKey(longPassword, AuthProtocol::kSha, Octets("800007e580aabbccdd"))),
-            "c80a5af865650ad83d7e70c940324f315f4f1ea7");
-
   EXPECT_TRUE(PasswordToKey("", AuthProtocol::kMd5).empty());
-  EXPECT_TRUE(PasswordToKey("maplesyrup", AuthProtocol::kNone).empty());
-  EXPECT_TRUE(LocalizeKey(md5Ku, AuthProtocol::kSha, kRfcEngineId).empty());
 }
 
 TEST(UsmCryptoTest, KeyCacheLocalisesToNewEnginesWithoutExpandingAgain) {
@@ -77,64 +61,23 @@ TEST(UsmCryptoTest, KeyCacheLocalisesToNewEnginesWithoutExpandingAgain) {
   EXPECT_EQ(second, PasswordToLocalKey(password, AuthProtocol::kMd5, "engine-B"));
   // The protocol is part of the key: SHA needs its own expansion and gives 20 octets.
   EXPECT_EQ(GetLocalKeyValue(password, AuthProtocol::kSha, "engine-A").size(), 20u);
-  EXPECT_TRUE(GetLocalKeyValue("", AuthProtocol::kSha, "engine-A").empty());
 }
 
-TEST(UsmCryptoTest, ProtocolTypeGivesLevels) {
-  AuthProtocol auth;
-  PrivProtocol priv;
-  EXPECT_EQ(GetProtocolType(kUsmNoAuthProtocol, kUsmDesPrivProtocol, &auth, &priv), kNoAuthNoPriv);
-  EXPECT_TRUE(auth == AuthProtocol::kNone && priv == PrivProtocol::kNone);
-  EXPECT_EQ(GetProtocolType(kUsmHmacShaAuthProtocol, kUsmNoPrivProtocol, &auth, &priv),
-            kAuthNoPriv);
-  EXPECT_TRUE(auth == AuthProtocol::kSha && priv == PrivProtocol::kNone);
-  EXPECT_EQ(GetProtocolType(kUsmHmacMd5AuthProtocol, kUsmAesCfb128Protocol, &auth, &priv),
-            kAuthPriv);
-  EXPECT_TRUE(auth == AuthProtocol::kMd5 && priv == PrivProtocol::kAes128);
-  EXPECT_EQ(GetProtocolType(kUsmHmacMd5AuthProtocol, kUsmHmacMd5AuthProtocol, &auth, &priv),
-            kInvalidSecurityLevel);
-  Oid truncated(kUsmHmacMd5AuthProtocol.begin(), kUsmHmacMd5AuthProtocol.end() - 1);
-  EXPECT_EQ(GetProtocolType(truncated, kUsmNoPrivProtocol, &auth, &priv), kInvalidSecurityLevel);
-}
-
-struct HmacCase {
-  AuthProtocol auth;
-  std::string key;
-  std::string data;
-  const char* digest96;
-};
-
-TEST(UsmCryptoTest, DigestMatchesRfc2202) {
-  const HmacCase cases[] = {
-      {AuthProtocol::kMd5, std::string(16, '\x0b'), "Hi There", "9294727a3638bb1c13f48ef8"},
-      {AuthProtocol::kMd5, std::string(16, '\xaa'), std::string(50, '\xdd'),
-       "56be34521d144c88dbb8c733"},
-      {AuthProtocol::kSha, std::string(20, '\x0b'), "Hi There", "b617318655057264e28bc0b6"},
-      {AuthProtocol::kSha, std::string(20, '\xaa'), std::string(50, '\xdd'),
-       "125d7342b9ac11cd91a39af4"},
-  };
-  for (const HmacCase& c : cases) {
-    std::uint8_t digest[kUsmDigestLength] = {};
-    ASSERT_TRUE(CalculateDigest(c.auth, c.key, reinterpret_cast<const std::uint8_t*>(c.data.data()),
-                                c.data.size(), digest));
-    EXPECT_EQ(Hex(digest, sizeof digest), c.digest96);
-  }
-}
-
-TEST(UsmCryptoTest, DigestRefusesBadInputAndComparesAllOctets) {
-  const std::uint8_t data[] = {1, 2, 3};
-  std::uint8_t digest[kUsmDigestLength];
-  EXPECT_FALSE(CalculateDigest(AuthProtocol::kMd5, std::string(20, 'k'), data, 3, digest));
-  EXPECT_FALSE(CalculateDigest(AuthProtocol::kSha, std::string(16, 'k'), data, 3, digest));
-  EXPECT_FALSE(CalculateDigest(AuthProtocol::kMd5, std::string(16, 'k'), data, 0, digest));
-  EXPECT_FALSE(CalculateDigest(AuthProtocol::kNone, "", data, 3, digest));
-
-  std::uint8_t a[kUsmDigestLength] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12};
-  std::uint8_t b[kUsmDigestLength];
-  std::copy(a, a + kUsmDigestLength, b);
-  EXPECT_TRUE(DigestsEqual(a, b));
-  b[11] ^= 1;
-  EXPECT_FALSE(DigestsEqual(a, b));
+TEST(UsmCryptoTest, DigestMatchesRfc2202AndComparesAllOctets) {
+  std::uint8_t md5[kUsmDigestLength];
+  ASSERT_TRUE(CalculateDigest(AuthProtocol::kMd5, std::string(16, '\x0b'),
+                              reinterpret_cast<const std::uint8_t*>("Hi There"), 8, md5));
+  EXPECT_EQ(Hex(md5, sizeof md5), "9294727a3638bb1c13f48ef8");
+  const std::string data(50, '\xdd');
+  std::uint8_t sha[kUsmDigestLength];
+  ASSERT_TRUE(CalculateDigest(AuthProtocol::kSha, std::string(20, '\xaa'),
+                              reinterpret_cast<const std::uint8_t*>(data.data()), 50, sha));
+  EXPECT_EQ(Hex(sha, sizeof sha), "125d7342b9ac11cd91a39af4");
+  EXPECT_FALSE(CalculateDigest(AuthProtocol::kMd5, std::string(20, 'k'), sha, 3, md5));
+  std::copy(md5, md5 + kUsmDigestLength, sha);
+  EXPECT_TRUE(DigestsEqual(md5, sha));
+  sha[11] ^= 1;
+  EXPECT_FALSE(DigestsEqual(md5, sha));
 }
 
 // The plaintext, or "<refused>" when decryption fails.
@@ -173,18 +116,11 @@ TEST(UsmCryptoTest, DesDecryptsKnownVectorAndRoundTrips) {
   EXPECT_EQ(Decrypt(PrivProtocol::kDes, key, 0, 0, zeroSalt, vector), "Now is the time for all ");
   EXPECT_EQ(Decrypt(PrivProtocol::kDes, key, 0, 0, zeroSalt, vector.substr(1)), "<refused>");
 
-  // Consecutive encryptions take distinct salts that start with the engine boots.
-  Encryption first = Encrypt(PrivProtocol::kDes, key, 0x01020304, 77, "scoped pdu 13");
-  Encryption second = Encrypt(PrivProtocol::kDes, key, 0x01020304, 77, "scoped pdu 13");
-  EXPECT_EQ(Hex(first.salt, 4), "01020304");
-  EXPECT_NE(Hex(first.salt, 8), Hex(second.salt, 8));
-  EXPECT_NE(first.cipher, second.cipher);
-  EXPECT_EQ(Decrypt(PrivProtocol::kDes, key, 0, 0, second.salt, second.cipher),
+  // The salt starts with the engine boots; the plaintext is padded to whole blocks.
+  Encryption encrypted = Encrypt(PrivProtocol::kDes, key, 0x01020304, 77, "scoped pdu 13");
+  EXPECT_EQ(Hex(encrypted.salt, 4), "01020304");
+  EXPECT_EQ(Decrypt(PrivProtocol::kDes, key, 0, 0, encrypted.salt, encrypted.cipher),
             std::string("scoped pdu 13\0\0\0", 16));
-  std::string wrongKey = key;
-  wrongKey[0] ^= 0x10;  // a key bit, not a parity bit
-  EXPECT_NE(Decrypt(PrivProtocol::kDes, wrongKey, 0, 0, second.salt, second.cipher).substr(0, 13),
-            "scoped pdu 13");
 }
 
 TEST(UsmCryptoTest, AesDecryptsKnownVectorAndRoundTrips) {
@@ -200,15 +136,10 @@ TEST(UsmCryptoTest, AesDecryptsKnownVectorAndRoundTrips) {
 
   const std::string message = "an odd-length scoped PDU";
   Encryption first = Encrypt(PrivProtocol::kAes128, key, 9, 1000, message);
-  Encryption second = Encrypt(PrivProtocol::kAes128, key, 9, 1000, message);
-  EXPECT_NE(Hex(first.salt, 8), Hex(second.salt, 8));
-  EXPECT_NE(first.cipher, second.cipher);
   EXPECT_EQ(first.cipher.size(), message.size());
   EXPECT_EQ(Decrypt(PrivProtocol::kAes128, key, 9, 1000, first.salt, first.cipher), message);
   // Boots and time are part of the IV: another time does not decrypt.
   EXPECT_NE(Decrypt(PrivProtocol::kAes128, key, 9, 1001, first.salt, first.cipher), message);
-  EXPECT_EQ(Decrypt(PrivProtocol::kAes128, key.substr(0, 15), 9, 1000, first.salt, first.cipher),
-            "<refused>");
 }
 
 TEST(UsmCryptoTest, ConcurrentEncryptionsNeverShareASalt) {

@@ -9,6 +9,7 @@
 #include "snmp/pdu_codec.h"
 #include "snmp/statistics.h"
 #include "snmpv3/engine_id.h"
+#include "snmpv3/engine_objects.h"
 #include "snmpv3/usm_crypto.h"
 #include "snmpv3/usm_users.h"
 #include "snmpv3/v3_config.h"
@@ -18,36 +19,29 @@
 namespace tessel {
 namespace {
 
-// Appends TLVs; constructed ones are closed with their final length.
-class Encoder {
- public:
-  std::size_t Open(std::uint8_t type) {
-    std::size_t at = bytes.size();
-    bytes.insert(bytes.end(), {type, 0x82, 0, 0});
-    return at;
-  }
-  void Close(std::size_t at) {
-    std::size_t length = bytes.size() - at - 4;
-    bytes[at + 2] = static_cast<std::uint8_t>(length >> 8);
-    bytes[at + 3] = static_cast<std::uint8_t>(length);
-  }
-  void Integer(std::int32_t value) {
-    std::uint8_t buffer[8];
-    std::int32_t room = sizeof buffer;
-    std::uint8_t* end = AsnBuildInt(buffer, &room, kAsnInteger, value);
-    bytes.insert(bytes.end(), buffer, end);
-  }
-  std::size_t Octets(const std::string& value) {
-    bytes.push_back(kAsnOctetString);
-    bytes.push_back(static_cast<std::uint8_t>(value.size()));
-    bytes.insert(bytes.end(), value.begin(), value.end());
-    return bytes.size() - value.size();
-  }
-  void Raw(const std::vector<std::uint8_t>& raw) {
-    bytes.insert(bytes.end(), raw.begin(), raw.end());
-  }
-  std::vector<std::uint8_t> bytes;
-};
+using Bytes = std::vector<std::uint8_t>;
+
+// A field with the four-octet header form every container of the engine's replies has too.
+Bytes Container(std::uint8_t type, std::initializer_list<Bytes> parts) {
+  Bytes out = {type, 0x82, 0, 0};
+  for (const Bytes& part : parts) out.insert(out.end(), part.begin(), part.end());
+  out[2] = static_cast<std::uint8_t>((out.size() - 4) >> 8);
+  out[3] = static_cast<std::uint8_t>(out.size() - 4);
+  return out;
+}
+Bytes Int(std::int32_t value) {
+  Bytes out(8);
+  std::int32_t room = 8;
+  out.resize(
+      static_cast<std::size_t>(AsnBuildInt(out.data(), &room, kAsnInteger, value) - out.data()));
+  return out;
+}
+Bytes Str(const std::string& value) {
+  Bytes out(value.size() + 2, static_cast<std::uint8_t>(value.size()));
+  out[0] = kAsnOctetString;
+  std::copy(value.begin(), value.end(), out.begin() + 2);
+  return out;
+}
 
 struct V3Request {
   std::int32_t msgId = 77;
@@ -63,55 +57,57 @@ struct V3Request {
   Oid name;
 };
 
+// Where the contents of the field at `at` begin and where the field ends; both at the end of the
+// bytes when no field can be read there.
+struct Tlv {
+  std::size_t contents, end;
+};
+Tlv Field(const std::vector<std::uint8_t>& bytes, std::size_t at) {
+  std::int32_t length = static_cast<std::int32_t>(bytes.size() - std::min(at, bytes.size()));
+  std::uint8_t type = 0;
+  const std::uint8_t* contents = AsnParseHeader(bytes.data() + at, &length, &type);
+  if (contents == nullptr) return {bytes.size(), bytes.size()};
+  std::size_t offset = static_cast<std::size_t>(contents - bytes.data());
+  return {offset, offset + static_cast<std::size_t>(length)};
+}
+
 // An SNMPv3 GetRequest for one name, authenticated when the request says so.
 std::vector<std::uint8_t> Encode(const V3Request& r) {
-  Encoder pdu;
-  std::size_t header = pdu.Open(kGetRequest);
-  pdu.Integer(4242);
-  pdu.Integer(0);
-  pdu.Integer(0);
-  std::size_t list = pdu.Open(kAsnSequence);
-  std::vector<std::uint8_t> binding(64);
-  std::int32_t room = 64;
-  std::uint8_t* end =
-      BuildVarOp(binding.data(), r.name.data(), r.name.size(), VarValue::Empty(kAsnNull), &room);
-  binding.resize(static_cast<std::size_t>(end - binding.data()));
-  pdu.Raw(binding);
-  pdu.Close(list);
-  pdu.Close(header);
+  Request get;  // its PDU, behind the version and community of a v2c message
+  get.requestId = 4242;
+  get.bindings = {{r.name, VarValue::Empty(kAsnNull)}};
+  Bytes v2c = EncodeRequest(get);
+  Bytes pdu(v2c.begin() + static_cast<std::ptrdiff_t>(Field(v2c, Field(v2c, 4).end).end),
+            v2c.end());
 
-  Encoder m;
-  std::size_t outer = m.Open(kAsnSequence);
-  m.Integer(3);
-  std::size_t global = m.Open(kAsnSequence);
-  m.Integer(r.msgId);
-  m.Integer(r.maxSize);
-  m.Octets(std::string(1, static_cast<char>(r.flags)));
-  m.Integer(r.securityModel);
-  m.Close(global);
-  std::size_t wrapper = m.Open(kAsnOctetString);
-  std::size_t parameters = m.Open(kAsnSequence);
-  m.Octets(r.engineId);
-  m.Integer(r.boots);
-  m.Integer(r.time);
-  m.Octets(r.user);
-  std::size_t digestAt = m.Octets(r.authKey.empty() ? "" : std::string(12, '\0'));
-  m.Octets((r.flags & 0x02) ? std::string(8, '\0') : "");
-  m.Close(parameters);
-  m.Close(wrapper);
-  std::size_t scoped = m.Open(kAsnSequence);
-  m.Octets(r.engineId);
-  m.Octets(r.context);
-  m.Raw(pdu.bytes);
-  m.Close(scoped);
-  m.Close(outer);
-  if (!r.authKey.empty()) {
-    std::uint8_t digest[12];
-    EXPECT_TRUE(
-        CalculateDigest(AuthProtocol::kMd5, r.authKey, m.bytes.data(), m.bytes.size(), digest));
-    std::copy(digest, digest + 12, m.bytes.begin() + static_cast<std::ptrdiff_t>(digestAt));
+  const Bytes digest = Str(std::string(r.authKey.empty() ? 0 : 12, '\0'));
+  Bytes m = Container(
+      kAsnSequence,
+      {Int(3),
+       Container(kAsnSequence,
+                 {Int(r.msgId), Int(r.maxSize), Str(std::string(1, static_cast<char>(r.flags))),
+                  Int(r.securityModel)}),
+       Container(
+           kAsnOctetString,
+           {Container(kAsnSequence, {Str(r.engineId), Int(r.boots), Int(r.time), Str(r.user),
+                                     digest, Str((r.flags & 0x02) ? std::string(8, '\0') : "")})}),
+       Container(kAsnSequence, {Str(r.engineId), Str(r.context), pdu})});
+  if (!r.authKey.empty()) {  // the placeholder is the only run of twelve zero octets
+    auto at = std::search(m.begin(), m.end(), digest.begin(), digest.end()) + 2;
+    EXPECT_TRUE(CalculateDigest(AuthProtocol::kMd5, r.authKey, m.data(), m.size(), &*at));
   }
-  return m.bytes;
+  return m;
+}
+
+// The message with one octet more at the end of the innermost of the given containers (each a
+// four-octet header, outermost first), or behind the message when none is given.
+std::vector<std::uint8_t> WithOctetAtEnd(std::vector<std::uint8_t> bytes,
+                                         const std::vector<std::size_t>& containers) {
+  std::size_t end =
+      containers.empty() ? bytes.size() : containers.back() + 4 + bytes[containers.back() + 3];
+  bytes.insert(bytes.begin() + static_cast<std::ptrdiff_t>(end), 0);
+  for (std::size_t at : containers) ++bytes[at + 3];
+  return bytes;
 }
 
 class V3MessageTest : public SnmpAgentTest {
@@ -128,7 +124,8 @@ class V3MessageTest : public SnmpAgentTest {
     CreateLCDVacmAccessTable();
     CreateLCDVacmViewTreeFamilyTable();
     agent_.agentInfo->engineBoots = 3;
-    agent_.agentInfo->startTime = GetCurrentSeconds() - 1000;  // its engine time is 1000 s
+    engineTime_ = std::min(1000u, GetCurrentSeconds());  // the monotonic clock may be young
+    agent_.agentInfo->startTime = GetCurrentSeconds() - engineTime_;
     engineId_ = AgentEngineId(agent_);
   }
   void TearDown() override {
@@ -142,7 +139,7 @@ class V3MessageTest : public SnmpAgentTest {
     r.flags = 0x05;
     r.engineId = engineId_;
     r.boots = 3;
-    r.time = 1000;
+    r.time = static_cast<std::int32_t>(engineTime_);
     r.user = "alice";
     r.authKey = GetLocalKeyValue("alicepassword", AuthProtocol::kMd5, engineId_);
     r.name = O("1.3.6.1.2.1.1.5.0");
@@ -159,32 +156,16 @@ class V3MessageTest : public SnmpAgentTest {
     }
     reply.resize(length);
     reply_ = reply;
-    // The scoped PDU is the last SEQUENCE: find contextName then the PDU by walking the message.
-    std::int32_t remaining = static_cast<std::int32_t>(length);
-    std::uint8_t type = 0;
-    const std::uint8_t* cursor = AsnParseHeader(reply.data(), &remaining, &type);
-    for (int skip = 0; skip < 3 && cursor; ++skip) {  // version, global data, security parameters
-      std::int32_t inner = static_cast<std::int32_t>(reply.data() + length - cursor);
-      const std::uint8_t* contents = AsnParseHeader(cursor, &inner, &type);
-      if (contents == nullptr) return std::nullopt;
-      if (skip == 1) replyFlags_ = contents[inner - 4];  // global data ends: flags, 02 01 03
-      cursor = contents + inner;
-      remaining = static_cast<std::int32_t>(reply.data() + length - cursor);
-    }
-    std::int32_t scopedLength = remaining;
-    const std::uint8_t* scoped = AsnParseHeader(cursor, &scopedLength, &type);
-    if (scoped == nullptr || type != kAsnSequence) return std::nullopt;
-    for (int skip = 0; skip < 2; ++skip) {
-      std::int32_t inner = static_cast<std::int32_t>(reply.data() + length - scoped);
-      const std::uint8_t* contents = AsnParseHeader(scoped, &inner, &type);
-      scoped = contents + inner;
-    }
-    SnmpPdu pdu;
+    std::size_t global = Field(reply, Field(reply, 0).contents).end;  // behind msgVersion
+    replyFlags_ = reply[Field(reply, global).end - 4];  // msgGlobalData ends: flags, 02 01 03
+    Tlv scoped = Field(reply, Field(reply, Field(reply, global).end).end);
+    std::size_t pdu = Field(reply, Field(reply, scoped.contents).end).end;  // behind the context
+    SnmpPdu parsed;
     PduLayout layout;
-    std::int32_t rest = static_cast<std::int32_t>(reply.data() + length - scoped);
-    if (ParseSnmpPdu(reply.data(), scoped, rest, &pdu, &layout, false) != ParseResult::kParsed)
+    if (ParseSnmpPdu(reply.data(), reply.data() + pdu, static_cast<std::int32_t>(scoped.end - pdu),
+                     &parsed, &layout, false) != ParseResult::kParsed)
       return std::nullopt;
-    return pdu;
+    return parsed;
   }
 
   // The name the Report for this request carries, empty when no Report came back.
@@ -195,6 +176,7 @@ class V3MessageTest : public SnmpAgentTest {
   }
 
   std::string engineId_;
+  std::uint32_t engineTime_ = 0;
   std::vector<std::uint8_t> reply_;
   std::uint8_t replyFlags_ = 0xFF;
 };
@@ -211,7 +193,6 @@ TEST_F(V3MessageTest, DiscoveryIsAnsweredWithTheAgentsEngineId) {
   EXPECT_EQ(report->requestVarBinds[0].value, VarValue::Unsigned(kAsnCounter, 1));
   std::string text(reply_.begin(), reply_.end());
   EXPECT_NE(text.find(engineId_), std::string::npos);
-  EXPECT_EQ(V3Count(V3Counter::kUnknownEngineIds), 1u);
 }
 
 TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
@@ -225,7 +206,7 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   tooHigh.flags = 0x07;
   EXPECT_EQ(ReportedName(tooHigh), O("1.3.6.1.6.3.15.1.1.1.0"));
   V3Request stale = Authenticated();
-  stale.time = 1000 + 152;
+  stale.time += 152;
   EXPECT_EQ(ReportedName(stale), O("1.3.6.1.6.3.15.1.1.2.0"));
   V3Request otherBoots = Authenticated();
   otherBoots.boots = 4;
@@ -236,7 +217,7 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   EXPECT_EQ(replyFlags_ & 0x03, 0x01);
   std::string text(reply_.begin(), reply_.end());
   EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 3), "\x02\x01\x03");
-  stale.time = 1000 - 149;
+  stale.time -= 152 + 149;
   auto inWindow = Exchange3(Encode(stale));
   ASSERT_TRUE(inWindow);
   EXPECT_EQ(inWindow->type, kGetResponse);
@@ -272,12 +253,69 @@ TEST_F(V3MessageTest, InvalidMessagesAreDroppedAndCounted) {
   privWithoutAuth.flags = 0x06;
   EXPECT_FALSE(Exchange3(Encode(privWithoutAuth)));
   EXPECT_EQ(V3Count(V3Counter::kInvalidMsgs), 2u);
+  // Every field ends within its container, and a container holds its fields and nothing else.
+  V3Request plain = Authenticated();
+  plain.flags = 0x04, plain.authKey.clear();  // no digest: every field is read before an answer
+  const std::vector<std::uint8_t> good = Encode(plain);
+  const std::size_t global = 7;  // behind the outer header and msgVersion
+  const std::size_t wrapper = global + 4 + good[global + 3];
+  const std::size_t usm = wrapper + 4;
+  const std::size_t scoped = wrapper + 4 + good[wrapper + 3];
+  std::vector<std::vector<std::uint8_t>> malformed(2, good);
+  --malformed[0][global + 3];  // msgSecurityModel runs past msgGlobalData
+  --malformed[1][usm + 3];     // msgPrivacyParameters runs past the USM SEQUENCE
+  for (std::vector<std::size_t> around : std::vector<std::vector<std::size_t>>{
+           {0, global}, {0, wrapper}, {0, wrapper, usm}, {0, scoped}})
+    malformed.push_back(WithOctetAtEnd(good, around));
+  // Behind the scoped PDU or behind the message: refused before the digest is checked.
+  malformed.push_back(WithOctetAtEnd(Encode(Authenticated()), {0}));
+  malformed.push_back(WithOctetAtEnd(Encode(Authenticated()), {}));
+  for (std::size_t i = 0; i < malformed.size(); ++i) {
+    EXPECT_FALSE(Exchange3(malformed[i])) << i;
+    EXPECT_EQ(SnmpCount(SnmpCounter::kAsnParseErrors), i + 1);
+  }
+  EXPECT_TRUE(Exchange3(good));
   // A v3 engine still answers v2c unless told to drop it.
   Request v2c;
   v2c.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
   EXPECT_TRUE(Send(v2c));
   gv_dropV1V2Requests = 1;
   EXPECT_FALSE(Send(v2c));
+}
+
+TEST_F(V3MessageTest, EngineObjectsAreServedByTheEngineAndReadOnly) {
+  RegisterEngineObjects();
+  StoreTreeCellsRefInArray();
+  V3Request unknown = Authenticated();
+  unknown.user = "mallory";
+  ASSERT_TRUE(Exchange3(Encode(unknown)));
+  Request next;  // a walk of the engine's objects, in order
+  next.type = kGetNextRequest;
+  next.bindings = {{O("1.3.6.1.6.3"), VarValue::Empty(kAsnNull)}};
+  std::vector<std::string> names;
+  std::vector<VarValue> values;
+  for (auto reply = Send(next); reply && reply->requestVarBinds.at(0).value.type != kEndOfMibView;
+       reply = Send(next)) {
+    next.bindings[0].first = reply->requestVarBinds[0].name;
+    names.push_back(OidToPlainText(next.bindings[0].first).substr(12));
+    values.push_back(reply->requestVarBinds[0].value);
+  }
+  std::vector<std::string> expected;
+  for (auto [group, count] : {std::pair{"10.2.1.", 4}, {"11.2.1.", 3}, {"15.1.1.", 6}})
+    for (int i = 1; i <= count; ++i) expected.push_back(group + std::to_string(i) + ".0");
+  ASSERT_EQ(names, expected);
+  EXPECT_EQ(values[0], VarValue::Octets(kAsnOctetString, engineId_));
+  EXPECT_EQ(values[1], VarValue::Integer(3));
+  EXPECT_NEAR(values[2].AsInt32(), engineTime_, 1);
+  EXPECT_EQ(values[3], VarValue::Integer(19989));
+  EXPECT_EQ(values[9], VarValue::Unsigned(kAsnCounter, 1));  // usmStatsUnknownUserNames
+  Request set;
+  set.type = kSetRequest;
+  set.community = "private";
+  set.bindings = {{O("1.3.6.1.6.3.10.2.1.2.0"), VarValue::Integer(9)}};
+  auto reply = Send(set);
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->errorStatus, kNotWritable);
 }
 
 }  // namespace
