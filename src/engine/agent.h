@@ -74,7 +74,7 @@ struct AgentInfo {
   std::atomic<std::uint32_t> engineTime{0};
   std::string agentKey;  // AgentKey of its address and configured port
   std::atomic<std::uint32_t> engineBoots{0};
-  std::uint32_t startTime = 0;  // wall-clock seconds at registration: the base of its uptime
+  std::uint32_t startTime = 0;  // monotonic seconds at registration: the base of its uptime
 };
 
 struct AgentSession {
