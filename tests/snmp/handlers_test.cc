@@ -6,6 +6,7 @@
 
 #include "engine/agent.h"
 #include "snmp/pdu.h"
+#include "snmp/value_text.h"
 #include "support/memory_host.h"
 
 namespace tessel {
