@@ -12,7 +12,7 @@ Oid MemoryHost::ToOid(const std::string& oidText) {
 
 void MemoryHost::SetValue(const std::string& oidText, const std::string& valueText) {
   std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{valueText, "-1"};
+  objects_[ToOid(oidText)] = Entry{valueText, "-1", std::nullopt};
 }
 
 void MemoryHost::SetError(const std::string& oidText, const std::string& errorText) {
@@ -24,7 +24,12 @@ void MemoryHost::SetError(const std::string& oidText, const std::string& errorTe
 
 void MemoryHost::SetNullValue(const std::string& oidText) {
   std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1"};
+  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1", std::nullopt};
+}
+
+void MemoryHost::RefuseWrite(const std::string& oidText, const std::string& valueText) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  objects_[ToOid(oidText)].refused = valueText;
 }
 
 std::string MemoryHost::ValueOf(const std::string& oidText) const {
@@ -60,6 +65,7 @@ HostAnswer MemoryHost::Store(const Oid& oid, const HostValueQuery& query) {
   setCalls_.push_back(query);
   Entry& entry = objects_[oid];
   if (entry.error != "-1") return std::vector<std::optional<std::string>>{entry.value, entry.error};
+  if (entry.refused == query.valueText) return std::vector<std::optional<std::string>>{"x", "6"};
   entry.value = query.valueText;
   return std::vector<std::optional<std::string>>{query.valueText, std::string("-1")};
 }
