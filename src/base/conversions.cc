@@ -115,7 +115,7 @@ int CompareOid(std::span<const std::uint32_t> a, std::span<const std::uint32_t> 
     if (a[i] != b[i]) return a[i] > b[i] ? 1 : -1;
   }
   if (a.size() == b.size()) return 0;
-  return a.size() > b.size() ? 1 : -1;
+  return a.size() < b.size() ? -1 : 2;
 }
 
 std::string BytesToHex(std::string_view bytes) {

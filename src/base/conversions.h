@@ -34,7 +34,8 @@ int ParseDottedText(Oid* out, std::string_view text, bool plain);
 std::string OidToText(std::span<const std::uint32_t> oid);
 // The same without the leading dot: 1.3.6.1.
 std::string OidToPlainText(std::span<const std::uint32_t> oid);
-// -1, 0 or 1; a proper prefix sorts first.
+// 0 equal; -1 a sorts first (smaller, or a proper prefix of b); 1 a greater; 2 a greater because
+// b is a proper prefix of it (the MIB tree tells an instance below a registered OID by this).
 int CompareOid(std::span<const std::uint32_t> a, std::span<const std::uint32_t> b);
 
 // Two lowercase hex digits per octet.

@@ -42,6 +42,7 @@ TEST(ConversionsTest, OidTextAndOrder) {
   EXPECT_EQ(CompareOid(Oid{1, 3, 7}, Oid{1, 3, 6, 1}), 1);
   EXPECT_EQ(CompareOid(Oid{1, 3, 4294967295u}, Oid{1, 3, 1}), 1);
   EXPECT_EQ(CompareOid(Oid{1, 3}, Oid{1, 3}), 0);
+  EXPECT_EQ(CompareOid(Oid{1, 3, 6, 1}, Oid{1, 3, 6}), 2);
   EXPECT_EQ(BytesToHex(std::string("\x00\xff\x1a", 3)), "00ff1a");
 }
 
