@@ -51,19 +51,6 @@ bool IsDateAndTime(std::uint8_t dataType, const std::string& syntax) {
 
 bool IsDigit(char c) { return c >= '0' && c <= '9'; }
 
-// Unsigned decimal digits only, at most limit; nothing otherwise.
-std::optional<std::uint64_t> ParseUnsigned(std::string_view text, std::uint64_t limit) {
-  if (text.empty()) return std::nullopt;
-  std::uint64_t value = 0;
-  for (char c : text) {
-    if (!IsDigit(c)) return std::nullopt;
-    auto digit = static_cast<std::uint64_t>(c - '0');
-    if (value > (limit - digit) / 10) return std::nullopt;
-    value = value * 10 + digit;
-  }
-  return value;
-}
-
 // A 32-bit number as the host writes it: optional sign, decimal. A text that is no number reads
 // as -1 (hosts use that for "unknown"); a number that does not fit in 32 bits is refused.
 // INTEGER takes the signed range; the unsigned types also take their full unsigned range.
@@ -75,7 +62,7 @@ std::optional<std::uint32_t> ParseNumber32(std::string_view text, bool isSigned)
   }
   constexpr std::uint64_t kSignedMax = std::numeric_limits<std::int32_t>::max();
   std::uint64_t limit = negative ? kSignedMax + 1 : (isSigned ? kSignedMax : 0xFFFFFFFFull);
-  std::optional<std::uint64_t> magnitude = ParseUnsigned(text, limit);
+  std::optional<std::uint64_t> magnitude = ParseDecimal(text, limit);
   if (!magnitude) return std::nullopt;
   auto low = static_cast<std::uint32_t>(*magnitude);
   return negative ? 0u - low : low;
@@ -181,7 +168,7 @@ class DateAndTimeScanner {
     std::size_t digits = 0;
     while (digits < rest_.size() && IsDigit(rest_[digits])) ++digits;
     std::optional<std::uint64_t> value =
-        ParseUnsigned(rest_.substr(0, digits), std::numeric_limits<std::int32_t>::max());
+        ParseDecimal(rest_.substr(0, digits), std::numeric_limits<std::int32_t>::max());
     if (!value) return false;
     rest_.remove_prefix(digits);
     *out = negative ? -static_cast<std::int64_t>(*value) : static_cast<std::int64_t>(*value);
@@ -267,8 +254,7 @@ std::optional<VarValue> TextToVarValue(std::uint8_t dataType, const std::string&
     case kAsnIpAddress:
       return ParseIpAddress(text);
     case kAsnCounter64: {
-      std::optional<std::uint64_t> number =
-          ParseUnsigned(text, std::numeric_limits<std::uint64_t>::max());
+      std::optional<std::uint64_t> number = ParseDecimal(text);
       if (!number) return std::nullopt;
       return VarValue::Unsigned(kAsnCounter64, *number);
     }

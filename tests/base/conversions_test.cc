@@ -13,6 +13,7 @@ TEST(ConversionsTest, DecimalAndHexText) {
   EXPECT_EQ(TextToInt("12a"), -1);
   EXPECT_EQ(TextToInt(""), 0);
   EXPECT_EQ(TextToInt("-2147483648"), INT32_MIN);
+  EXPECT_EQ(TextToInt("4294967306"), -1);  // refused, not wrapped to 10
   EXPECT_EQ(HexTextToInt("1aF"), 0x1AF);
   EXPECT_EQ(HexTextToInt("xyz"), -1);
   EXPECT_EQ(IntToText(INT32_MIN), "-2147483648");
