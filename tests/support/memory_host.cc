@@ -10,6 +10,10 @@ Oid MemoryHost::ToOid(const std::string& oidText) {
   return oid;
 }
 
+Oid MemoryHost::KeyOf(const HostValueQuery& query) {
+  return ToOid(query.objectOid + "." + query.subId + query.instance.value_or(""));
+}
+
 void MemoryHost::SetValue(const std::string& oidText, const std::string& valueText) {
   std::lock_guard<std::mutex> lock(mutex_);
   objects_[ToOid(oidText)] = Entry{valueText, "-1", std::nullopt};
@@ -70,21 +74,15 @@ HostAnswer MemoryHost::Store(const Oid& oid, const HostValueQuery& query) {
   return std::vector<std::optional<std::string>>{query.valueText, std::string("-1")};
 }
 
-HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) {
-  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
-}
+HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) { return Answer(KeyOf(query)); }
 
 HostAnswer MemoryHost::ScalarGetNextOidVal(const HostValueQuery& query) {
-  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
+  return Answer(KeyOf(query));
 }
 
-HostAnswer MemoryHost::SetOidVal(const HostValueQuery& query) {
-  return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
-}
+HostAnswer MemoryHost::SetOidVal(const HostValueQuery& query) { return Store(KeyOf(query), query); }
 
-HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) {
-  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
-}
+HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) { return Answer(KeyOf(query)); }
 
 HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   Oid entryOid = ToOid(query.objectOid);
@@ -105,7 +103,7 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
 }
 
 HostAnswer MemoryHost::TableSetOidVal(const HostValueQuery& query) {
-  return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
+  return Store(KeyOf(query), query);
 }
 
 AgentSession LocalAgent(std::int32_t agentId) {

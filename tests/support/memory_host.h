@@ -43,6 +43,8 @@ class MemoryHost : public HostBridge {
     std::optional<std::string> refused;
   };
   static Oid ToOid(const std::string& oidText);
+  // The object a scalar or exact table call names: object OID, sub-identifier, instance.
+  static Oid KeyOf(const HostValueQuery& query);
   HostAnswer Answer(const Oid& oid);
   HostAnswer Store(const Oid& oid, const HostValueQuery& query);
 
