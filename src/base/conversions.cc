@@ -6,20 +6,27 @@
 
 namespace tessel {
 
+std::optional<std::uint64_t> ParseDecimal(std::string_view digits, std::uint64_t limit) {
+  if (digits.empty()) return std::nullopt;
+  std::uint64_t value = 0;
+  for (char c : digits) {
+    if (c < '0' || c > '9') return std::nullopt;
+    auto digit = static_cast<std::uint64_t>(c - '0');
+    if (value > (limit - digit) / 10) return std::nullopt;
+    value = value * 10 + digit;
+  }
+  return value;
+}
+
 std::int32_t TextToInt(std::string_view text) {
   if (text.empty()) return 0;
-  bool negative = false;
-  if (text[0] == '-' || text[0] == '+') {
-    negative = text[0] == '-';
-    text.remove_prefix(1);
-  }
-  std::uint32_t value = 0;
-  for (char c : text) {
-    if (c < '0' || c > '9') return -1;
-    value = value * 10u + static_cast<std::uint32_t>(c - '0');
-  }
-  if (negative) value = 0u - value;
-  return static_cast<std::int32_t>(value);
+  bool negative = text[0] == '-';
+  if (text[0] == '-' || text[0] == '+') text.remove_prefix(1);
+  constexpr std::uint64_t kMax = 0x7FFFFFFF;
+  std::optional<std::uint64_t> magnitude = ParseDecimal(text, negative ? kMax + 1 : kMax);
+  if (!magnitude) return -1;
+  auto value = static_cast<std::uint32_t>(*magnitude);
+  return static_cast<std::int32_t>(negative ? 0u - value : value);
 }
 
 int HexDigitValue(char c) {
@@ -47,23 +54,6 @@ std::string IntToText(std::int32_t value) {
   return "-" + std::to_string(magnitude);
 }
 
-namespace {
-
-// One dotted component: decimal digits only, at most 2^32 - 1.
-bool ParseComponent(std::string_view text, std::uint32_t* out) {
-  if (text.empty() || text.size() > 10) return false;
-  std::uint64_t value = 0;
-  for (char c : text) {
-    if (c < '0' || c > '9') return false;
-    value = value * 10 + static_cast<std::uint64_t>(c - '0');
-  }
-  if (value > 0xFFFFFFFFull) return false;
-  *out = static_cast<std::uint32_t>(value);
-  return true;
-}
-
-}  // namespace
-
 int ParseDottedText(Oid* out, std::string_view text, bool plain) {
   std::size_t dots = static_cast<std::size_t>(std::count(text.begin(), text.end(), '.'));
   if (dots == 0) {
@@ -76,12 +66,12 @@ int ParseDottedText(Oid* out, std::string_view text, bool plain) {
   out->clear();
   while (!text.empty() || out->size() < expected) {
     std::size_t end = text.find('.');
-    std::uint32_t value;
-    if (!ParseComponent(text.substr(0, end), &value)) {
+    std::optional<std::uint64_t> value = ParseDecimal(text.substr(0, end), 0xFFFFFFFF);
+    if (!value) {
       out->clear();
       return -1;
     }
-    out->push_back(value);
+    out->push_back(static_cast<std::uint32_t>(*value));
     if (end == std::string_view::npos) break;
     text.remove_prefix(end + 1);
   }
@@ -115,7 +105,7 @@ int CompareOid(std::span<const std::uint32_t> a, std::span<const std::uint32_t> 
     if (a[i] != b[i]) return a[i] > b[i] ? 1 : -1;
   }
   if (a.size() == b.size()) return 0;
-  return a.size() > b.size() ? 1 : -1;
+  return a.size() < b.size() ? -1 : 2;
 }
 
 std::string BytesToHex(std::string_view bytes) {

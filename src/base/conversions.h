@@ -5,6 +5,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -16,8 +17,12 @@ namespace tessel {
 using Oid = std::vector<std::uint32_t>;
 inline constexpr std::size_t kMaxOidLength = 128;
 
-// Decimal text with an optional leading sign; 32-bit wrapping arithmetic. -1 when the text is
-// not a number, 0 for the empty text.
+// Decimal digits alone (no sign, no blank); nothing when the text is empty, holds anything else,
+// or names a number above limit. The one decimal reader: every other is built on it.
+std::optional<std::uint64_t> ParseDecimal(std::string_view digits,
+                                          std::uint64_t limit = UINT64_MAX);
+// Decimal text with an optional leading sign. -1 when the text is not a number or lies outside
+// the 32-bit signed range, 0 for the empty text.
 std::int32_t TextToInt(std::string_view text);
 // Hexadecimal digits; -1 when the text is not hexadecimal.
 std::int32_t HexTextToInt(std::string_view text);
@@ -34,7 +39,8 @@ int ParseDottedText(Oid* out, std::string_view text, bool plain);
 std::string OidToText(std::span<const std::uint32_t> oid);
 // The same without the leading dot: 1.3.6.1.
 std::string OidToPlainText(std::span<const std::uint32_t> oid);
-// -1, 0 or 1; a proper prefix sorts first.
+// 0 equal; -1 a sorts first (smaller, or a proper prefix of b); 1 a greater; 2 a greater because
+// b is a proper prefix of it (the MIB tree tells an instance below a registered OID by this).
 int CompareOid(std::span<const std::uint32_t> a, std::span<const std::uint32_t> b);
 
 // Two lowercase hex digits per octet.

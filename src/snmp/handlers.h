@@ -22,14 +22,4 @@ std::optional<VarValue> TableProcessReadReq(std::uint8_t pduType, Oid* oid, std:
 std::optional<VarValue> TableProcessWriteReq(const Oid& oid, const VarValue& value,
                                              std::uint8_t* errorCode, const TesselStruct& target);
 
-// A host's value text as an SNMP value of the column's data type (and syntax, which may be
-// empty); nothing when the text does not convert.
-std::optional<VarValue> TextToVarValue(std::uint8_t dataType, const std::string& syntax,
-                                       const std::string& text);
-// A value as the text the host is given for a Set of a column of that data type; nothing when
-// the type is not supported or the value has not the form of the type.
-std::optional<std::string> VarValueToText(std::uint8_t dataType, const VarValue& value);
-// Checks an 8- or 11-octet DateAndTime value and renders it; nothing when it is invalid.
-std::optional<std::string> DateAndTimeToText(const std::string& octets);
-
 }  // namespace tessel

@@ -343,7 +343,7 @@ bool NamesObjectOf(const TreeCell& cell, std::span<const std::uint32_t> oid) {
   return cell.ColumnPosition(oid[at]) >= 0;
 }
 
-// A Get met a candidate that is not below the requested OID (order is CompareKey(oid, candidate)).
+// A Get met a candidate that is not below the requested OID (order is CompareOid(oid, candidate)).
 bool AnswersGet(const TreeCell& cell, int order, std::uint8_t* errorCode) {
   if (order == 0 && !cell.isTable) {
     LOG_TRACE("\nThe GET element is %s\n", cell.label.c_str());
@@ -412,15 +412,6 @@ int RegisteredCellCount() {
   return static_cast<int>(tree.registered.size());
 }
 
-int CompareKey(std::span<const std::uint32_t> a, std::span<const std::uint32_t> b) {
-  std::size_t common = std::min(a.size(), b.size());
-  for (std::size_t i = 0; i < common; ++i) {
-    if (a[i] != b[i]) return a[i] < b[i] ? -1 : 1;
-  }
-  if (a.size() == b.size()) return 0;
-  return a.size() < b.size() ? -1 : 2;
-}
-
 // Candidates are the cell's column OIDs in the form a request names them: base.subId.0 for a Get
 // of a scalar, base.subId for a GetNext of one, base.1.subId (the entry's column) for a table.
 bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell,
@@ -432,7 +423,7 @@ bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell,
   for (std::uint32_t subId : cell.subIds) {
     candidate.resize(base.size());
     AppendCandidate(cell, subId, next, &candidate);
-    int order = CompareKey(oid, candidate);
+    int order = CompareOid(oid, candidate);
     if (order == 1) continue;  // the requested OID lies beyond this column
     if (!next) return AnswersGet(cell, order, errorCode);
     LOG_TRACE("The GET-NEXT element is : %s\n", OidToText(candidate).c_str());
@@ -468,7 +459,7 @@ TreeCell* GetTreeCell(std::uint8_t pduType, std::span<const std::uint32_t> oid,
       LOG_ERROR("!!! The cells are not yet registered. Query after some time\n");
       return nullptr;
     }
-    int order = CompareKey(oid, cell->oid);
+    int order = CompareOid(oid, cell->oid);
     if (order == 0) {
       if (IsNextLookup(pduType)) return cell;
       *errorCode = kNoSuchInstance;

@@ -108,8 +108,6 @@ TreeCell* GetTreeCell(std::uint8_t pduType, std::span<const std::uint32_t> oid,
                       std::uint8_t* errorCode);
 bool CompareSubIdLists(std::uint8_t pduType, const TreeCell& cell,
                        std::span<const std::uint32_t> oid, std::uint8_t* errorCode);
-// 0 equal; -1 a smaller or a proper prefix of b; 1 a greater; 2 b a proper prefix of a.
-int CompareKey(std::span<const std::uint32_t> a, std::span<const std::uint32_t> b);
 TreeCell* GetTreeCellByName(const std::string& label);
 // The OID text of the cell after the one that answers a GetNext of oidText (".1" appended for a
 // table), or nothing. Takes the tree itself: not for a thread that holds a MibTreeReadLock (nor

@@ -32,7 +32,9 @@ inline constexpr std::int32_t kBadValue = 3;
 inline constexpr std::int32_t kReadOnly = 4;
 inline constexpr std::int32_t kGenErr = 5;
 inline constexpr std::int32_t kNoAccess = 6;
+inline constexpr std::int32_t kWrongType = 7;
 inline constexpr std::int32_t kCommitFailed = 14;
+inline constexpr std::int32_t kUndoFailed = 15;
 inline constexpr std::int32_t kAuthorizationError = 16;
 inline constexpr std::int32_t kNotWritable = 17;
 // Not an SNMP status: memory exhausted; the message is abandoned.

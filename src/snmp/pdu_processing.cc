@@ -6,6 +6,7 @@
 
 #include "engine/log.h"
 #include "snmp/ber.h"
+#include "snmp/value_text.h"
 
 namespace tessel {
 namespace {
@@ -173,10 +174,6 @@ void ApplyRowStatusIntent(const TreeCell& cell, std::uint32_t column, const VarV
 
 Answer WriteExact(const TreeCell& cell, int position, const VarBind& binding,
                   const Context& context) {
-  if (cell.access[static_cast<std::size_t>(position)] == kAccessReadOnly) {
-    LOG_TRACE("Trying to set to RONLY variable !!!\n");
-    return Failed(kNotWritable);
-  }
   std::uint8_t error = 0;
   std::optional<VarValue> value =
       cell.writeHandler(binding.name, binding.value, &error, Target(cell, context));
@@ -206,19 +203,22 @@ Answer ReadExact(const TreeCell& cell, const VarBind& binding, const Context& co
   return Failed(error == 0 ? kGenErr : error);
 }
 
-// Get and Set of exactly the named instance.
+// Position of the column that exactly the named instance lies in, -1 when none of the cell's.
+int ExactColumn(const TreeCell* cell, const Oid& name) {
+  if (cell == nullptr) return -1;
+  std::size_t at = cell->Base().size() + (cell->isTable ? 1 : 0);
+  return at < name.size() ? cell->ColumnPosition(name[at]) : -1;
+}
+
+// Get of exactly the named instance.
 Answer AnswerExact(const Holder& holder, const VarBind& binding, const Context& context) {
   if (std::int32_t allowed = CheckAccess(context, context.pduType, binding.name); allowed != 1) {
     return Failed(allowed);
   }
   const TreeCell* cell = holder.cell;
-  std::size_t at = cell ? cell->Base().size() + (cell->isTable ? 1 : 0) : 0;
-  int position = cell && at < binding.name.size() ? cell->ColumnPosition(binding.name[at]) : -1;
-  bool usable = position >= 0 && (context.pduType == kSetRequest ? cell->writeHandler != nullptr
-                                                                 : cell->readHandler != nullptr);
-  if (!usable) {
+  int position = ExactColumn(cell, binding.name);
+  if (position < 0 || cell->readHandler == nullptr) {
     LOG_TRACE("The tree don't have the cell for the requested oid\n");
-    if (context.pduType == kSetRequest) return Failed(kNotWritable);
     if (IsV1(context)) return Failed(kNoSuchName);
     std::uint8_t exception = IsExceptionType(holder.cellError) ? holder.cellError : kNoSuchObject;
     return Answered(binding.name, VarValue::Empty(exception));
@@ -227,9 +227,85 @@ Answer AnswerExact(const Holder& holder, const VarBind& binding, const Context& 
     LOG_TRACE("Access is denied for this oid !!!\n");
     return Failed(kNoAccess);
   }
-  if (context.pduType == kSetRequest) return WriteExact(*cell, position, binding, context);
   return ReadExact(*cell, binding, context);
 }
+
+// What a Set binding is checked against before anything is written: the manager's view, a
+// writable column, and a value of the column's type. kNoError with *position set to the column,
+// or the binding's error status.
+std::int32_t CheckWrite(const TreeCell* cell, const VarBind& binding, const Context& context,
+                        int* position) {
+  if (std::int32_t allowed = CheckAccess(context, kSetRequest, binding.name); allowed != 1) {
+    return allowed;
+  }
+  *position = ExactColumn(cell, binding.name);
+  if (*position < 0 || cell->writeHandler == nullptr) {
+    LOG_TRACE("The tree don't have the cell for the requested oid\n");
+    return kNotWritable;
+  }
+  auto column = static_cast<std::size_t>(*position);
+  if (!Readable(cell->access[column])) {
+    LOG_TRACE("Access is denied for this oid !!!\n");
+    return kNoAccess;
+  }
+  if (cell->access[column] == kAccessReadOnly) {
+    LOG_TRACE("Trying to set to RONLY variable !!!\n");
+    return kNotWritable;
+  }
+  std::uint8_t error = 0;
+  std::string syntax = column < cell->syntaxes.size() ? cell->syntaxes[column] : std::string();
+  std::uint8_t dataType = column < cell->dataTypes.size() ? cell->dataTypes[column] : 0;
+  if (!SetValueText(dataType, syntax, binding.value, &error)) return error;
+  return kNoError;
+}
+
+// A Set binding that passed its checks, and what its object held before the Set.
+struct PlannedWrite {
+  std::size_t index;
+  const TreeCell* cell;
+  int position;
+  std::optional<VarValue> before;
+};
+
+std::optional<VarValue> ReadBefore(const PlannedWrite& write, const Oid& name,
+                                   const Context& context) {
+  if (write.cell->readHandler == nullptr) return std::nullopt;
+  Oid oid = name;
+  std::uint8_t error = 0;
+  return write.cell->readHandler(kGetRequest, &oid, &error, Target(*write.cell, context));
+}
+
+// Writes back what the objects held before, latest first; false when one could not be.
+bool Restore(std::span<const PlannedWrite> made, const VarBindList& bindings,
+             const Context& context) {
+  bool restored = true;
+  for (auto write = made.rbegin(); write != made.rend(); ++write) {
+    std::uint8_t error = 0;
+    if (!write->before || !write->cell->writeHandler(bindings[write->index].name, *write->before,
+                                                     &error, Target(*write->cell, context))) {
+      LOG_ERROR("Could not write back the value of %s\n",
+                OidToText(bindings[write->index].name).c_str());
+      restored = false;
+    }
+  }
+  return restored;
+}
+
+// The failing binding with the lowest index, which the reply reports.
+struct FirstFailure {
+  std::size_t index = SIZE_MAX;
+  std::int32_t status = kNoError;
+
+  void Note(std::size_t at, std::int32_t error) {
+    if (at < index) {
+      index = at;
+      status = error;
+    }
+  }
+  std::int32_t ErrorIndex() const {
+    return status == kNoError ? 0 : static_cast<std::int32_t>(index + 1);
+  }
+};
 
 // Groups the bindings by the cell that answers each, in order of first appearance.
 std::vector<Holder> CreateHolders(const VarBindList& bindings, const Context& context) {
@@ -248,33 +324,66 @@ std::vector<Holder> CreateHolders(const VarBindList& bindings, const Context& co
   return holders;
 }
 
-// Answers every binding (answers aligned with bindings). Returns the error status of the binding
-// with the lowest index that failed, and that index (1-based) in *errorIndex; bindings after a
-// failed one are not processed.
+// Answers every binding of a Get or GetNext (answers aligned with bindings). Returns the error
+// status of the binding with the lowest index that failed, and that index (1-based) in
+// *errorIndex; bindings after a failed one are not processed.
 std::int32_t ProcessVarBinds(const VarBindList& bindings, const Context& context,
                              VarBindList* answers, std::int32_t* errorIndex) {
   answers->assign(bindings.size(), VarBind{});
-  std::size_t lowestFailure = SIZE_MAX;
-  std::int32_t status = kNoError;
+  FirstFailure failure;
   for (const Holder& holder : CreateHolders(bindings, context)) {
     for (std::size_t i : holder.members) {
-      if (i > lowestFailure) continue;
+      if (i > failure.index) continue;
       Answer answer = context.pduType == kGetNextRequest
                           ? WalkNext(holder.cell, bindings[i].name, context)
                           : AnswerExact(holder, bindings[i], context);
       if (answer.error != kNoError) {
-        if (i < lowestFailure) {
-          lowestFailure = i;
-          status = answer.error;
-        }
+        failure.Note(i, answer.error);
         continue;
       }
       answer.binding.index = static_cast<std::uint32_t>(i + 1);
       (*answers)[i] = std::move(answer.binding);
     }
   }
-  *errorIndex = status == kNoError ? 0 : static_cast<std::int32_t>(lowestFailure + 1);
-  return status;
+  *errorIndex = failure.ErrorIndex();
+  return failure.status;
+}
+
+// A Set changes every object it names or none: every binding is checked before the first write,
+// and when the host still refuses a write, the objects already written get their earlier values
+// back. When one of those cannot be written back the Set ends with undoFailed and index 0.
+std::int32_t ProcessSetVarBinds(const VarBindList& bindings, const Context& context,
+                                VarBindList* answers, std::int32_t* errorIndex) {
+  answers->assign(bindings.size(), VarBind{});
+  FirstFailure failure;
+  std::vector<PlannedWrite> writes;
+  for (const Holder& holder : CreateHolders(bindings, context)) {
+    for (std::size_t i : holder.members) {
+      int position = -1;
+      std::int32_t error = CheckWrite(holder.cell, bindings[i], context, &position);
+      if (error != kNoError) {
+        failure.Note(i, error);
+      } else {
+        writes.push_back(PlannedWrite{i, holder.cell, position, {}});
+      }
+    }
+  }
+  *errorIndex = failure.ErrorIndex();
+  if (failure.status != kNoError) return failure.status;
+  for (PlannedWrite& write : writes)
+    write.before = ReadBefore(write, bindings[write.index].name, context);
+  for (std::size_t made = 0; made < writes.size(); ++made) {
+    const PlannedWrite& write = writes[made];
+    Answer answer = WriteExact(*write.cell, write.position, bindings[write.index], context);
+    if (answer.error != kNoError) {
+      bool restored = Restore(std::span(writes).first(made), bindings, context);
+      *errorIndex = restored ? static_cast<std::int32_t>(write.index + 1) : 0;
+      return restored ? answer.error : kUndoFailed;
+    }
+    answer.binding.index = static_cast<std::uint32_t>(write.index + 1);
+    (*answers)[write.index] = std::move(answer.binding);
+  }
+  return kNoError;
 }
 
 // The octets the bindings take in a reply.
@@ -331,7 +440,8 @@ std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent, const SecurityA
   std::string viewCache;
   Context context{pdu->type, pdu->version, agent, access, &viewCache};
   VarBindList answers;
-  pdu->errorStatus = ProcessVarBinds(pdu->requestVarBinds, context, &answers, &pdu->errorIndex);
+  auto process = pdu->type == kSetRequest ? ProcessSetVarBinds : ProcessVarBinds;
+  pdu->errorStatus = process(pdu->requestVarBinds, context, &answers, &pdu->errorIndex);
   if (pdu->errorStatus == kNoError) pdu->responseVarBinds = std::move(answers);
   return pdu->errorStatus;
 }

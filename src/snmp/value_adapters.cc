@@ -73,14 +73,11 @@ std::optional<std::string> Ask(HostMethod method, const HostValueQuery& query,
 
 std::uint8_t GetSnmpErrorStatus(const std::string& errorText) {
   if (errorText == "-1") return 0;
-  if (errorText.empty() || errorText.size() > 2) return kGenErr;
-  std::size_t number = 0;
-  for (char c : errorText) {
-    if (c < '0' || c > '9') return kGenErr;
-    number = number * 10 + static_cast<std::size_t>(c - '0');
-  }
-  return number < std::size(kHostErrorCodes) ? kHostErrorCodes[number]
-                                             : static_cast<std::uint8_t>(kGenErr);
+  // A code is written plainly, without leading zeros to pad it.
+  std::optional<std::uint64_t> number =
+      errorText.size() <= 2 ? ParseDecimal(errorText, std::size(kHostErrorCodes) - 1)
+                            : std::nullopt;
+  return number ? kHostErrorCodes[*number] : static_cast<std::uint8_t>(kGenErr);
 }
 
 std::optional<std::string> AdapterGetOidVal(const HostValueQuery& query, std::uint8_t* errorCode) {

@@ -13,6 +13,7 @@ TEST(ConversionsTest, DecimalAndHexText) {
   EXPECT_EQ(TextToInt("12a"), -1);
   EXPECT_EQ(TextToInt(""), 0);
   EXPECT_EQ(TextToInt("-2147483648"), INT32_MIN);
+  EXPECT_EQ(TextToInt("4294967306"), -1);  // refused, not wrapped to 10
   EXPECT_EQ(HexTextToInt("1aF"), 0x1AF);
   EXPECT_EQ(HexTextToInt("xyz"), -1);
   EXPECT_EQ(IntToText(INT32_MIN), "-2147483648");
@@ -42,6 +43,7 @@ TEST(ConversionsTest, OidTextAndOrder) {
   EXPECT_EQ(CompareOid(Oid{1, 3, 7}, Oid{1, 3, 6, 1}), 1);
   EXPECT_EQ(CompareOid(Oid{1, 3, 4294967295u}, Oid{1, 3, 1}), 1);
   EXPECT_EQ(CompareOid(Oid{1, 3}, Oid{1, 3}), 0);
+  EXPECT_EQ(CompareOid(Oid{1, 3, 6, 1}, Oid{1, 3, 6}), 2);
   EXPECT_EQ(BytesToHex(std::string("\x00\xff\x1a", 3)), "00ff1a");
 }
 

@@ -62,6 +62,16 @@ def test_set_changes_one_device_only(network):
     assert "noSuchName" in readonly.stderr + readonly.stdout
 
 
+def test_refused_set_changes_nothing(network):
+    agent = network.agent(2)
+    for version, reason in (("2c", "wrongType"), ("1", "badValue")):
+        refused = snmp("snmpset", "-On", f"-v{version}", "-c", "private", agent, "1.3.6.1.2.1.1.4.0", "s", "x",
+                       "1.3.6.1.2.1.1.6.0", "i", "5", check=False)
+        assert reason in refused.stderr and "Failed object: .1.3.6.1.2.1.1.6.0" in refused.stderr
+    assert lines("snmpget", "-v2c", "-c", "public", agent, "1.3.6.1.2.1.1.4.0") == [
+        '.1.3.6.1.2.1.1.4.0 = STRING: "noc@example.net"']
+
+
 def test_pysnmp_walks_the_same_objects(network):
     script = f"""
 from pysnmp.hlapi import *

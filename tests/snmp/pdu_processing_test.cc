@@ -28,6 +28,15 @@ class PduProcessingTest : public SnmpAgentTest {
     return names;
   }
 
+  Request SetOf(std::int32_t version, std::vector<std::pair<Oid, VarValue>> bindings) {
+    Request request;
+    request.version = version;
+    request.type = kSetRequest;
+    request.community = "private";
+    request.bindings = std::move(bindings);
+    return request;
+  }
+
   SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions,
                std::vector<std::string> oids) {
     Request request;
@@ -124,26 +133,52 @@ TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
   EXPECT_EQ(written->errorStatus, 0);
   EXPECT_EQ(written->requestVarBinds[0].value, VarValue::Integer(9));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.4.1.5.2.0"), "9");
-  host_.SetError("1.3.6.1.4.1.5.2.0", "4");
-  EXPECT_EQ(Send(set)->errorStatus, kBadValue);
   set.bindings[0].first = O("1.3.6.1.4.1.5.3.0");
   EXPECT_EQ(Send(set)->errorStatus, kNotWritable);
 }
 
-TEST_F(PduProcessingTest, SetWritesInCellOrderAndStopsAfterAFailure) {
-  RegisterCell("writable", "1.3.6.1.4.1.6.1", false, {{"1", "4", "43706"}, {"2", "4", "43706"}});
-  StoreTreeCellsRefInArray();
-  host_.SetError("1.3.6.1.4.1.6.2.0", "5");  // the host refuses this one
-  Request set;
-  set.type = kSetRequest;
-  set.community = "private";
-  set.bindings = {{O("1.3.6.1.4.1.6.2.0"), VarValue::Octets(kAsnOctetString, "b")},
-                  {O("1.3.6.1.4.1.6.1.0"), VarValue::Octets(kAsnOctetString, "a")}};
+// A Set either changes every object it names or none of them.
+TEST_F(PduProcessingTest, SetChangesNothingWhenABindingIsRefused) {
+  const Oid contact = O("1.3.6.1.2.1.1.4.0"), location = O("1.3.6.1.2.1.1.6.0");
+  const Oid descr = O("1.3.6.1.2.1.1.1.0");
+  const VarValue text = VarValue::Octets(kAsnOctetString, "x");
+  struct Case {
+    std::int32_t version;
+    std::pair<Oid, VarValue> second;
+    std::int32_t status;
+  };
+  for (const Case& c : {Case{kSnmpV2c, {location, VarValue::Integer(5)}, kWrongType},
+                        Case{kSnmpV2c, {descr, text}, kNotWritable},
+                        Case{kSnmpV1, {location, VarValue::Integer(5)}, kBadValue},
+                        Case{kSnmpV1, {descr, text}, kNoSuchName}}) {
+    auto reply = Send(SetOf(c.version, {{contact, text}, c.second}));
+    ASSERT_TRUE(reply);
+    EXPECT_EQ(reply->errorStatus, c.status);
+    EXPECT_EQ(reply->errorIndex, 2);
+  }
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "ops");
+  EXPECT_TRUE(host_.SetCalls().empty());  // refused before anything was written
+}
+
+TEST_F(PduProcessingTest, SetRestoresEarlierWritesWhenTheHostRefusesALaterOne) {
+  host_.SetError("1.3.6.1.2.1.1.6.0", "4");
+  Request set = SetOf(kSnmpV2c, {{O("1.3.6.1.2.1.1.4.0"), VarValue::Octets(kAsnOctetString, "x")},
+                                 {O("1.3.6.1.2.1.1.5.0"), VarValue::Octets(kAsnOctetString, "y")},
+                                 {O("1.3.6.1.2.1.1.6.0"), VarValue::Octets(kAsnOctetString, "z")}});
   auto reply = Send(set);
   ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->errorStatus, kReadOnly);
-  EXPECT_EQ(reply->errorIndex, 1);
-  EXPECT_EQ(host_.ValueOf("1.3.6.1.4.1.6.1.0"), "");  // never written: it follows the failure
+  EXPECT_EQ(reply->errorStatus, kBadValue);
+  EXPECT_EQ(reply->errorIndex, 3);
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "ops");
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "r1");
+  // When the earlier value cannot be written back either, the manager is told so.
+  host_.RefuseWrite("1.3.6.1.2.1.1.4.0", "ops");
+  reply = Send(set);
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->errorStatus, kUndoFailed);
+  EXPECT_EQ(reply->errorIndex, 0);
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "x");
+  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "r1");
 }
 
 TEST_F(PduProcessingTest, GetBulkRepeatsTheRepeatersAfterTheNonRepeaters) {

@@ -10,9 +10,13 @@ Oid MemoryHost::ToOid(const std::string& oidText) {
   return oid;
 }
 
+Oid MemoryHost::KeyOf(const HostValueQuery& query) {
+  return ToOid(query.objectOid + "." + query.subId + query.instance.value_or(""));
+}
+
 void MemoryHost::SetValue(const std::string& oidText, const std::string& valueText) {
   std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{valueText, "-1"};
+  objects_[ToOid(oidText)] = Entry{valueText, "-1", std::nullopt};
 }
 
 void MemoryHost::SetError(const std::string& oidText, const std::string& errorText) {
@@ -24,7 +28,12 @@ void MemoryHost::SetError(const std::string& oidText, const std::string& errorTe
 
 void MemoryHost::SetNullValue(const std::string& oidText) {
   std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1"};
+  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1", std::nullopt};
+}
+
+void MemoryHost::RefuseWrite(const std::string& oidText, const std::string& valueText) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  objects_[ToOid(oidText)].refused = valueText;
 }
 
 std::string MemoryHost::ValueOf(const std::string& oidText) const {
@@ -60,25 +69,20 @@ HostAnswer MemoryHost::Store(const Oid& oid, const HostValueQuery& query) {
   setCalls_.push_back(query);
   Entry& entry = objects_[oid];
   if (entry.error != "-1") return std::vector<std::optional<std::string>>{entry.value, entry.error};
+  if (entry.refused == query.valueText) return std::vector<std::optional<std::string>>{"x", "6"};
   entry.value = query.valueText;
   return std::vector<std::optional<std::string>>{query.valueText, std::string("-1")};
 }
 
-HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) {
-  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
-}
+HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) { return Answer(KeyOf(query)); }
 
 HostAnswer MemoryHost::ScalarGetNextOidVal(const HostValueQuery& query) {
-  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
+  return Answer(KeyOf(query));
 }
 
-HostAnswer MemoryHost::SetOidVal(const HostValueQuery& query) {
-  return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
-}
+HostAnswer MemoryHost::SetOidVal(const HostValueQuery& query) { return Store(KeyOf(query), query); }
 
-HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) {
-  return Answer(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")));
-}
+HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) { return Answer(KeyOf(query)); }
 
 HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   Oid entryOid = ToOid(query.objectOid);
@@ -99,7 +103,7 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
 }
 
 HostAnswer MemoryHost::TableSetOidVal(const HostValueQuery& query) {
-  return Store(ToOid(query.objectOid + "." + query.subId + query.instance.value_or("")), query);
+  return Store(KeyOf(query), query);
 }
 
 AgentSession LocalAgent(std::int32_t agentId) {

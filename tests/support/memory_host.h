@@ -22,6 +22,8 @@ class MemoryHost : public HostBridge {
   void SetError(const std::string& oidText, const std::string& errorText);
   // The object answers a null value.
   void SetNullValue(const std::string& oidText);
+  // A write of exactly valueText to the object is refused with genErr; other writes succeed.
+  void RefuseWrite(const std::string& oidText, const std::string& valueText);
   std::string ValueOf(const std::string& oidText) const;
   std::vector<std::string> StatusLines() const;
   std::vector<HostValueQuery> SetCalls() const;
@@ -38,8 +40,11 @@ class MemoryHost : public HostBridge {
   struct Entry {
     std::optional<std::string> value;
     std::string error = "-1";
+    std::optional<std::string> refused;
   };
   static Oid ToOid(const std::string& oidText);
+  // The object a scalar or exact table call names: object OID, sub-identifier, instance.
+  static Oid KeyOf(const HostValueQuery& query);
   HostAnswer Answer(const Oid& oid);
   HostAnswer Store(const Oid& oid, const HostValueQuery& query);
 
