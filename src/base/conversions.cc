@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "engine/log.h"
+#include "base/log.h"
 
 namespace tessel {
 

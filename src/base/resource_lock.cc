@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <unordered_set>
 
-#include "engine/log.h"
+#include "base/log.h"
 
 namespace tessel {
 namespace {

@@ -4,9 +4,6 @@
 // datagram); the AgentInfo is shared and outlives every copy that refers to it.
 #pragma once
 
-#include <netinet/in.h>
-#include <sys/socket.h>
-
 #include <atomic>
 #include <cstdint>
 #include <memory>
@@ -14,32 +11,9 @@
 #include <string>
 #include <vector>
 
+#include "transport/transport_domain.h"
+
 namespace tessel {
-
-// A peer's socket address, IPv4 or IPv6 (family in any.sa_family). Smaller than a
-// sockaddr_storage by a hundred bytes, which every stored session would carry.
-union PeerSocketAddress {
-  sockaddr any;
-  sockaddr_in v4;
-  sockaddr_in6 v6;
-};
-
-// The socket of an agent that has none.
-inline constexpr std::int64_t kNoSocket = -1;
-
-struct TransportDomainInfo {
-  // Agents keep their configured port minus one here (the host's Set calls are given it as kept).
-  std::uint16_t configuredPortMinusOne = 0;
-  std::uint16_t peerPort = 0;
-  std::int64_t socket = kNoSocket;
-  std::int32_t isIPv6 = 0;
-  std::string localAddress;
-  std::string peerAddress;
-  std::int32_t ipv6SocketCreated = 0;
-  std::int32_t ipv6Bound = 0;
-  std::int32_t lastBindError = 0;
-  PeerSocketAddress peerSockAddr{};
-};
 
 class CommunityList {
  public:

@@ -19,7 +19,7 @@
 #include "engine/log.h"
 #include "snmp/message.h"
 #include "snmp/statistics.h"
-#include "transport/agent_sockets.h"
+#include "snmp/agent_sockets.h"
 #include "transport/socket_batch.h"
 #include "transport/udp.h"
 #include "transport/udp_batch.h"

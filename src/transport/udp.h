@@ -10,7 +10,7 @@
 #include <cstdint>
 #include <string>
 
-#include "engine/agent.h"
+#include "transport/transport_domain.h"
 
 namespace tessel {
 

@@ -11,7 +11,7 @@
 
 #include "engine/engine_state.h"
 #include "support/memory_host.h"
-#include "transport/agent_sockets.h"
+#include "snmp/agent_sockets.h"
 
 namespace tessel {
 namespace {

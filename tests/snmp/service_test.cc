@@ -14,7 +14,7 @@
 #include "engine/agent_registry.h"
 #include "snmp/message.h"
 #include "support/snmp_agent_fixture.h"
-#include "transport/agent_sockets.h"
+#include "snmp/agent_sockets.h"
 #include "transport/socket_batch.h"
 
 namespace tessel {

@@ -1,4 +1,4 @@
-#include "transport/agent_sockets.h"
+#include "snmp/agent_sockets.h"
 
 #include <sched.h>
 #include <sys/epoll.h>
