@@ -15,13 +15,9 @@ class NetworkSimulatorTest {
   @CsvSource({"0, ''", "2, 'b c'", "5, 'a b c'"})
   void statusLinesAreWrittenAndTheMostRecentKept(int kept, String expected) {
     ByteArrayOutputStream stream = new ByteArrayOutputStream();
-    NetworkSimulator simulator =
-        new NetworkSimulator(new PrintStream(stream, false, StandardCharsets.UTF_8), kept);
-    for (String line : List.of("a", "b", "c")) {
-      simulator.printStatus(line);
-    }
+    NetworkSimulator simulator = new NetworkSimulator(new PrintStream(stream, false, StandardCharsets.UTF_8), kept);
+    List.of("a", "b", "c").forEach(simulator::printStatus);
     assertEquals("a\nb\nc\n", stream.toString(StandardCharsets.UTF_8), "each line is flushed");
-    assertEquals(expected.isEmpty() ? List.of() : List.of(expected.split(" ")),
-        simulator.statusLines());
+    assertEquals(expected.isEmpty() ? List.of() : List.of(expected.split(" ")), simulator.statusLines());
   }
 }

@@ -3,10 +3,7 @@ package com.kestrelon.simulator.tessel.data;
 import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertThrows;
 import static org.junit.jupiter.api.Assertions.assertTrue;
-import static org.junit.jupiter.api.Assertions.fail;
 
-import java.io.InputStream;
-import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.List;
@@ -16,22 +13,9 @@ import org.junit.jupiter.params.provider.ValueSource;
 
 class MibLayoutTest {
 
-    /** A corpus file: from -Dtessel.data.dir, the class path (/data/NAME) or the source tree. */
+    /** A corpus file: from -Dtessel.data.dir, else from the source tree. */
     static DeviceData corpus(String name) throws Exception {
-        String dir = System.getProperty("tessel.data.dir");
-        if (dir != null) {
-            return DeviceData.load(Path.of(dir, name));
-        }
-        try (InputStream in = MibLayoutTest.class.getResourceAsStream("/data/" + name)) {
-            if (in != null) {
-                return DeviceData.parse(name, in.readAllBytes());
-            }
-        }
-        Path inTree = Path.of("host/src/test/resources/data", name);
-        if (Files.exists(inTree)) {
-            return DeviceData.load(inTree);
-        }
-        return fail("corpus file " + name + " not found");
+        return DeviceData.load(Path.of(System.getProperty("tessel.data.dir", "host/src/test/resources/data"), name));
     }
 
     /**
@@ -49,10 +33,10 @@ class MibLayoutTest {
             for (int i = 0; i < cell.subIds().size(); i++) {
                 long subId = Long.parseLong(cell.subIds().get(i));
                 String type = cell.dataTypes().get(i);
-                List<DeviceObject> objects = cell.isTable()
-                        ? data.objects().stream().filter(o -> o.oid().startsWith(registered.append(subId))
-                                && o.oid().length() > registered.length() + 1).toList()
-                        : data.get(registered.prefix(registered.length() - 1).append(subId, 0)).stream().toList();
+                Oid scalar = registered.prefix(registered.length() - 1).append(subId, 0);
+                List<DeviceObject> objects = data.objects().stream().filter(o -> cell.isTable()
+                        ? o.oid().startsWith(registered.append(subId)) && o.oid().length() > registered.length() + 1
+                        : o.oid().equals(scalar)).toList();
                 for (DeviceObject object : objects) {
                     assertEquals(type, String.valueOf(object.typeNumber()), "type of " + object.oid());
                     answered.add(object.oid());
@@ -75,12 +59,7 @@ class MibLayoutTest {
     @ValueSource(strings = {"linux-host.walk", "branch-router.snmprec"})
     void servingTheLayoutAnswersExactlyTheRecordedObjectsInOrder(String name) throws Exception {
         DeviceData data = corpus(name);
-        List<CellDefinition> cells = MibLayout.infer(data);
-        assertEquals(data.objects().stream().map(DeviceObject::oid).toList(), walk(cells, data));
-        for (int i = 0; i < cells.size(); i++) {
-            assertEquals("cell" + (i + 1), cells.get(i).label());
-            assertEquals(0, cells.get(i).rowStatusColumn());
-        }
+        assertEquals(data.objects().stream().map(DeviceObject::oid).toList(), walk(MibLayout.infer(data), data));
     }
 
     @Test
@@ -96,10 +75,6 @@ class MibLayoutTest {
             assertTrue(("\n" + layout).contains("\n" + cell + "\n"), cell + " in\n" + layout);
         }
         assertEquals(28, cells.size());
-        CellDefinition ifTable = cells.get(3);
-        assertEquals(List.of("2", "4", "2", "2", "66", "4", "2", "2", "67", "65", "65", "65", "65", "66", "6"),
-                ifTable.dataTypes());
-        assertEquals(List.of("43706"), ifTable.accessTexts().stream().distinct().toList());
     }
 
     @Test
