@@ -80,19 +80,22 @@ class MibLayoutTest {
     @Test
     void doesNotTakeWholeGroupsForTables() throws Exception {
         // Seen from mgmt, system and interfaces look like two columns with shared instances 1.0;
-        // seen from 32473, the two tables of group 32473.1 look like two columns of one table.
+        // seen from 32474, the two tables of group 32474.1 look like two columns of one table.
+        // A lone object makes a one-column table under the entry that ends in 1.
         DeviceData data = DeviceData.parse("d", String.join("\n",
                 "1.3.6.1.2.1.1.1.0|4|router", "1.3.6.1.2.1.1.4.0|4|noc", "1.3.6.1.2.1.1.5.0|4|r1",
                 "1.3.6.1.2.1.2.1.0|2|2", "1.3.6.1.4.1.32473.1.1.0|2|1", "1.3.6.1.4.1.32473.1.2.0|2|1",
                 "1.3.6.1.4.1.32474.1.1.1.2.1|65|1", "1.3.6.1.4.1.32474.1.1.1.2.2|65|2",
                 "1.3.6.1.4.1.32474.1.1.1.3.1|65|3", "1.3.6.1.4.1.32474.1.1.1.3.2|65|4",
-                "1.3.6.1.4.1.32474.1.2.1.2.7|65|5", "1.3.6.1.4.1.32474.1.2.1.3.7|65|6"));
+                "1.3.6.1.4.1.32474.1.2.1.2.7|65|5", "1.3.6.1.4.1.32474.1.2.1.3.7|65|6",
+                "1.3.6.1.4.1.32475.1.1.2.7.3|2|1"));
         assertEquals("""
                 scalars 1.3.6.1.2.1.1.1 1,4,5
                 scalars 1.3.6.1.2.1.2.1 1
                 scalars 1.3.6.1.4.1.32473.1.1 1,2
                 table 1.3.6.1.4.1.32474.1.1.1 2,3
                 table 1.3.6.1.4.1.32474.1.2.1 2,3
+                table 1.3.6.1.4.1.32475.1.1 2
                 """, describe(MibLayout.infer(data)));
     }
 

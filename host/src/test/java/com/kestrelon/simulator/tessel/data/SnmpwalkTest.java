@@ -36,6 +36,7 @@ class SnmpwalkTest {
         "Counter64: 18446744073709551615         | 70 | 18446744073709551615",
         "OPAQUE: 9F 78 04 42 28 00 00            | 68 | `'9f780442280000'h`",
         "Opaque: Float: 42.000000                | 68 | `'9f780442280000'h`",
+        "Opaque: Float: inf                      | 68 | `'9f78047f800000'h`",
         "Opaque: Double: -1.500000               | 68 | `'9f7908bff8000000000000'h`",
         "Opaque: Int64: -2                       | 68 | `'9f7a01fe'h`",
         "Opaque: UInt64: 18446744073709551615    | 68 | `'9f7b0900ffffffffffffffff'h`",
@@ -59,14 +60,14 @@ class SnmpwalkTest {
                 "10 11 ",
                 ".1.3.6.1.2.1.1.3.0 = STRING: Linux box",
                 "kernel 6.1",
+                "End of MIB",
                 ".1.3.6.1.2.1.1.4.0 = No Such Object available on this agent at this OID",
                 ".1.3.6.1.2.1.1.5.0 = No Such Instance currently exists at this OID",
                 ".1.3.6.1.2.1.1.6.0 = INTEGER: 1",
-                "End of MIB",
                 ".1.3.6.1.2.1.1.6.0 = No more variables left in this MIB View (It is past the end of the MIB tree)"));
         assertEquals(List.of(hexOf("first line\n\n  \"third\" = line"), "'000102030405060708090a0b0c0d0e0f1011'h",
                 hexOf("Linux box\nkernel 6.1"), "1"), data.objects().stream().map(DeviceObject::value).toList());
-        assertEquals(10, data.objects().get(3).line());
+        assertEquals(11, data.objects().get(3).line());
     }
 
     @ParameterizedTest

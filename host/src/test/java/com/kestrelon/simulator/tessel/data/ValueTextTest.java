@@ -17,7 +17,7 @@ class ValueTextTest {
         "COUNTER32, 4294967295, 00ffffffff",
         "TIME_TICKS, 8723412, 00851bd4",
         "COUNTER64, 18446744073709551615, 00ffffffffffffffff",
-        "OBJECT_IDENTIFIER, .1.3.6.1.4.1.4294967295, 2b060104018fffffff7f",
+        "OBJECT_IDENTIFIER, .1.3.6.1.4.1.4294967295.200, 2b060104018fffffff7f8148",
         "OBJECT_IDENTIFIER, .2.999.3, 883703",
         "OBJECT_IDENTIFIER, .0.0, 00",
         "IP_ADDRESS, 172.16.4.254, ac1004fe",
@@ -63,7 +63,7 @@ class ValueTextTest {
     @CsvSource({
         "COUNTER32, ffffffff, 4294967295", "OBJECT_IDENTIFIER, 2b, .1.3", "INTEGER, 0080000000,",
         "COUNTER32, ff00000000,", "IP_ADDRESS, 0a0000,", "OBJECT_IDENTIFIER, 2b86,", "OBJECT_IDENTIFIER, 2b8001,",
-        "OBJECT_IDENTIFIER, 2b9080808000,",
+        "OBJECT_IDENTIFIER, 2b8180808080808080808001,",
     })
     void decodesAgentQuirksAndRejectsMalformedContents(BerType type, String contentsHex, String text) {
         byte[] contents = ValueText.fromHex(contentsHex);
