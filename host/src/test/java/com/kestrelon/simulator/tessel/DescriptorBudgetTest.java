@@ -21,7 +21,6 @@ class DescriptorBudgetTest {
     assertEquals(Optional.empty(), parse("many", "20000"));
     assertEquals(Optional.empty(), DescriptorBudget.parse("Max processes 10 10 processes\n", 5));
 
-    assertEquals(20000 - 46 - DescriptorBudget.RESERVE, new DescriptorBudget(20000, 20000, 46).allowedAgents());
     assertEquals(0, new DescriptorBudget(100, 100, 100 - DescriptorBudget.RESERVE + 1).allowedAgents());
     assertEquals(Integer.MAX_VALUE,
         new DescriptorBudget(DescriptorBudget.UNLIMITED, DescriptorBudget.UNLIMITED, 46).allowedAgents());

@@ -3,7 +3,6 @@ package com.kestrelon.simulator.tessel;
 import static java.nio.charset.StandardCharsets.UTF_8;
 import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertFalse;
-import static org.junit.jupiter.api.Assertions.assertThrows;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 import static org.junit.jupiter.api.Assertions.fail;
 
@@ -106,10 +105,8 @@ class LauncherTest {
         "r", "w", 3, "e.log", false), set);
     assertEquals(List.of("10.0.0.254", "10.0.0.255", "10.0.1.0"),
         List.of(set.address(0), set.address(1), set.address(2)), "addresses carry into the next octet");
-    LaunchOptions last = LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "2"}, DATA, V3);
-    assertEquals("255.255.255.255", last.address(1));
-    assertThrows(LaunchOptions.UsageException.class,
-        () -> LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "3"}, DATA, V3));
+    assertEquals("255.255.255.255",
+        LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "2"}, DATA, V3).address(1));
   }
 
   @ParameterizedTest
@@ -120,7 +117,8 @@ class LauncherTest {
       "--devices 0;                --devices takes a number from 1",
       "--snmp-port 65536;          --snmp-port takes a number from 1 to 65535",
       "--address 127.0.1.256;      --address takes an IPv4 address such as 127.0.1.1, not '127.0.1.256'",
-      "--read-community a,b;       --read-community takes a non-empty community without ','"})
+      "--read-community a,b;       --read-community takes a non-empty community without ','",
+      "--address 255.255.255.254 --devices 3; 3 devices from 255.255.255.254 run past 255.255.255.255"})
   void usageErrorsExitWithStatusTwo(String args, String message) throws Exception {
     assertEquals(2, runToEnd(args.split(" ")));
     assertTrue(err().startsWith("tessel: " + message), err());

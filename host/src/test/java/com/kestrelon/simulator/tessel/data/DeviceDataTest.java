@@ -3,7 +3,6 @@ package com.kestrelon.simulator.tessel.data;
 import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertThrows;
 
-import java.util.List;
 import java.util.stream.Collectors;
 import org.junit.jupiter.api.Test;
 import org.junit.jupiter.params.ParameterizedTest;
@@ -36,18 +35,6 @@ class DeviceDataTest {
                 1.3.6.1.9.12.0 4 '636166c3a9'h
                 """, data.objects().stream().map(o -> o.oid() + " " + o.typeNumber() + " " + o.value() + "\n")
                 .collect(Collectors.joining()));
-    }
-
-    @Test
-    void holdsObjectsInUnsignedOidOrderWhateverTheFileOrder() throws Exception {
-        DeviceData data = DeviceData.parse("dev", String.join("\n",
-                "1.3.6.1.4.1.4294967295.0|2|5",
-                "1.3.6.1.4.1.10.0|2|4",
-                "1.3.6.1.4.1.2147483648.0|2|3",
-                "1.3.6.1.4.1.9.0|2|2",
-                "1.3.6.1.4.1.9|2|1"));
-        assertEquals(List.of("1.3.6.1.4.1.9", "1.3.6.1.4.1.9.0", "1.3.6.1.4.1.10.0", "1.3.6.1.4.1.2147483648.0",
-                "1.3.6.1.4.1.4294967295.0"), data.objects().stream().map(o -> o.oid().toString()).toList());
     }
 
     @ParameterizedTest

@@ -40,7 +40,6 @@ class ValueTextTest {
         "OCTET_STRING, `'abc'h`, `'276162632768'h`",
         "OCTET_STRING, caf\u00e9, `'636166c3a9'h`",
         "OCTET_STRING, `''h`, ``",
-        "BIT_STRING, `'80'h`, `'80'h`",
         "OBJECT_IDENTIFIER, 1.3.6.1, .1.3.6.1",
         "INTEGER, -0, 0",
         "COUNTER64, 007, 7",

@@ -7,7 +7,6 @@ import static org.junit.jupiter.api.Assertions.assertNull;
 import com.kestrelon.simulator.tessel.data.DeviceData;
 import java.util.ArrayList;
 import java.util.List;
-import java.util.concurrent.CountDownLatch;
 import java.util.stream.IntStream;
 import org.junit.jupiter.api.Test;
 
@@ -51,11 +50,12 @@ class DeviceStoreTest {
         null, 2, agent, 0, "127.0.0.1", 160, null);
   }
 
-  /** The instances a walk of one column visits, following the answers from the column's start. */
+  /** The instances a walk of one column visits (10 at most), following the answers from the column's start. */
   private List<String> walkColumn(int agent, int column) {
     List<String> visited = new ArrayList<>();
     String instance = null;
-    for (String[] answer = next(agent, column, null); answer != null; answer = next(agent, column, instance)) {
+    for (String[] answer = next(agent, column, null); answer != null && visited.size() < 10;
+        answer = next(agent, column, instance)) {
       visited.add(answer[1] + "=" + answer[0]);
       instance = answer[1].substring(answer[1].indexOf('.'));
     }
@@ -85,6 +85,7 @@ class DeviceStoreTest {
     assertNull(next(0, 3, null), "a column without objects");
     assertNull(handler.TableGetNextOidVal("x", ".1.3.6.1.9.1", null, 1, 2, 2, 2, "db", "t", 0, 0, "a", 1, null));
     assertNull(next(0, 1, ".1..2"), "a malformed instance");
+    assertNull(next(0, 1, "10.0.0.1"), "an instance without its leading dot");
     assertNull(next(0, 1, ".4294967296"), "a sub-identifier beyond 32 bits");
   }
 
@@ -113,14 +114,7 @@ class DeviceStoreTest {
     int agents = 50_000;
     for (int round = 0; round < 5; round++) {
       DeviceStore store = new DeviceStore(DeviceData.parse("test.snmprec", DATA));
-      CountDownLatch ready = new CountDownLatch(threads);
       List<Thread> setters = IntStream.range(0, threads).mapToObj(first -> new Thread(() -> {
-        ready.countDown();
-        try {
-          ready.await();
-        } catch (InterruptedException e) {
-          return;
-        }
         for (int agent = first; agent < agents; agent += threads) {
           store.set(agent, oid, Integer.toString(agent));
         }
