@@ -53,21 +53,20 @@ record DescriptorBudget(long softLimit, long hardLimit, long open) {
 
   /** The budget for the "Max open files" line of a /proc/PID/limits text; empty without one. */
   static Optional<DescriptorBudget> parse(String limits, long open) {
-    for (String line : limits.split("\n")) {
-      if (!line.startsWith(OPEN_FILES)) {
-        continue;
-      }
-      String[] values = line.substring(OPEN_FILES.length()).trim().split("\\s+");
-      if (values.length < 2) {
-        return Optional.empty();
-      }
-      try {
-        return Optional.of(new DescriptorBudget(limit(values[0]), limit(values[1]), open));
-      } catch (NumberFormatException e) {
-        return Optional.empty();
-      }
+    return limits.lines().filter(line -> line.startsWith(OPEN_FILES)).findFirst()
+        .flatMap(line -> budget(line.substring(OPEN_FILES.length()).trim().split("\\s+"), open));
+  }
+
+  /** The budget of a "Max open files" line's values: soft limit, hard limit, units. */
+  private static Optional<DescriptorBudget> budget(String[] values, long open) {
+    if (values.length < 2) {
+      return Optional.empty();
     }
-    return Optional.empty();
+    try {
+      return Optional.of(new DescriptorBudget(limit(values[0]), limit(values[1]), open));
+    } catch (NumberFormatException e) {
+      return Optional.empty();
+    }
   }
 
   private static long limit(String text) {

@@ -1,5 +1,7 @@
 package com.kestrelon.simulator.tessel;
 
+import com.kestrelon.simulator.tessel.data.ValueText;
+import java.nio.ByteBuffer;
 import java.nio.file.Path;
 
 /**
@@ -90,8 +92,7 @@ public record LaunchOptions(Path dataFile, Path snmpV3File, int devices, long fi
   }
 
   private static String dotted(long address) {
-    return (address >>> 24) + "." + (address >>> 16 & 0xff) + "." + (address >>> 8 & 0xff) + "."
-        + (address & 0xff);
+    return ValueText.ipText(ByteBuffer.allocate(4).putInt((int) address).array());
   }
 
   private static final class Builder {
@@ -163,14 +164,10 @@ public record LaunchOptions(Path dataFile, Path snmpV3File, int devices, long fi
   }
 
   private static long parseAddress(String text) throws UsageException {
-    String[] parts = text.split("\\.", -1);
-    long address = 0;
-    for (String part : parts) {
-      if (parts.length != 4 || !part.matches("[0-9]{1,3}") || Integer.parseInt(part) > 255) {
-        throw new UsageException("--address takes an IPv4 address such as 127.0.1.1, not '" + text + "'");
-      }
-      address = address << 8 | Integer.parseInt(part);
+    try {
+      return Integer.toUnsignedLong(ByteBuffer.wrap(ValueText.parseIpAddress(text)).getInt());
+    } catch (IllegalArgumentException e) {
+      throw new UsageException("--address takes an IPv4 address such as 127.0.1.1, not '" + text + "'");
     }
-    return address;
   }
 }

@@ -18,6 +18,7 @@ import java.nio.file.Path;
 import java.util.Arrays;
 import java.util.List;
 import java.util.Optional;
+import java.util.function.Function;
 import java.util.function.Supplier;
 
 /**
@@ -48,19 +49,27 @@ public final class Launcher {
   private static final String DEFAULT_SNMPV3 = "snmpv3.conf";
   private static final int MAX_LOG_FILE_SIZE = 100 << 20;
   private static final int ENGINE_BOOTS = 1;
+  /** What {@link #start} returns when the network is up. */
+  private static final int SERVING = -1;
 
   private final Object lifecycle = new Object();
   private boolean stopRequested; // guarded by lifecycle
   private NetworkSimulator engine; // guarded by lifecycle: set once the engine is initialised
   private final Supplier<Optional<DescriptorBudget>> descriptorBudget;
+  private final Function<PrintStream, NetworkSimulator> engines;
 
   public Launcher() {
-    this(DescriptorBudget::ofThisProcess);
+    this(DescriptorBudget::ofThisProcess, out -> new NetworkSimulator(out, 0));
   }
 
-  /** A launcher that asks descriptorBudget how many devices fit, once the engine is set up. */
-  Launcher(Supplier<Optional<DescriptorBudget>> descriptorBudget) {
+  /**
+   * A launcher that asks descriptorBudget how many devices fit, once the engine is set up, and
+   * drives the engine that engines gives for the status stream.
+   */
+  Launcher(Supplier<Optional<DescriptorBudget>> descriptorBudget,
+      Function<PrintStream, NetworkSimulator> engines) {
     this.descriptorBudget = descriptorBudget;
+    this.engines = engines;
   }
 
   public static void main(String[] args) {
@@ -122,16 +131,22 @@ public final class Launcher {
     return serve(options, data, cells, snmpV3, out, err);
   }
 
-  /** Stops the network, or the start-up in progress; later calls do nothing. Any thread. */
+  /**
+   * Stops the network, or the start-up in progress; later calls do nothing. Any thread. The stop
+   * is decided under the lifecycle lock but carried out after it: the engine's stop waits for its
+   * threads, and meanwhile other callers (a second signal, say) must not wait on the lock.
+   */
   public void requestStop() {
+    NetworkSimulator running;
     synchronized (lifecycle) {
       if (stopRequested) {
         return;
       }
       stopRequested = true;
-      if (engine != null) {
-        engine.AdapterJniStopNetwork();
-      }
+      running = engine;
+    }
+    if (running != null) {
+      running.AdapterJniStopNetwork();
     }
   }
 
@@ -145,7 +160,25 @@ public final class Launcher {
   private int serve(LaunchOptions options, DeviceData data, List<CellDefinition> cells,
       SnmpV3Config snmpV3, PrintStream out, PrintStream err) {
     // Status lines go to the output stream only: the launcher never reads them back.
-    NetworkSimulator simulator = new NetworkSimulator(out, 0);
+    NetworkSimulator simulator = engines.apply(out);
+    int status = start(simulator, options, data, cells, snmpV3, err);
+    if (status == SERVING) {
+      simulator.jniBaseLoop();
+      return 0;
+    }
+    if (status != 0) {
+      requestStop(); // a failed start-up stops what it set up, unless a stop came first
+    }
+    return status;
+  }
+
+  /**
+   * Sets up the engine and starts the devices, one step at a time under the lifecycle lock so that
+   * a stop is seen between steps. Returns {@link #SERVING} when the network runs, 0 when a stop
+   * came first, else the exit status of the failure; it never stops the engine itself.
+   */
+  private int start(NetworkSimulator simulator, LaunchOptions options, DeviceData data,
+      List<CellDefinition> cells, SnmpV3Config snmpV3, PrintStream err) {
     SnmpHandler handler = new SnmpHandler(new DeviceStore(data));
     synchronized (lifecycle) {
       if (stopRequested) {
@@ -166,7 +199,7 @@ public final class Launcher {
         snmpV3.apply(new SerToCConverter());
       } catch (SnmpV3ConfigException e) {
         err.println(e.getMessage());
-        return abort(2);
+        return 2;
       }
       String refused = registerCells(cells);
       if (refused != null) {
@@ -196,8 +229,7 @@ public final class Launcher {
         return fail(err, "the engine's SNMP service did not start");
       }
     }
-    simulator.jniBaseLoop();
-    return 0;
+    return SERVING;
   }
 
   /** The devices to start: all asked for, or as many as the descriptor limit leaves room for. */
@@ -210,17 +242,10 @@ public final class Launcher {
     return budget.get().allowedAgents();
   }
 
-  /** Reports a failed start-up and stops the engine; the caller holds the lifecycle lock. */
-  private int fail(PrintStream err, String reason) {
+  /** Reports a failed start-up; returns its exit status. */
+  private static int fail(PrintStream err, String reason) {
     err.println("tessel: " + reason);
-    return abort(1);
-  }
-
-  /** Stops the engine after a failed start-up; the caller holds the lifecycle lock. */
-  private int abort(int status) {
-    stopRequested = true;
-    engine.AdapterJniStopNetwork();
-    return status;
+    return 1;
   }
 
   /** Registers every cell; returns the OID of the first the engine refuses, or null. */

@@ -9,7 +9,6 @@ import java.util.Arrays;
 import java.util.Collections;
 import java.util.Comparator;
 import java.util.List;
-import java.util.Optional;
 
 /**
  * The recorded objects of one device, sorted by OID, each OID once.
@@ -73,6 +72,11 @@ public final class DeviceData {
         return new DeviceData(source, sorted);
     }
 
+    /**
+     * The lines of the text, split at LF with a CR before it dropped. A CR elsewhere is an octet
+     * of a value (net-snmp prints such strings as they are), so unlike {@link String#lines()} this
+     * does not end a line there.
+     */
     private static List<String> splitLines(String text) {
         List<String> lines = new ArrayList<>(Arrays.asList(text.split("\n", -1)));
         if (!lines.isEmpty() && lines.get(lines.size() - 1).isEmpty()) {
@@ -92,20 +96,9 @@ public final class DeviceData {
         return objects;
     }
 
-    public int size() {
-        return objects.size();
-    }
-
-    /** The object with exactly this OID. */
-    public Optional<DeviceObject> get(Oid oid) {
+    /** The position of the first object whose OID is not before {@code oid}; the count when none is. */
+    int position(Oid oid) {
         int index = Arrays.binarySearch(oids, oid);
-        return index >= 0 ? Optional.of(objects.get(index)) : Optional.empty();
-    }
-
-    /** The first object whose OID follows {@code oid} (the GetNext answer over the whole data). */
-    public Optional<DeviceObject> next(Oid oid) {
-        int index = Arrays.binarySearch(oids, oid);
-        int next = index >= 0 ? index + 1 : -index - 1;
-        return next < objects.size() ? Optional.of(objects.get(next)) : Optional.empty();
+        return index >= 0 ? index : -index - 1;
     }
 }

@@ -174,7 +174,7 @@ public final class MibLayout {
             if (entryEndsInOne && entry.last() != 1) {
                 continue;
             }
-            int lo = lowerBound(entry);
+            int lo = data.position(entry);
             int hi = lo;
             boolean free = true;
             while (hi < objects.size() && oid(hi).startsWith(entry)) {
@@ -191,20 +191,6 @@ public final class MibLayout {
             }
         }
         return false;
-    }
-
-    private int lowerBound(Oid oid) {
-        int lo = 0;
-        int hi = objects.size();
-        while (lo < hi) {
-            int mid = (lo + hi) >>> 1;
-            if (oid(mid).compareTo(oid) < 0) {
-                lo = mid + 1;
-            } else {
-                hi = mid;
-            }
-        }
-        return lo;
     }
 
     // ---- scalars ------------------------------------------------------------------------------

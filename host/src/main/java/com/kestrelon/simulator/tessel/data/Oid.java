@@ -130,14 +130,7 @@ public final class Oid implements Comparable<Oid> {
 
     @Override
     public int compareTo(Oid other) {
-        int common = Math.min(subIds.length, other.subIds.length);
-        for (int i = 0; i < common; i++) {
-            int c = Integer.compareUnsigned(subIds[i], other.subIds[i]);
-            if (c != 0) {
-                return c;
-            }
-        }
-        return Integer.compare(subIds.length, other.subIds.length);
+        return Arrays.compareUnsigned(subIds, other.subIds);
     }
 
     @Override

@@ -4,6 +4,7 @@ import java.io.ByteArrayOutputStream;
 import java.math.BigInteger;
 import java.nio.charset.StandardCharsets;
 import java.util.ArrayList;
+import java.util.HexFormat;
 import java.util.List;
 import java.util.regex.Pattern;
 
@@ -38,7 +39,7 @@ public final class ValueText {
 
     /** The engine text of octets: {@code ""} when there are none, else {@code 'hex'h}. */
     public static String octetsText(byte[] octets) {
-        return octets.length == 0 ? "" : "'" + toHex(octets) + "'h";
+        return octets.length == 0 ? "" : "'" + HexFormat.of().formatHex(octets) + "'h";
     }
 
     /** The octets of an octet-typed text from the engine: {@code 'hex'h}/{@code 'hex'H} or UTF-8 text. */
@@ -158,29 +159,16 @@ public final class ValueText {
         return oid;
     }
 
-    static String ipText(byte[] octets) {
+    /** The dotted text of 4 IPv4 address octets. */
+    public static String ipText(byte[] octets) {
         return (octets[0] & 0xff) + "." + (octets[1] & 0xff) + "." + (octets[2] & 0xff) + "." + (octets[3] & 0xff);
-    }
-
-    static String toHex(byte[] octets) {
-        StringBuilder hex = new StringBuilder(octets.length * 2);
-        for (byte b : octets) {
-            hex.append(Character.forDigit((b >> 4) & 0xf, 16)).append(Character.forDigit(b & 0xf, 16));
-        }
-        return hex.toString();
     }
 
     /** Hex digits (even count, either case) to octets. */
     static byte[] fromHex(String hex) {
         require(hex.length() % 2 == 0, "odd number of hex digits");
-        byte[] octets = new byte[hex.length() / 2];
-        for (int i = 0; i < octets.length; i++) {
-            int high = Character.digit(hex.charAt(2 * i), 16);
-            int low = Character.digit(hex.charAt(2 * i + 1), 16);
-            require(high >= 0 && low >= 0, "not hexadecimal: '" + hex + "'");
-            octets[i] = (byte) (high << 4 | low);
-        }
-        return octets;
+        require(hex.chars().allMatch(HexFormat::isHexDigit), "not hexadecimal: '" + hex + "'");
+        return HexFormat.of().parseHex(hex);
     }
 
     private static BigInteger decodeUnsigned(byte[] contents, int bits) {

@@ -4,6 +4,7 @@ import com.kestrelon.simulator.tessel.data.DeviceData;
 import com.kestrelon.simulator.tessel.data.DeviceObject;
 import com.kestrelon.simulator.tessel.data.Oid;
 import com.kestrelon.simulator.tessel.data.ValueText;
+import java.util.Arrays;
 import java.util.HashMap;
 import java.util.List;
 import java.util.Map;
@@ -16,12 +17,10 @@ import java.util.concurrent.ConcurrentHashMap;
  *
  * <p>OID texts are the engine's: a dot before each sub-identifier ({@code .1.3.6.1.2.1.1.5.0}).
  * Values are engine texts as {@link ValueText} describes them. An exact lookup costs one hash
- * lookup, a column walk step two binary searches over the recorded objects. Thread-safe: the
+ * lookup, a column walk step one binary search over the objects of its table. Thread-safe: the
  * engine calls in from many request threads at once.
  */
 public final class DeviceStore {
-  private static final long MAX_SUB_ID = 0xFFFF_FFFFL;
-
   private final List<DeviceObject> objects;
   private final Oid[] oids;
   private final Map<String, Integer> positionByText;
@@ -67,12 +66,13 @@ public final class DeviceStore {
    */
   public String[] nextInColumn(int agentId, String entryOid, int column, String instance) {
     EntryRange range = entryRange(entryOid);
-    long[] key = columnKey(column, instance);
+    Oid key = columnKey(entryOid, column, instance);
     if (range == null || key == null) {
       return null;
     }
-    int position = firstAfter(range, key);
-    if (position == range.end || oids[position].get(range.length) != key[0]) {
+    int found = Arrays.binarySearch(oids, range.first, range.end, key);
+    int position = found >= 0 ? found + 1 : -found - 1;
+    if (position == range.end || oids[position].get(range.length) != Integer.toUnsignedLong(column)) {
       return null;
     }
     return new String[] {valueAt(agentId, position), oids[position].suffixText(range.length)};
@@ -117,7 +117,8 @@ public final class DeviceStore {
     } catch (IllegalArgumentException e) {
       return null;
     }
-    int first = lowerBound(entry);
+    int found = Arrays.binarySearch(oids, entry);
+    int first = found >= 0 ? found : -found - 1;
     int end = first;
     while (end < oids.length && oids[end].startsWith(entry)) {
       end++;
@@ -127,85 +128,19 @@ public final class DeviceStore {
     return range;
   }
 
-  private int lowerBound(Oid oid) {
-    int low = 0;
-    int high = oids.length;
-    while (low < high) {
-      int middle = (low + high) >>> 1;
-      if (oids[middle].compareTo(oid) < 0) {
-        low = middle + 1;
-      } else {
-        high = middle;
-      }
-    }
-    return low;
-  }
-
-  /** The first position in the range whose sub-identifiers after the entry follow {@code key}. */
-  private int firstAfter(EntryRange range, long[] key) {
-    int low = range.first;
-    int high = range.end;
-    while (low < high) {
-      int middle = (low + high) >>> 1;
-      if (compareSuffix(oids[middle], range.length, key) <= 0) {
-        low = middle + 1;
-      } else {
-        high = middle;
-      }
-    }
-    return low;
-  }
-
-  private static int compareSuffix(Oid oid, int from, long[] key) {
-    int length = oid.length() - from;
-    for (int i = 0; i < Math.min(length, key.length); i++) {
-      int order = Long.compare(oid.get(from + i), key[i]);
-      if (order != 0) {
-        return order;
-      }
-    }
-    return Integer.compare(length, key.length);
-  }
-
-  /** The column followed by the instance's sub-identifiers; null when the instance is malformed. */
-  private static long[] columnKey(int column, String instance) {
-    if (instance == null || instance.isEmpty()) {
-      return new long[] {Integer.toUnsignedLong(column)};
-    }
-    int count = 0;
-    for (int i = 0; i < instance.length(); i++) {
-      if (instance.charAt(i) == '.') {
-        count++;
-      }
-    }
-    if (instance.charAt(0) != '.' || count >= Oid.MAX_LENGTH) {
+  /**
+   * The OID of the entry's column followed by the instance: where a column walk stands. Null when
+   * the instance is malformed.
+   */
+  private static Oid columnKey(String entryOid, int column, String instance) {
+    String suffix = instance == null ? "" : instance;
+    if (!suffix.isEmpty() && suffix.charAt(0) != '.') {
       return null;
     }
-    long[] key = new long[count + 1];
-    key[0] = Integer.toUnsignedLong(column);
-    int index = 0;
-    int digits = 0;
-    for (int i = 0; i < instance.length(); i++) {
-      char c = instance.charAt(i);
-      if (c == '.') {
-        if (index > 0 && digits == 0) {
-          return null;
-        }
-        index++;
-        digits = 0;
-      } else if (c >= '0' && c <= '9') {
-        key[index] = key[index] * 10 + (c - '0');
-        digits++;
-        if (key[index] > MAX_SUB_ID) {
-          return null;
-        }
-      } else {
-        return null;
-      }
-    }
-    if (digits == 0) {
+    try {
+      return Oid.parse(entryOid + "." + Integer.toUnsignedString(column) + suffix);
+    } catch (IllegalArgumentException e) {
       return null;
     }
-    return key;
   }
 }

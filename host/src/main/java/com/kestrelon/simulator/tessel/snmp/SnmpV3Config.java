@@ -1,5 +1,6 @@
 package com.kestrelon.simulator.tessel.snmp;
 
+import com.kestrelon.simulator.tessel.data.Oid;
 import java.io.IOException;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.Files;
@@ -9,6 +10,7 @@ import java.util.HashMap;
 import java.util.List;
 import java.util.Map;
 import java.util.Set;
+import java.util.function.ToIntFunction;
 
 /**
  * An SNMPv3 configuration: USM users and the VACM contexts, groups, access rows and view
@@ -38,7 +40,6 @@ public final class SnmpV3Config {
 
   private static final int MAX_NAME = 32;
   private static final int MIN_PASSWORD = 8;
-  private static final int MAX_SUBIDS = 128;
   private static final Set<String> AUTH_PROTOCOLS = Set.of("NO_AUTH", "MD5_AUTH", "SHA_AUTH");
   private static final Set<String> PRIV_PROTOCOLS = Set.of("NO_PRIV", "CBC_DES", "CFB_AES_128");
 
@@ -107,10 +108,10 @@ public final class SnmpV3Config {
   public static SnmpV3Config parse(String file, String text) throws SnmpV3ConfigException {
     List<Row> rows = new ArrayList<>();
     Map<String, Integer> users = new HashMap<>();
-    String[] lines = text.split("\r?\n", -1);
-    for (int i = 0; i < lines.length; i++) {
+    List<String> lines = text.lines().toList();
+    for (int i = 0; i < lines.size(); i++) {
       int line = i + 1;
-      LineReader reader = new LineReader(file, line, lines[i]);
+      LineReader reader = new LineReader(file, line, lines.get(i));
       if (reader.tokens.isEmpty()) {
         continue;
       }
@@ -136,14 +137,19 @@ public final class SnmpV3Config {
    * decision lists. Stops at the first row the engine does not add.
    */
   public void apply(SerToCConverter engine) throws SnmpV3ConfigException {
+    apply(row -> row.addTo(engine), engine::nativeCreateLCDVectors);
+  }
+
+  /** As {@link #apply(SerToCConverter)}, with {@code add} adding a row and {@code rebuild} the lists. */
+  void apply(ToIntFunction<Row> add, Runnable rebuild) throws SnmpV3ConfigException {
     for (Row row : rows) {
-      int result = row.addTo(engine);
+      int result = add.applyAsInt(row);
       if (result != 1) {
         throw new SnmpV3ConfigException(file, row.line(), result == 99
             ? "the engine ran out of memory" : "the engine refused this row");
       }
     }
-    engine.nativeCreateLCDVectors();
+    rebuild.run();
   }
 
   /** The tokens of one line and the checks of their values. */
@@ -271,16 +277,12 @@ public final class SnmpV3Config {
 
     String subtree(int index) throws SnmpV3ConfigException {
       String text = tokens.get(index);
-      String dotted = text.startsWith(".") ? text.substring(1) : text;
-      String[] subIds = dotted.split("\\.", -1);
-      boolean valid = subIds.length <= MAX_SUBIDS;
-      for (String subId : subIds) {
-        valid &= subId.matches("[0-9]{1,10}") && Long.parseLong(subId) <= 0xFFFF_FFFFL;
-      }
-      if (!valid) {
+      try {
+        Oid.parse(text);
+      } catch (IllegalArgumentException e) {
         throw fault("the subtree must be a dotted OID such as 1.3.6.1, not '" + text + "'");
       }
-      return dotted;
+      return text.startsWith(".") ? text.substring(1) : text;
     }
 
     String mask(int index) throws SnmpV3ConfigException {
