@@ -25,9 +25,7 @@ namespace {
 const std::uint16_t kBasePort = static_cast<std::uint16_t>(20000 + (::getpid() % 300) * 40);
 
 sockaddr_in Address(const std::string& text, std::uint16_t port) {
-  sockaddr_in address{};
-  address.sin_family = AF_INET;
-  address.sin_port = htons(port);
+  sockaddr_in address{AF_INET, htons(port), {}, {}};
   inet_pton(AF_INET, text.c_str(), &address.sin_addr);
   return address;
 }
