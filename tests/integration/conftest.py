@@ -2,6 +2,7 @@
 a real JVM) and, for comparison, snmpsim serving the same data. Every process is stopped by its
 fixture; all traffic stays on 127.0.0.0/8."""
 
+import ipaddress
 import os
 import shutil
 import signal
@@ -20,21 +21,6 @@ PROFILE = ROOT / "profiles" / "router.snmprec"
 BASE_PORT = 30000 + (os.getpid() % 2000) * 10
 
 
-def host_jar():
-    jars = sorted(BUILD.glob("host/tessel-host*.jar"))
-    jars = [j for j in jars if "tests" not in j.name]
-    assert jars, f"host jar not found under {BUILD}/host"
-    return jars[0]
-
-
-def launcher_command(data, devices, address, port, extra=()):
-    """The command line that starts the launcher in a JVM with these options."""
-    return [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
-            f"-Dtessel.profiles.dir={ROOT / 'profiles'}", "-cp", str(host_jar()),
-            "com.kestrelon.simulator.tessel.Launcher", "--snmp-data", str(data), "--devices", str(devices),
-            "--address", address, "--snmp-port", str(port), *extra]
-
-
 class Network:
     """A Tessel network started with the launcher's options, `extra` appended to them (such as
     ("--snmpv3", path)); devices at address + i. The launcher finds the default SNMPv3
@@ -43,48 +29,40 @@ class Network:
     def __init__(self, data, devices, address, port, extra=()):
         self.address, self.port, self.devices = address, port, devices
         self.workdir = tempfile.mkdtemp(prefix="tessel-it-")
-        self.process = subprocess.Popen(launcher_command(data, devices, address, port, extra), cwd=self.workdir, stdout=subprocess.PIPE,
-                                        stderr=subprocess.PIPE, text=True)
-        self.started = self._wait_for_agents()
-
-    def _wait_for_agents(self):
+        jars = [j for j in sorted(BUILD.glob("host/tessel-host*.jar")) if "tests" not in j.name]
+        assert jars, f"host jar not found under {BUILD}/host"
+        command = [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
+                   f"-Dtessel.profiles.dir={ROOT / 'profiles'}", "-cp", str(jars[0]),
+                   "com.kestrelon.simulator.tessel.Launcher", "--snmp-data", str(data), "--devices", str(devices),
+                   "--address", address, "--snmp-port", str(port), *extra]
+        self.process = subprocess.Popen(command, cwd=self.workdir, stdout=subprocess.PIPE, stderr=subprocess.PIPE,
+                                        text=True)
         lines, deadline = [], time.monotonic() + 60
-        while time.monotonic() < deadline:
+        while time.monotonic() < deadline and len(lines) < devices:
             line = self.process.stdout.readline()
             if not line:
-                break
-            lines.append(line.rstrip("\n"))
-            if sum("Snmp Agent Started" in l for l in lines) + sum("Unable to start" in l for l in lines) \
-                    >= self.devices:
-                return lines
-        raise AssertionError(f"network did not start: {lines} {self.process.stderr.read() if self.process.poll() is not None else ''}")
+                raise AssertionError(f"network did not start: {self.process.stderr.read()}")
+            if "Snmp Agent Started" in line or "Unable to start" in line:
+                lines.append(line)
+        assert len(lines) == devices, f"network did not start in time: {lines}"
 
     def agent(self, i):
-        a = [int(x) for x in self.address.split(".")]
-        value = ((a[0] << 24) | (a[1] << 16) | (a[2] << 8) | a[3]) + i
-        return f"{value >> 24 & 255}.{value >> 16 & 255}.{value >> 8 & 255}.{value & 255}:{self.port}"
+        return f"{ipaddress.IPv4Address(self.address) + i}:{self.port}"
 
     def stop(self):
-        self.process.send_signal(signal.SIGTERM)
-        try:
-            status = self.process.wait(timeout=15)
-        except subprocess.TimeoutExpired:
-            self.process.kill()
-            raise
-        shutil.rmtree(self.workdir, ignore_errors=True)
-        return status
+        return stop(self.process, self.workdir)
 
 
 class Simulator:
     """snmpsim serving one data file (as community `public`), run as nobody."""
 
-    def __init__(self, data, port, suffix):
+    def __init__(self, data, port):
         self.datadir = Path(tempfile.mkdtemp(prefix="tessel-sim-"))
-        shutil.copy(data, self.datadir / f"public.{suffix}")
-        os.chmod(self.datadir, 0o755)
-        os.chmod(self.datadir / f"public.{suffix}", 0o644)
-        (self.datadir / "cache").mkdir(mode=0o777)
-        os.chmod(self.datadir / "cache", 0o777)  # snmpsim writes its index there as nobody
+        shutil.copy(data, self.datadir / "public.snmprec")
+        (self.datadir / "cache").mkdir()
+        for path, mode in ((self.datadir, 0o755), (self.datadir / "public.snmprec", 0o644),
+                           (self.datadir / "cache", 0o777)):  # snmpsim reads and indexes as nobody
+            os.chmod(path, mode)
         self.endpoint = f"127.0.0.1:{port}"
         self.process = subprocess.Popen(
             ["snmpsimd", f"--data-dir={self.datadir}", f"--agent-udpv4-endpoint={self.endpoint}",
@@ -100,12 +78,19 @@ class Simulator:
         raise AssertionError("snmpsim did not start")
 
     def stop(self):
-        self.process.terminate()
-        try:
-            self.process.wait(timeout=10)
-        except subprocess.TimeoutExpired:
-            self.process.kill()
-        shutil.rmtree(self.datadir, ignore_errors=True)
+        stop(self.process, self.datadir)
+
+
+def stop(process, directory):
+    """Ends process (SIGTERM, SIGKILL after 15 s) and removes its directory; the exit status."""
+    process.send_signal(signal.SIGTERM)
+    try:
+        return process.wait(timeout=15)
+    except subprocess.TimeoutExpired:
+        process.kill()
+        raise
+    finally:
+        shutil.rmtree(directory, ignore_errors=True)
 
 
 def snmp(tool, *args, check=True):
@@ -121,6 +106,14 @@ def lines(tool, *args):
     return [l for l in snmp(tool, "-On", *args).stdout.splitlines() if l]
 
 
+def walk(tool, endpoint, *options):
+    """The objects a walk returns, without the end-of-MIB markers a bulk reply may repeat and without
+    the engine's own SNMPv3 objects (snmpEngine, snmpMPDStats, usmStats): recorded data lacks them, and
+    their counters and time move with every exchange."""
+    return [l for l in lines(tool, *options, endpoint, "1.3")
+            if "No more variables left" not in l and l != "End of MIB" and not l.startswith(".1.3.6.1.6.3.")]
+
+
 @pytest.fixture(scope="session")
 def network():
     net = Network(PROFILE, 3, "127.0.3.1", BASE_PORT)
@@ -130,6 +123,6 @@ def network():
 
 @pytest.fixture(scope="session")
 def simulator():
-    sim = Simulator(PROFILE, BASE_PORT + 1, "snmprec")
+    sim = Simulator(PROFILE, BASE_PORT + 1)
     yield sim
     sim.stop()

@@ -10,12 +10,9 @@
 #include "snmp/statistics.h"
 
 namespace tessel {
-namespace {
 
 constexpr const char* kRo = "43690";  // read-only
 constexpr const char* kRw = "43706";  // read-write
-
-}  // namespace
 
 void RegisterCell(const std::string& label, const std::string& oid, bool isTable,
                   std::vector<std::array<std::string, 3>> columns) {
@@ -88,18 +85,13 @@ void SnmpAgentTest::SetUp() {
                {{"1", "2", kRo}, {"2", "4", kRo}, {"10", "65", kRo}});
   RegisterCell("ifXEntry", "1.3.6.1.2.1.31.1.1.1", true, {{"1", "4", kRw}, {"6", "70", kRo}});
   StoreTreeCellsRefInArray();
-  host_.SetValue("1.3.6.1.2.1.1.1.0", "Tessel router");
-  host_.SetValue("1.3.6.1.2.1.1.2.0", ".1.3.6.1.4.1.99999");
-  host_.SetValue("1.3.6.1.2.1.1.3.0", "12345");
-  host_.SetValue("1.3.6.1.2.1.1.4.0", "ops");
-  host_.SetValue("1.3.6.1.2.1.1.5.0", "r1");
-  host_.SetValue("1.3.6.1.2.1.1.6.0", "lab");
-  host_.SetValue("1.3.6.1.2.1.1.7.0", "72");
-  for (int i = 1; i <= 2; ++i) {
-    std::string n = std::to_string(i);
+  const char* system[] = {"Tessel router", ".1.3.6.1.4.1.99999", "12345", "ops", "r1", "lab", "72"};
+  for (int i = 1; i <= 7; ++i)
+    host_.SetValue("1.3.6.1.2.1.1." + std::to_string(i) + ".0", system[i - 1]);
+  for (std::string n : {"1", "2"}) {
     host_.SetValue("1.3.6.1.2.1.2.2.1.1." + n, n);
     host_.SetValue("1.3.6.1.2.1.2.2.1.2." + n, "eth" + n);
-    host_.SetValue("1.3.6.1.2.1.2.2.1.10." + n, std::to_string(1000 * i));
+    host_.SetValue("1.3.6.1.2.1.2.2.1.10." + n, n + "000");
     host_.SetValue("1.3.6.1.2.1.31.1.1.1.1." + n, "eth" + n);
     host_.SetValue("1.3.6.1.2.1.31.1.1.1.6." + n, "4294967296");
   }
