@@ -186,7 +186,8 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
       {"level above the user's", [](V3Request& r) { r.flags = 0x07; }, 1, 1},
       {"time outside the window", [](V3Request& r) { r.time += 152; }, 2, 1},
       {"other boots", [](V3Request& r) { r.boots = 4; }, 2, 2},
-      {"latched boots", [](V3Request& r) { r.boots = 2147483647; }, 2, 3},
+      {"latched boots", [&](V3Request& r) { r.boots = agent_.agentInfo->engineBoots = 2147483647; },
+       2, 3},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.what);
@@ -202,7 +203,7 @@ TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
   // The last Report is authenticated and tells this engine's boots, so that the manager can resync.
   EXPECT_EQ(replyFlags_ & 0x03, 0x01);
   std::string text(reply_.begin(), reply_.end());
-  EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 3), "\x02\x01\x03");
+  EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 6), "\x02\x04\x7f\xff\xff\xff");
 }
 
 TEST_F(V3MessageTest, AuthenticatedRequestsAreAnsweredWithinTheirView) {
