@@ -44,7 +44,6 @@ Bytes Str(const std::string& value) {
 }
 
 struct V3Request {
-  std::int32_t msgId = 77;
   std::int32_t maxSize = 1500;
   std::uint8_t flags = 0x04;
   std::int32_t securityModel = 3;
@@ -84,7 +83,7 @@ std::vector<std::uint8_t> Encode(const V3Request& r) {
       kAsnSequence,
       {Int(3),
        Container(kAsnSequence,
-                 {Int(r.msgId), Int(r.maxSize), Str(std::string(1, static_cast<char>(r.flags))),
+                 {Int(77), Int(r.maxSize), Str(std::string(1, static_cast<char>(r.flags))),
                   Int(r.securityModel)}),
        Container(
            kAsnOctetString,
@@ -147,14 +146,14 @@ class V3MessageTest : public SnmpAgentTest {
 
   // Processes a v3 message; the reply's scoped PDU parsed (only for unencrypted replies).
   std::optional<SnmpPdu> Exchange3(const std::vector<std::uint8_t>& datagram) {
-    std::vector<std::uint8_t> reply(kMaxSnmpMessage);
-    std::size_t length = reply.size();
-    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply.data(), &length, agent_) !=
+    reply_.assign(kMaxSnmpMessage, 0);
+    std::size_t length = reply_.size();
+    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply_.data(), &length, agent_) !=
         kMessageReply) {
       return std::nullopt;
     }
-    reply.resize(length);
-    reply_ = reply;
+    reply_.resize(length);
+    const Bytes& reply = reply_;
     std::size_t global = Field(reply, Field(reply, 0).contents).end;  // behind msgVersion
     replyFlags_ = reply[Field(reply, global).end - 4];  // msgGlobalData ends: flags, 02 01 03
     Tlv scoped = Field(reply, Field(reply, Field(reply, global).end).end);
