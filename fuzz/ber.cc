@@ -14,30 +14,21 @@ namespace tessel {
 namespace {
 
 void ParseEachPrimitive(const std::uint8_t* data, std::int32_t size) {
-  std::uint8_t type = 0;
   std::int32_t remaining = size;
-  AsnParseHeader(data, &remaining, &type);
-  std::uint32_t length = 0;
-  AsnParseLength(data, size, &length);
+  auto all = [&] { return &(remaining = size); };  // each parse starts on the whole input
+  std::uint8_t type = 0, buffer[64];
   std::int32_t signedValue = 0;
-  remaining = size;
-  AsnParseInt(data, &remaining, &type, &signedValue);
-  std::uint32_t unsignedValue = 0;
-  remaining = size;
-  AsnParseUnsignedInt(data, &remaining, &type, &unsignedValue);
-  std::uint8_t buffer[64];
-  std::size_t capacity = sizeof buffer;
-  remaining = size;
-  AsnParseString(data, &remaining, &type, buffer, &capacity);
+  std::uint32_t length = 0, unsignedValue = 0, ids[kMaxOidLength];
+  std::size_t capacity = sizeof buffer, count = 16;  // a small capacity exercises the overflow path
+  AsnParseHeader(data, all(), &type);
+  AsnParseLength(data, size, &length);
+  AsnParseInt(data, all(), &type, &signedValue);
+  AsnParseUnsignedInt(data, all(), &type, &unsignedValue);
+  AsnParseString(data, all(), &type, buffer, &capacity);
   capacity = sizeof buffer;
-  remaining = size;
-  AsnParseBitString(data, &remaining, &type, buffer, &capacity);
-  std::uint32_t ids[kMaxOidLength];
-  std::size_t count = 16;  // a small capacity exercises the overflow path
-  remaining = size;
-  AsnParseObjid(data, &remaining, &type, ids, &count);
-  remaining = size;
-  AsnParseNull(data, &remaining, &type);
+  AsnParseBitString(data, all(), &type, buffer, &capacity);
+  AsnParseObjid(data, all(), &type, ids, &count);
+  AsnParseNull(data, all(), &type);
 }
 
 struct Decoded {

@@ -14,38 +14,30 @@ namespace {
 
 using namespace tessel;
 
-void RegisterCell(const char* label, const char* oid, bool isTable, std::vector<std::string> subIds,
-                  std::vector<std::string> types, const char* access) {
-  TreeCellRegistration cell;
-  cell.label = label;
-  cell.versionText = "V2";
-  cell.oidText = oid;
-  cell.isTable = isTable;
-  cell.subIds = std::move(subIds);
-  cell.dataTypes = std::move(types);
-  cell.access.assign(cell.subIds.size(), access);
-  CreateAndRegisterCell(cell);
-}
-
 AgentSession* SetUpAgent() {
   static MemoryHost host;
   SetDefaultCellHandlers(ScalarProcessReadReq, ScalarProcessWriteReq, TableProcessReadReq,
                          TableProcessWriteReq);
   InstallHost(&host);
-  RegisterCell("system", "1.3.6.1.2.1.1.1", false, {"1", "2", "3", "5"}, {"4", "6", "67", "4"},
-               "43706");
-  RegisterCell("ifEntry", "1.3.6.1.2.1.2.2.1", true, {"1", "2", "6", "10"}, {"2", "4", "64", "70"},
-               "43706");
+  TreeCellRegistration system, ifEntry;
+  system.label = "system", system.oidText = "1.3.6.1.2.1.1.1";
+  system.subIds = {"1", "2", "3", "5"}, system.dataTypes = {"4", "6", "67", "4"};
+  ifEntry.label = "ifEntry", ifEntry.oidText = "1.3.6.1.2.1.2.2.1", ifEntry.isTable = true;
+  ifEntry.subIds = {"1", "2", "6", "10"}, ifEntry.dataTypes = {"2", "4", "64", "70"};
+  for (TreeCellRegistration* cell : {&system, &ifEntry}) {
+    cell->versionText = "V2";
+    cell->access.assign(4, "43706");  // read-write
+    CreateAndRegisterCell(*cell);
+  }
   StoreTreeCellsRefInArray();
   host.SetValue("1.3.6.1.2.1.1.1.0", "fuzz");
   host.SetValue("1.3.6.1.2.1.1.2.0", ".1.3.6.1.4.1.1");
   host.SetValue("1.3.6.1.2.1.1.3.0", "1");
   host.SetValue("1.3.6.1.2.1.1.5.0", "'00ff'h");
-  for (const char* row : {"1", "2", "10.0.0.1"}) {
-    host.SetValue(std::string("1.3.6.1.2.1.2.2.1.1.") + row, "1");
-    host.SetValue(std::string("1.3.6.1.2.1.2.2.1.2.") + row, "eth");
-    host.SetValue(std::string("1.3.6.1.2.1.2.2.1.6.") + row, "10.0.0.1");
-    host.SetValue(std::string("1.3.6.1.2.1.2.2.1.10.") + row, "18446744073709551615");
+  for (std::string row : {"1", "2", "10.0.0.1"}) {
+    for (auto [column, value] :
+         {std::pair{"1.", "1"}, {"2.", "eth"}, {"6.", "10.0.0.1"}, {"10.", "18446744073709551615"}})
+      host.SetValue("1.3.6.1.2.1.2.2.1." + (column + row), value);
   }
   static AgentSession agent = LocalAgent(1);
   return &agent;

@@ -24,12 +24,8 @@ AgentSession* SetUpAgent() {
                          TableProcessWriteReq);
   InstallHost(&host);
   TreeCellRegistration system;
-  system.label = "system";
-  system.versionText = "V2";
-  system.oidText = "1.3.6.1.2.1.1.1";
-  system.subIds = {"1", "5"};
-  system.dataTypes = {"4", "4"};
-  system.access = {"43706", "43706"};
+  system.label = "system", system.versionText = "V2", system.oidText = "1.3.6.1.2.1.1.1";
+  system.subIds = {"1", "5"}, system.dataTypes = {"4", "4"}, system.access = {"43706", "43706"};
   CreateAndRegisterCell(system);
   RegisterEngineObjects();
   StoreTreeCellsRefInArray();
@@ -40,9 +36,8 @@ AgentSession* SetUpAgent() {
   AddUsmUserFromHost("shaaes", "SHA_AUTH", "shapassword", "CFB_AES_128", "aespassword", 1);
   AddUsmUserFromHost("md5des", "MD5_AUTH", "md5password", "CBC_DES", "despassword", 1);
   CreateAndAddSnmpVacmContextTableEntry("");
-  for (const char* user : {"plain", "md5", "shaaes", "md5des"}) {
+  for (const char* user : {"plain", "md5", "shaaes", "md5des"})
     CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, user, "all", 3);
-  }
   CreateAndAddNewSnmpVacmAccessTableEntry("all", "", 3, 0, 1, "all", "all", "all", 3);
   CreateAndAddSnmpVacmViewTreeFamilyTableEntry("all", "1.3", "", 1, 3);
   CreateLCDVacmAccessTable();

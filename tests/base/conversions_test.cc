@@ -8,12 +8,10 @@ namespace tessel {
 namespace {
 
 TEST(ConversionsTest, DecimalAndHexText) {
-  EXPECT_EQ(TextToInt("-12"), -12);
-  EXPECT_EQ(TextToInt("+7"), 7);
-  EXPECT_EQ(TextToInt("12a"), -1);
-  EXPECT_EQ(TextToInt(""), 0);
-  EXPECT_EQ(TextToInt("-2147483648"), INT32_MIN);
-  EXPECT_EQ(TextToInt("4294967306"), -1);  // refused, not wrapped to 10
+  const std::pair<const char*, std::int32_t> decimals[] = {
+      {"-12", -12},      {"+7", 7}, {"12a", -1}, {"", 0}, {"-2147483648", INT32_MIN},
+      {"4294967306", -1}};  // refused, not wrapped to 10
+  for (auto [text, value] : decimals) EXPECT_EQ(TextToInt(text), value) << text;
   EXPECT_EQ(HexTextToInt("1aF"), 0x1AF);
   EXPECT_EQ(HexTextToInt("xyz"), -1);
   EXPECT_EQ(IntToText(INT32_MIN), "-2147483648");
@@ -29,11 +27,8 @@ TEST(ConversionsTest, DottedTextToOid) {
   EXPECT_EQ(oid, (Oid{10, 0, 0, 1}));
   EXPECT_EQ(ParseDottedText(&oid, ".1.3.6.4294967295", false), 4);
   EXPECT_EQ(oid.back(), 4294967295u);
-  EXPECT_EQ(ParseDottedText(&oid, ".1..3", false), -1);
-  EXPECT_EQ(ParseDottedText(&oid, "1", false), -1);
-  EXPECT_EQ(ParseDottedText(&oid, ".1.3.", false), -1);
-  EXPECT_EQ(ParseDottedText(&oid, ".1.x", false), -1);
-  EXPECT_EQ(ParseDottedText(&oid, ".1.4294967296", false), -1);
+  for (const char* text : {".1..3", "1", ".1.3.", ".1.x", ".1.4294967296"})
+    EXPECT_EQ(ParseDottedText(&oid, text, false), -1) << text;
 }
 
 TEST(ConversionsTest, OidTextAndOrder) {

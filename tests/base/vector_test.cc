@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <numeric>
 #include <thread>
 #include <vector>
 
@@ -42,8 +43,8 @@ TEST_F(VectorTest, OrderedInsertionSortsAndRefusesDuplicates) {
     VectorNode* node = NewVectorNode((i * 37) % 101);
     if (!AddElement(&ordered_, node)) ++refused, delete node;
   }
-  std::vector<std::uint64_t> expected;
-  for (std::uint64_t v = 0; v < 101; ++v) expected.push_back(v);
+  std::vector<std::uint64_t> expected(101);
+  std::iota(expected.begin(), expected.end(), 0);
   EXPECT_EQ(Contents(&ordered_), expected);
   EXPECT_EQ(refused, 99);
   EXPECT_EQ(ordered_.count, 101);
@@ -70,27 +71,20 @@ TEST_F(VectorTest, PositionalOperationsRespectBounds) {
 }
 
 TEST_F(VectorTest, ConcurrentProducersAndConsumerLoseNothing) {
-  constexpr int kPerThread = 2000;
+  constexpr std::uint64_t kItems = 8000;  // 1 to 8000, from four producers
   std::vector<std::thread> producers;
-  for (int t = 0; t < 4; ++t) {
+  for (std::uint64_t t = 0; t < 4; ++t) {
     producers.emplace_back([this, t] {
-      for (int i = 0; i < kPerThread; ++i)
-        AddElement(&plain_, NewVectorNode(t * kPerThread + i + 1));
+      for (std::uint64_t i = 1; i <= kItems / 4; ++i)
+        AddElement(&plain_, NewVectorNode(t * kItems / 4 + i));
     });
   }
-  std::uint64_t sum = 0;
-  int taken = 0;
+  std::uint64_t sum = 0, payload = 0;
   auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-  while (taken < 4 * kPerThread && std::chrono::steady_clock::now() < deadline) {
-    std::uint64_t payload;
-    if (TakeFirstElement(&plain_, &payload)) {
-      sum += payload;
-      ++taken;
-    }
-  }
+  for (std::uint64_t taken = 0; taken < kItems && std::chrono::steady_clock::now() < deadline;)
+    if (TakeFirstElement(&plain_, &payload)) sum += payload, ++taken;
   for (auto& producer : producers) producer.join();
-  const std::uint64_t n = 4 * kPerThread;
-  EXPECT_EQ(sum, n * (n + 1) / 2);
+  EXPECT_EQ(sum, kItems * (kItems + 1) / 2);
   EXPECT_EQ(plain_.count, 0);
 }
 

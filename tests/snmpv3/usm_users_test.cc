@@ -15,61 +15,40 @@ TEST_F(UsmUsersTest, FindsUsersByEngineIdAndExactName) {
   ASSERT_EQ(AddUSMUserEntry("alice", "MD5_AUTH", "authpass1", "CBC_DES", "privpass1", "engA"), 1);
   ASSERT_EQ(AddUSMUserEntry("alice", "SHA_AUTH", "authpass1", "CFB_AES_128", "privpass1", "engB"),
             1);
-  std::optional<UsmUser> user = GetUsmEntry("engA", "alice");
-  ASSERT_TRUE(user);
-  EXPECT_EQ(user->securityName, "alice");
-  EXPECT_EQ(user->auth, AuthProtocol::kMd5);
-  EXPECT_EQ(user->priv, PrivProtocol::kDes);
-  EXPECT_EQ(user->securityLevel, kAuthPriv);
-  EXPECT_EQ(GetUsmEntry("engB", "alice")->auth, AuthProtocol::kSha);  // same name, other engine
-
-  EXPECT_FALSE(GetUsmEntry("engC", "alice"));
-  EXPECT_FALSE(GetUsmEntry("engA", "alic"));
-  EXPECT_FALSE(GetUsmEntry("eng", "Aalice"));  // engine ID and name do not run together
-
+  EXPECT_EQ(GetUsmEntry("engA", "alice").value().priv, PrivProtocol::kDes);
+  EXPECT_EQ(GetUsmEntry("engB", "alice").value().priv, PrivProtocol::kAes128);  // other engine
+  for (auto [engine, name] : {std::pair{"engC", "alice"}, {"engA", "alic"}, {"eng", "Aalice"}})
+    EXPECT_FALSE(GetUsmEntry(engine, name)) << engine << " " << name;
   FreeUsmUsers();
-  EXPECT_EQ(UsmUserCount(), 0u);
   EXPECT_FALSE(GetUsmEntry("engA", "alice"));
 }
 
-struct ProtocolCase {
-  const char* auth;
-  const char* priv;
-  int result;
-  std::uint8_t level;
-};
-
-TEST_F(UsmUsersTest, ProtocolNamesDecideLevelOrRefusal) {
-  const ProtocolCase cases[] = {
-      {"NO_AUTH", "NO_PRIV", 1, kNoAuthNoPriv},
-      {"SHA_AUTH", "NO_PRIV", 1, kAuthNoPriv},
-      {"MD5_AUTH", "CFB_AES_128", 1, kAuthPriv},
-      {"NO_AUTH", "CBC_DES", 0, 0},
-      {"md5_auth", "NO_PRIV", 0, 0},
-      {"MD5_AUTH", "AES", 0, 0},
-      {"SHA_AUTH", "CBC_DES ", 0, 0},
+TEST_F(UsmUsersTest, ProtocolNamesAndPasswordsDecideLevelOrRefusal) {
+  const struct {
+    const char *name, *auth, *authPassword, *priv, *privPassword;
+    int result;
+    std::uint8_t level;
+  } cases[] = {
+      {"a", "NO_AUTH", "", "NO_PRIV", "", 1, kNoAuthNoPriv},
+      {"b", "SHA_AUTH", "password1", "NO_PRIV", "", 1, kAuthNoPriv},
+      {"c", "MD5_AUTH", "password1", "CFB_AES_128", "password2", 1, kAuthPriv},
+      {"d", "NO_AUTH", "", "CBC_DES", "password2", 0, 0},  // privacy needs authentication
+      {"e", "md5_auth", "password1", "NO_PRIV", "", 0, 0},
+      {"f", "MD5_AUTH", "password1", "AES", "password2", 0, 0},
+      {"g", "SHA_AUTH", "password1", "CBC_DES ", "password2", 0, 0},
+      {"h", "MD5_AUTH", "", "NO_PRIV", "", 0, 0},
+      {"i", "SHA_AUTH", "password1", "CBC_DES", "", 0, 0},
+      {"b", "MD5_AUTH", "password2", "NO_PRIV", "", 0, 0},  // taken: the first one stays
   };
-  int n = 0;
-  for (const ProtocolCase& c : cases) {
-    std::string name = "user" + std::to_string(n++);
-    SCOPED_TRACE(name);
-    EXPECT_EQ(AddUSMUserEntry(name, c.auth, "password1", c.priv, "password2", "eng"), c.result);
-    std::optional<UsmUser> user = GetUsmEntry("eng", name);
-    ASSERT_EQ(user.has_value(), c.result == 1);
-    if (!user) continue;
-    EXPECT_EQ(user->securityLevel, c.level);
+  for (const auto& c : cases) {
+    SCOPED_TRACE(std::string(c.name) + " " + c.auth + " " + c.priv);
+    EXPECT_EQ(AddUSMUserEntry(c.name, c.auth, c.authPassword, c.priv, c.privPassword, "eng"),
+              c.result);
+    if (c.result != 1) continue;
+    EXPECT_EQ(GetUsmEntry("eng", c.name).value().securityLevel, c.level);
   }
   EXPECT_EQ(UsmUserCount(), 3u);
-}
-
-TEST_F(UsmUsersTest, RefusesMissingPasswordsAndDuplicates) {
-  EXPECT_EQ(AddUSMUserEntry("a", "MD5_AUTH", "", "NO_PRIV", "", "eng"), 0);
-  EXPECT_EQ(AddUSMUserEntry("b", "SHA_AUTH", "password1", "CBC_DES", "", "eng"), 0);
-  EXPECT_EQ(AddUSMUserEntry("c", "NO_AUTH", "", "NO_PRIV", "", "eng"), 1);
-  EXPECT_EQ(AddUSMUserEntry("d", "SHA_AUTH", "password1", "NO_PRIV", "", "eng"), 1);
-  EXPECT_EQ(AddUSMUserEntry("d", "MD5_AUTH", "password2", "NO_PRIV", "", "eng"), 0);
-  EXPECT_EQ(UsmUserCount(), 2u);
-  EXPECT_EQ(GetUsmEntry("eng", "d")->auth, AuthProtocol::kSha);  // the first one stays
+  EXPECT_EQ(GetUsmEntry("eng", "b").value().auth, AuthProtocol::kSha);
 }
 
 }  // namespace

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
+
 #include "base/clock.h"
 #include "engine/engine_state.h"
 #include "snmp/ber.h"
@@ -32,9 +34,7 @@ Bytes Container(std::uint8_t type, std::initializer_list<Bytes> parts) {
 Bytes Int(std::int32_t value) {
   Bytes out(8);
   std::int32_t room = 8;
-  out.resize(
-      static_cast<std::size_t>(AsnBuildInt(out.data(), &room, kAsnInteger, value) - out.data()));
-  return out;
+  return Bytes(out.data(), AsnBuildInt(out.data(), &room, kAsnInteger, value));
 }
 Bytes Str(const std::string& value) {
   Bytes out(value.size() + 2, static_cast<std::uint8_t>(value.size()));
@@ -44,7 +44,6 @@ Bytes Str(const std::string& value) {
 }
 
 struct V3Request {
-  std::int32_t msgId = 77;
   std::int32_t maxSize = 1500;
   std::uint8_t flags = 0x04;
   std::int32_t securityModel = 3;
@@ -73,19 +72,18 @@ Tlv Field(const std::vector<std::uint8_t>& bytes, std::size_t at) {
 
 // An SNMPv3 GetRequest for one name, authenticated when the request says so.
 std::vector<std::uint8_t> Encode(const V3Request& r) {
-  Request get;  // its PDU, behind the version and community of a v2c message
+  Request get;  // its PDU, behind the header, version and community of a v2c message
   get.requestId = 4242;
   get.bindings = {{r.name, VarValue::Empty(kAsnNull)}};
   Bytes v2c = EncodeRequest(get);
-  Bytes pdu(v2c.begin() + static_cast<std::ptrdiff_t>(Field(v2c, Field(v2c, 4).end).end),
-            v2c.end());
+  Bytes pdu(v2c.begin() + 4 + 3 + 2 + static_cast<std::ptrdiff_t>(get.community.size()), v2c.end());
 
   const Bytes digest = Str(std::string(r.authKey.empty() ? 0 : 12, '\0'));
   Bytes m = Container(
       kAsnSequence,
       {Int(3),
        Container(kAsnSequence,
-                 {Int(r.msgId), Int(r.maxSize), Str(std::string(1, static_cast<char>(r.flags))),
+                 {Int(77), Int(r.maxSize), Str(std::string(1, static_cast<char>(r.flags))),
                   Int(r.securityModel)}),
        Container(
            kAsnOctetString,
@@ -148,14 +146,14 @@ class V3MessageTest : public SnmpAgentTest {
 
   // Processes a v3 message; the reply's scoped PDU parsed (only for unencrypted replies).
   std::optional<SnmpPdu> Exchange3(const std::vector<std::uint8_t>& datagram) {
-    std::vector<std::uint8_t> reply(kMaxSnmpMessage);
-    std::size_t length = reply.size();
-    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply.data(), &length, agent_) !=
+    reply_.assign(kMaxSnmpMessage, 0);
+    std::size_t length = reply_.size();
+    if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply_.data(), &length, agent_) !=
         kMessageReply) {
       return std::nullopt;
     }
-    reply.resize(length);
-    reply_ = reply;
+    reply_.resize(length);
+    const Bytes& reply = reply_;
     std::size_t global = Field(reply, Field(reply, 0).contents).end;  // behind msgVersion
     replyFlags_ = reply[Field(reply, global).end - 4];  // msgGlobalData ends: flags, 02 01 03
     Tlv scoped = Field(reply, Field(reply, Field(reply, global).end).end);
@@ -168,76 +166,57 @@ class V3MessageTest : public SnmpAgentTest {
     return parsed;
   }
 
-  // The name the Report for this request carries, empty when no Report came back.
-  Oid ReportedName(const V3Request& request) {
-    auto report = Exchange3(Encode(request));
-    if (!report || report->type != kReport || report->requestVarBinds.empty()) return {};
-    return report->requestVarBinds[0].name;
-  }
-
   std::string engineId_;
   std::uint32_t engineTime_ = 0;
   std::vector<std::uint8_t> reply_;
   std::uint8_t replyFlags_ = 0xFF;
 };
 
-TEST_F(V3MessageTest, DiscoveryIsAnsweredWithTheAgentsEngineId) {
-  V3Request discovery;
-  discovery.name = O("1.3.6.1.2.1.1.5.0");
-  auto report = Exchange3(Encode(discovery));
-  ASSERT_TRUE(report);
-  EXPECT_EQ(report->type, kReport);
-  EXPECT_EQ(report->requestId, 4242);
-  ASSERT_EQ(report->requestVarBinds.size(), 1u);
-  EXPECT_EQ(report->requestVarBinds[0].name, O("1.3.6.1.6.3.15.1.1.4.0"));
-  EXPECT_EQ(report->requestVarBinds[0].value, VarValue::Unsigned(kAsnCounter, 1));
-  std::string text(reply_.begin(), reply_.end());
-  EXPECT_NE(text.find(engineId_), std::string::npos);
-}
-
 TEST_F(V3MessageTest, SecurityErrorsGetTheirReports) {
-  V3Request unknown = Authenticated();
-  unknown.user = "mallory";
-  EXPECT_EQ(ReportedName(unknown), O("1.3.6.1.6.3.15.1.1.3.0"));
-  V3Request wrongKey = Authenticated();
-  wrongKey.authKey = GetLocalKeyValue("wrongpassword", AuthProtocol::kMd5, engineId_);
-  EXPECT_EQ(ReportedName(wrongKey), O("1.3.6.1.6.3.15.1.1.5.0"));
-  V3Request tooHigh = Authenticated();
-  tooHigh.flags = 0x07;
-  EXPECT_EQ(ReportedName(tooHigh), O("1.3.6.1.6.3.15.1.1.1.0"));
-  V3Request stale = Authenticated();
-  stale.time += 152;
-  EXPECT_EQ(ReportedName(stale), O("1.3.6.1.6.3.15.1.1.2.0"));
-  V3Request otherBoots = Authenticated();
-  otherBoots.boots = 4;
-  EXPECT_EQ(ReportedName(otherBoots), O("1.3.6.1.6.3.15.1.1.2.0"));
-  otherBoots.boots = 2147483647;
-  EXPECT_EQ(ReportedName(otherBoots), O("1.3.6.1.6.3.15.1.1.2.0"));
-  // That Report is authenticated and tells this engine's boots, so that the manager can resync.
+  const std::string wrongKey = GetLocalKeyValue("wrongpassword", AuthProtocol::kMd5, engineId_);
+  const struct {
+    const char* what;
+    std::function<void(V3Request&)> change;
+    std::uint32_t statsColumn, count;  // usmStats.<column>.0 and its value
+  } cases[] = {
+      {"discovery", [](V3Request& r) { r.engineId = r.user = r.authKey = "", r.flags = 4; }, 4, 1},
+      {"unknown user", [](V3Request& r) { r.user = "mallory"; }, 3, 1},
+      {"wrong digest", [&](V3Request& r) { r.authKey = wrongKey; }, 5, 1},
+      {"level above the user's", [](V3Request& r) { r.flags = 0x07; }, 1, 1},
+      {"time outside the window", [](V3Request& r) { r.time += 152; }, 2, 1},
+      {"other boots", [](V3Request& r) { r.boots = 4; }, 2, 2},
+      {"latched boots", [&](V3Request& r) { r.boots = agent_.agentInfo->engineBoots = 2147483647; },
+       2, 3},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.what);
+    V3Request request = Authenticated();
+    c.change(request);
+    auto report = Exchange3(Encode(request));
+    ASSERT_TRUE(report && report->type == kReport && report->requestVarBinds.size() == 1);
+    EXPECT_EQ(report->requestId, 4242);
+    EXPECT_EQ(report->requestVarBinds[0].name, (Oid{1, 3, 6, 1, 6, 3, 15, 1, 1, c.statsColumn, 0}));
+    EXPECT_EQ(report->requestVarBinds[0].value, VarValue::Unsigned(kAsnCounter, c.count));
+    EXPECT_NE(std::string(reply_.begin(), reply_.end()).find(engineId_), std::string::npos);
+  }
+  // The last Report is authenticated and tells this engine's boots, so that the manager can resync.
   EXPECT_EQ(replyFlags_ & 0x03, 0x01);
   std::string text(reply_.begin(), reply_.end());
-  EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 3), "\x02\x01\x03");
-  stale.time -= 152 + 149;
-  auto inWindow = Exchange3(Encode(stale));
-  ASSERT_TRUE(inWindow);
-  EXPECT_EQ(inWindow->type, kGetResponse);
+  EXPECT_EQ(text.substr(text.find(engineId_) + engineId_.size(), 6), "\x02\x04\x7f\xff\xff\xff");
 }
 
 TEST_F(V3MessageTest, AuthenticatedRequestsAreAnsweredWithinTheirView) {
-  auto reply = Exchange3(Encode(Authenticated()));
+  V3Request request = Authenticated();
+  request.time -= 149;  // still within the time window
+  auto reply = Exchange3(Encode(request));
   ASSERT_TRUE(reply);
   EXPECT_EQ(reply->type, kGetResponse);
   EXPECT_EQ(reply->requestVarBinds.at(0).value, VarValue::Octets(kAsnOctetString, "r1"));
-  V3Request outside = Authenticated();
-  outside.name = O("1.3.6.1.2.1.2.2.1.2.1");
-  auto refused = Exchange3(Encode(outside));
-  ASSERT_TRUE(refused);
-  EXPECT_EQ(refused->errorStatus, kAuthorizationError);
-  V3Request unknownContext = Authenticated();
-  unknownContext.context = "other";
-  refused = Exchange3(Encode(unknownContext));
-  ASSERT_TRUE(refused);
-  EXPECT_EQ(refused->errorStatus, kAuthorizationError);
+  request.name = O("1.3.6.1.2.1.2.2.1.2.1");
+  EXPECT_EQ(Exchange3(Encode(request)).value().errorStatus, kAuthorizationError);
+  request = Authenticated();
+  request.context = "other";
+  EXPECT_EQ(Exchange3(Encode(request)).value().errorStatus, kAuthorizationError);
 }
 
 TEST_F(V3MessageTest, InvalidMessagesAreDroppedAndCounted) {
@@ -309,13 +288,9 @@ TEST_F(V3MessageTest, EngineObjectsAreServedByTheEngineAndReadOnly) {
   EXPECT_NEAR(values[2].AsInt32(), engineTime_, 1);
   EXPECT_EQ(values[3], VarValue::Integer(19989));
   EXPECT_EQ(values[9], VarValue::Unsigned(kAsnCounter, 1));  // usmStatsUnknownUserNames
-  Request set;
-  set.type = kSetRequest;
-  set.community = "private";
-  set.bindings = {{O("1.3.6.1.6.3.10.2.1.2.0"), VarValue::Integer(9)}};
-  auto reply = Send(set);
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->errorStatus, kNotWritable);
+  next.type = kSetRequest, next.community = "private";
+  next.bindings = {{O("1.3.6.1.6.3.10.2.1.2.0"), VarValue::Integer(9)}};
+  EXPECT_EQ(Send(next).value().errorStatus, kNotWritable);
 }
 
 }  // namespace
