@@ -2,9 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <memory>
-
-#include "engine/agent.h"
 #include "snmp/pdu.h"
 #include "support/memory_host.h"
 
@@ -13,27 +10,13 @@ namespace {
 
 using namespace std::string_literals;
 
-// Keeps the last read query, and can answer a table GetNext with a fixed answer.
-class RecordingHost : public MemoryHost {
+// Can answer a table GetNext with a fixed answer in place of its stored objects.
+class FixedNextHost : public MemoryHost {
  public:
-  HostAnswer ScalarGetOidVal(const HostValueQuery& query) override {
-    last = query;
-    return MemoryHost::ScalarGetOidVal(query);
-  }
-  HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) override {
-    last = query;
-    return MemoryHost::ScalarGetNextOidVal(query);
-  }
-  HostAnswer TableGetOidVal(const HostValueQuery& query) override {
-    last = query;
-    return MemoryHost::TableGetOidVal(query);
-  }
   HostAnswer TableGetNextOidVal(const HostValueQuery& query) override {
-    last = query;
-    return fixedNext ? *fixedNext : MemoryHost::TableGetNextOidVal(query);
+    HostAnswer stored = MemoryHost::TableGetNextOidVal(query);
+    return fixedNext ? *fixedNext : stored;
   }
-
-  HostValueQuery last;
   std::optional<HostAnswer> fixedNext;
 };
 
@@ -50,13 +33,6 @@ class HandlersTest : public ::testing::Test {
  protected:
   void SetUp() override {
     InstallHost(&host_);
-    agent_.transport.localAddress = "127.0.0.1";
-    agent_.transport.configuredPortMinusOne = 160;
-    agent_.agentInfo = std::make_shared<AgentInfo>();
-    agent_.agentInfo->databaseName = "db";
-    agent_.agentInfo->tableName = "devices";
-    agent_.agentInfo->agentId = 7;
-
     system_.label = "system";
     system_.oid = {1, 3, 6, 1, 2, 1, 1, 1};
     system_.subIds = {1, 3, 5};
@@ -73,13 +49,19 @@ class HandlersTest : public ::testing::Test {
   }
   void TearDown() override { InstallHost(nullptr); }
 
+  std::optional<VarValue> ScalarRead(std::uint8_t type, Oid oid) {
+    return ScalarProcessReadReq(type, &oid, &errorCode_, {&agent_, &system_});
+  }
+  std::optional<VarValue> TableRead(std::uint8_t type, Oid* oid) {
+    return TableProcessReadReq(type, oid, &errorCode_, {&agent_, &table_});
+  }
   std::optional<VarValue> Set(const Oid& oid, const VarValue& value) {
     return TableProcessWriteReq(oid, value, &errorCode_, {&agent_, &table_});
   }
   std::string SentText() const { return host_.SetCalls().back().valueText; }
 
-  RecordingHost host_;
-  AgentSession agent_;
+  FixedNextHost host_;
+  AgentSession agent_ = LocalAgent(7);
   TreeCell system_;
   TreeCell table_;
   std::uint8_t errorCode_ = 0xEE;
@@ -87,11 +69,10 @@ class HandlersTest : public ::testing::Test {
 
 TEST_F(HandlersTest, ScalarGetAsksForTheGroupAndInstanceZero) {
   host_.SetValue("1.3.6.1.2.1.1.3.0", "12345");
-  Oid oid = {1, 3, 6, 1, 2, 1, 1, 3, 0};
-  EXPECT_EQ(ScalarProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &system_}),
+  EXPECT_EQ(ScalarRead(kGetRequest, {1, 3, 6, 1, 2, 1, 1, 3, 0}),
             VarValue::Unsigned(kAsnTimeTicks, 12345));
   EXPECT_EQ(errorCode_, 0);
-  const HostValueQuery& query = host_.last;
+  const HostValueQuery query = host_.LastRead();
   EXPECT_EQ(query.label, "system");
   EXPECT_EQ(query.objectOid, ".1.3.6.1.2.1.1");
   EXPECT_EQ(query.subId, "3");
@@ -101,22 +82,19 @@ TEST_F(HandlersTest, ScalarGetAsksForTheGroupAndInstanceZero) {
   EXPECT_EQ(query.agentPort, 161);  // the configured port
   EXPECT_EQ(query.agentAddress, "127.0.0.1");
   EXPECT_EQ(query.databaseName, "db");
-  EXPECT_EQ(query.tableName, "devices");
+  EXPECT_EQ(query.tableName, "agent1");
   EXPECT_EQ(query.agentId, 7);
 }
 
 TEST_F(HandlersTest, ScalarMissingValues) {
-  Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
-  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}),
-            std::nullopt);
+  const Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
+  EXPECT_EQ(ScalarRead(kGetNextRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
-  EXPECT_EQ(host_.last.previousSubId, "3");
+  EXPECT_EQ(host_.LastRead().previousSubId, "3");
   host_.SetError("1.3.6.1.2.1.1.5.0", "5");
-  EXPECT_EQ(ScalarProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &system_}),
-            std::nullopt);
+  EXPECT_EQ(ScalarRead(kGetRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kReadOnly);  // a Get keeps the host's code
-  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}),
-            std::nullopt);
+  EXPECT_EQ(ScalarRead(kGetNextRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
 }
 
@@ -134,36 +112,33 @@ TEST_F(HandlersTest, ScalarSetTellsTheStoredPortAndRepeatsTheValue) {
 TEST_F(HandlersTest, TableGetAsksForTheEntryColumnAndInstance) {
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.10.0.0.1.161", "-5");
   Oid oid = Column(2, {10, 0, 0, 1, 161});
-  EXPECT_EQ(TableProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &table_}),
-            VarValue::Integer(-5));
+  EXPECT_EQ(TableRead(kGetRequest, &oid), VarValue::Integer(-5));
   EXPECT_EQ(errorCode_, 0);
-  EXPECT_EQ(host_.last.instance, ".10.0.0.1.161");
-  EXPECT_EQ(host_.last.objectOid, ".1.3.6.1.2.1.2.2.1");
-  EXPECT_EQ(host_.last.subId, "2");
+  EXPECT_EQ(host_.LastRead().instance, ".10.0.0.1.161");
+  EXPECT_EQ(host_.LastRead().objectOid, ".1.3.6.1.2.1.2.2.1");
+  EXPECT_EQ(host_.LastRead().subId, "2");
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.10.0.0.1.161", "3000000000");  // does not convert
-  EXPECT_EQ(TableProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &table_}), std::nullopt);
+  EXPECT_EQ(TableRead(kGetRequest, &oid), std::nullopt);
   EXPECT_EQ(errorCode_, kGenErr);
 }
 
 TEST_F(HandlersTest, TableGetNextFollowsTheHostAnswer) {
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.3", "7");
   Oid oid = Column(2);
-  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
-            VarValue::Integer(7));
+  EXPECT_EQ(TableRead(kGetNextRequest, &oid), VarValue::Integer(7));
   EXPECT_EQ(errorCode_, 0);
   EXPECT_EQ(oid, Column(2, {3}));
-  EXPECT_EQ(host_.last.instance, std::nullopt);
-  EXPECT_EQ(host_.last.column, 2);
-  EXPECT_EQ(host_.last.nextColumn, 3);
-  EXPECT_EQ(host_.last.nextDataType, kAsnCounter64);
-  EXPECT_EQ(host_.last.agentPort, 161);
+  EXPECT_EQ(host_.LastRead().instance, std::nullopt);
+  EXPECT_EQ(host_.LastRead().column, 2);
+  EXPECT_EQ(host_.LastRead().nextColumn, 3);
+  EXPECT_EQ(host_.LastRead().nextDataType, kAsnCounter64);
+  EXPECT_EQ(host_.LastRead().agentPort, 161);
 
   oid = Column(6, {1});  // last column: nothing after it, and the host has nothing
-  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
-            std::nullopt);
+  EXPECT_EQ(TableRead(kGetNextRequest, &oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
-  EXPECT_EQ(host_.last.nextColumn, -1);
-  EXPECT_EQ(host_.last.nextDataType, 0);
+  EXPECT_EQ(host_.LastRead().nextColumn, -1);
+  EXPECT_EQ(host_.LastRead().nextDataType, 0);
 }
 
 TEST_F(HandlersTest, TableGetNextRefusesUnusableAnswers) {
@@ -177,8 +152,7 @@ TEST_F(HandlersTest, TableGetNextRefusesUnusableAnswers) {
   for (const HostAnswer& answer : answers) {
     host_.fixedNext = answer;
     Oid oid = Column(2, {3});
-    EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
-              std::nullopt);
+    EXPECT_EQ(TableRead(kGetNextRequest, &oid), std::nullopt);
     EXPECT_EQ(errorCode_, kNoSuchInstance);
     EXPECT_EQ(oid, Column(2, {3}));
   }

@@ -27,6 +27,7 @@ class MemoryHost : public HostBridge {
   std::string ValueOf(const std::string& oidText) const;
   std::vector<std::string> StatusLines() const;
   std::vector<HostValueQuery> SetCalls() const;
+  HostValueQuery LastRead() const;  // the query of the last Get or GetNext
 
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
@@ -45,13 +46,14 @@ class MemoryHost : public HostBridge {
   static Oid ToOid(const std::string& oidText);
   // The object a scalar or exact table call names: object OID, sub-identifier, instance.
   static Oid KeyOf(const HostValueQuery& query);
-  HostAnswer Answer(const Oid& oid);
+  HostAnswer Answer(const HostValueQuery& query);
   HostAnswer Store(const Oid& oid, const HostValueQuery& query);
 
   mutable std::mutex mutex_;
   std::map<Oid, Entry> objects_;
   std::vector<std::string> statusLines_;
   std::vector<HostValueQuery> setCalls_;
+  HostValueQuery lastRead_;
 };
 
 // The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community
