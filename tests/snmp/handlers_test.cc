@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <tuple>
+
 #include "snmp/pdu.h"
 #include "support/memory_host.h"
 
@@ -72,18 +74,12 @@ TEST_F(HandlersTest, ScalarGetAsksForTheGroupAndInstanceZero) {
   EXPECT_EQ(ScalarRead(kGetRequest, {1, 3, 6, 1, 2, 1, 1, 3, 0}),
             VarValue::Unsigned(kAsnTimeTicks, 12345));
   EXPECT_EQ(errorCode_, 0);
-  const HostValueQuery query = host_.LastRead();
-  EXPECT_EQ(query.label, "system");
-  EXPECT_EQ(query.objectOid, ".1.3.6.1.2.1.1");
-  EXPECT_EQ(query.subId, "3");
-  EXPECT_EQ(query.instance, ".0");
-  EXPECT_EQ(query.dataType, kAsnTimeTicks);
-  EXPECT_EQ(query.syntax, std::nullopt);
-  EXPECT_EQ(query.agentPort, 161);  // the configured port
-  EXPECT_EQ(query.agentAddress, "127.0.0.1");
-  EXPECT_EQ(query.databaseName, "db");
-  EXPECT_EQ(query.tableName, "agent1");
-  EXPECT_EQ(query.agentId, 7);
+  const HostValueQuery q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.label, q.objectOid, q.subId, q.instance, q.dataType, q.syntax),
+            std::tuple("system", ".1.3.6.1.2.1.1", "3", ".0", kAsnTimeTicks, std::nullopt));
+  // The configured port is the stored one plus one.
+  EXPECT_EQ(std::tie(q.agentPort, q.agentAddress, q.databaseName, q.tableName, q.agentId),
+            std::tuple(161, "127.0.0.1", "db", "agent1", 7));
 }
 
 TEST_F(HandlersTest, ScalarMissingValues) {
@@ -103,8 +99,8 @@ TEST_F(HandlersTest, ScalarSetTellsTheStoredPortAndRepeatsTheValue) {
   VarValue name = VarValue::Octets(kAsnOctetString, "AB");
   EXPECT_EQ(ScalarProcessWriteReq(oid, name, &errorCode_, {&agent_, &system_}), name);
   EXPECT_EQ(errorCode_, 0);
-  EXPECT_EQ(host_.SetCalls().back().agentPort, 160);
-  EXPECT_EQ(host_.SetCalls().back().instance, ".0");
+  EXPECT_EQ(std::tie(host_.SetCalls().back().agentPort, host_.SetCalls().back().instance),
+            std::tuple(160, ".0"));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "AB");
 }
 
@@ -114,9 +110,9 @@ TEST_F(HandlersTest, TableGetAsksForTheEntryColumnAndInstance) {
   Oid oid = Column(2, {10, 0, 0, 1, 161});
   EXPECT_EQ(TableRead(kGetRequest, &oid), VarValue::Integer(-5));
   EXPECT_EQ(errorCode_, 0);
-  EXPECT_EQ(host_.LastRead().instance, ".10.0.0.1.161");
-  EXPECT_EQ(host_.LastRead().objectOid, ".1.3.6.1.2.1.2.2.1");
-  EXPECT_EQ(host_.LastRead().subId, "2");
+  const HostValueQuery q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.instance, q.objectOid, q.subId),
+            std::tuple(".10.0.0.1.161", ".1.3.6.1.2.1.2.2.1", "2"));
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.10.0.0.1.161", "3000000000");  // does not convert
   EXPECT_EQ(TableRead(kGetRequest, &oid), std::nullopt);
   EXPECT_EQ(errorCode_, kGenErr);
@@ -128,17 +124,15 @@ TEST_F(HandlersTest, TableGetNextFollowsTheHostAnswer) {
   EXPECT_EQ(TableRead(kGetNextRequest, &oid), VarValue::Integer(7));
   EXPECT_EQ(errorCode_, 0);
   EXPECT_EQ(oid, Column(2, {3}));
-  EXPECT_EQ(host_.LastRead().instance, std::nullopt);
-  EXPECT_EQ(host_.LastRead().column, 2);
-  EXPECT_EQ(host_.LastRead().nextColumn, 3);
-  EXPECT_EQ(host_.LastRead().nextDataType, kAsnCounter64);
-  EXPECT_EQ(host_.LastRead().agentPort, 161);
+  HostValueQuery q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.instance, q.column, q.nextColumn, q.nextDataType, q.agentPort),
+            std::tuple(std::nullopt, 2, 3, kAsnCounter64, 161));
 
   oid = Column(6, {1});  // last column: nothing after it, and the host has nothing
   EXPECT_EQ(TableRead(kGetNextRequest, &oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
-  EXPECT_EQ(host_.LastRead().nextColumn, -1);
-  EXPECT_EQ(host_.LastRead().nextDataType, 0);
+  q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.nextColumn, q.nextDataType), std::tuple(-1, 0));
 }
 
 TEST_F(HandlersTest, TableGetNextRefusesUnusableAnswers) {
@@ -163,9 +157,8 @@ TEST_F(HandlersTest, TableSetSendsTheColumnTextAndRepeatsTheValue) {
   EXPECT_EQ(Set(Column(5, {5}), mac), mac);  // by the column's syntax
   EXPECT_EQ(errorCode_, 0);
   EXPECT_EQ(SentText(), "00:1a:2b:3c:4d:5e");
-  EXPECT_EQ(host_.SetCalls().back().instance, ".5");
-  EXPECT_EQ(host_.SetCalls().back().subId, "5");
-  EXPECT_EQ(host_.SetCalls().back().agentPort, 160);
+  const HostValueQuery sent = host_.SetCalls().back();
+  EXPECT_EQ(std::tie(sent.instance, sent.subId, sent.agentPort), std::tuple(".5", "5", 160));
   EXPECT_EQ(Set(Column(2, {5}), VarValue::Octets(kAsnOctetString, "A")), std::nullopt);
   EXPECT_EQ(errorCode_, kWrongType);
   EXPECT_EQ(Set(Column(2), VarValue::Integer(1)), std::nullopt);
