@@ -9,21 +9,31 @@ namespace {
 
 class PduProcessingTest : public SnmpAgentTest {
  protected:
-  // One GetNext per step from `from`, as a manager's walk does; the names answered.
-  std::vector<std::string> Walk(std::int32_t version, const std::string& from) {
+  // A request of the given type that names each OID with a NULL value.
+  static Request Of(std::uint8_t type, std::vector<std::string> oids,
+                    std::int32_t version = kSnmpV2c) {
+    Request request;
+    request.version = version;
+    request.type = type;
+    for (const std::string& oid : oids)
+      request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
+    return request;
+  }
+  static std::vector<std::string> Names(const SnmpPdu& reply) {
     std::vector<std::string> names;
-    Oid next = O(from);
+    for (const VarBind& binding : reply.requestVarBinds)
+      names.push_back(OidToPlainText(binding.name));
+    return names;
+  }
+
+  // One GetNext per step from `from`, as a manager's walk does; the names answered.
+  std::vector<std::string> Walk(std::int32_t version, std::string from) {
+    std::vector<std::string> names;
     for (int step = 0; step < 100; ++step) {
-      Request request;
-      request.version = version;
-      request.type = kGetNextRequest;
-      request.bindings = {{next, VarValue::Empty(kAsnNull)}};
-      auto reply = Send(request);
+      auto reply = Send(Of(kGetNextRequest, {from}, version));
       if (!reply || reply->errorStatus != 0) break;
-      const VarBind& answer = reply->requestVarBinds.at(0);
-      if (answer.value.type == kEndOfMibView) break;
-      names.push_back(OidToPlainText(answer.name));
-      next = answer.name;
+      if (reply->requestVarBinds.at(0).value.type == kEndOfMibView) break;
+      names.push_back(from = Names(*reply).at(0));
     }
     return names;
   }
@@ -39,12 +49,9 @@ class PduProcessingTest : public SnmpAgentTest {
 
   SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions,
                std::vector<std::string> oids) {
-    Request request;
-    request.type = kGetBulkRequest;
+    Request request = Of(kGetBulkRequest, oids);
     request.field1 = nonRepeaters;
     request.field2 = maxRepetitions;
-    for (const std::string& oid : oids)
-      request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
     auto reply = Send(request);
     EXPECT_TRUE(reply);
     return reply.value_or(SnmpPdu{});
@@ -73,10 +80,7 @@ TEST_F(PduProcessingTest, WalkVisitsEveryObjectInOrderAcrossCellsAndColumns) {
 }
 
 TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
-  Request request;
-  request.type = kGetNextRequest;
-  request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.31.1.1.1.6.2"), VarValue::Empty(kAsnNull)}};
+  Request request = Of(kGetNextRequest, {"1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.31.1.1.1.6.2"});
   auto v2 = Send(request);
   ASSERT_TRUE(v2);
   EXPECT_EQ(v2->errorStatus, 0);
@@ -91,11 +95,8 @@ TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
 }
 
 TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
-  Request request;
-  request.bindings = {{O("1.3.6.1.2.1.1.3.0"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.1.9.0"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.2.2.1.2.7"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.31.1.1.1.6.1"), VarValue::Empty(kAsnNull)}};
+  Request request = Of(kGetRequest, {"1.3.6.1.2.1.1.3.0", "1.3.6.1.2.1.1.9.0",
+                                     "1.3.6.1.2.1.2.2.1.2.7", "1.3.6.1.2.1.31.1.1.1.6.1"});
   auto v2 = Send(request);
   ASSERT_TRUE(v2);
   ASSERT_EQ(v2->requestVarBinds.size(), 4u);
@@ -116,18 +117,14 @@ TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
   StoreTreeCellsRefInArray();
   host_.SetValue("1.3.6.1.4.1.5.1.0", "1");
   host_.SetValue("1.3.6.1.4.1.5.2.0", "2");
-  Request get;
-  get.bindings = {{O("1.3.6.1.4.1.5.1.0"), VarValue::Empty(kAsnNull)}};
+  Request get = Of(kGetRequest, {"1.3.6.1.4.1.5.1.0"});
   EXPECT_EQ(Send(get)->errorStatus, kNoAccess);
   get.version = kSnmpV1;
   EXPECT_EQ(Send(get)->errorStatus, kNoSuchName);
   // A walk steps over the column that is not accessible.
   EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.4.1.5").front(), "1.3.6.1.4.1.5.2.0");
 
-  Request set;
-  set.type = kSetRequest;
-  set.community = "private";
-  set.bindings = {{O("1.3.6.1.4.1.5.2.0"), VarValue::Integer(9)}};
+  Request set = SetOf(kSnmpV2c, {{O("1.3.6.1.4.1.5.2.0"), VarValue::Integer(9)}});
   auto written = Send(set);
   ASSERT_TRUE(written);
   EXPECT_EQ(written->errorStatus, 0);
@@ -183,13 +180,10 @@ TEST_F(PduProcessingTest, SetRestoresEarlierWritesWhenTheHostRefusesALaterOne) {
 
 TEST_F(PduProcessingTest, GetBulkRepeatsTheRepeatersAfterTheNonRepeaters) {
   SnmpPdu reply = Bulk(1, 3, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1", "1.3.6.1.2.1.2.2.1.2"});
-  std::vector<std::string> names;
-  for (const VarBind& binding : reply.requestVarBinds)
-    names.push_back(OidToPlainText(binding.name));
-  EXPECT_EQ(names, (std::vector<std::string>{"1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1",
-                                             "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.1.2",
-                                             "1.3.6.1.2.1.2.2.1.2.2", "1.3.6.1.2.1.2.2.1.2.1",
-                                             "1.3.6.1.2.1.2.2.1.10.1"}));
+  EXPECT_EQ(Names(reply), (std::vector<std::string>{
+                              "1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1", "1.3.6.1.2.1.2.2.1.2.1",
+                              "1.3.6.1.2.1.2.2.1.1.2", "1.3.6.1.2.1.2.2.1.2.2",
+                              "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.10.1"}));
   EXPECT_EQ(Bulk(1, 0, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 1u);
   EXPECT_EQ(Bulk(-5, -1, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 0u);
   EXPECT_EQ(Bulk(-5, 2, {"1.3.6.1.2.1.1.1"}).requestVarBinds.size(), 2u);
@@ -209,10 +203,9 @@ TEST_F(PduProcessingTest, GetBulkReplyIsTrimmedOnlyAtItsEnd) {
   ASSERT_LT(reply.requestVarBinds.size(), 399u);
   EXPECT_LE(lastReply_.size(), kMaxSnmpMessage);
   EXPECT_GT(lastReply_.size(), kMaxSnmpMessage - 200);
-  for (std::size_t i = 0; i < reply.requestVarBinds.size(); ++i) {
-    EXPECT_EQ(OidToPlainText(reply.requestVarBinds[i].name),
-              "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
-  }
+  std::vector<std::string> rows = Names(reply);
+  for (std::size_t i = 0; i < rows.size(); ++i)
+    EXPECT_EQ(rows[i], "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
 }
 
 }  // namespace
