@@ -92,6 +92,22 @@ TEST_F(HandlersTest, ScalarMissingValues) {
   EXPECT_EQ(errorCode_, kReadOnly);  // a Get keeps the host's code
   EXPECT_EQ(ScalarRead(kGetNextRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
+  // An error is a plain number in the host's list; any other text is genErr.
+  const std::pair<const char*, int> errors[] = {
+      {"1", kNoSuchObject}, {"6", kGenErr}, {"abc", kGenErr}, {"017", kGenErr}};
+  for (auto [text, code] : errors) {
+    host_.SetError("1.3.6.1.2.1.1.5.0", text);
+    EXPECT_EQ(ScalarRead(kGetRequest, oid), std::nullopt);
+    EXPECT_EQ(errorCode_, code) << text;
+  }
+  // A null value, or no host at all, is no such instance.
+  host_.SetNullValue("1.3.6.1.2.1.1.5.0");
+  for (HostBridge* host : {static_cast<HostBridge*>(&host_), static_cast<HostBridge*>(nullptr)}) {
+    InstallHost(host);
+    errorCode_ = 0;
+    EXPECT_EQ(ScalarRead(kGetRequest, oid), std::nullopt);
+    EXPECT_EQ(errorCode_, kNoSuchInstance);
+  }
 }
 
 TEST_F(HandlersTest, ScalarSetTellsTheStoredPortAndRepeatsTheValue) {
