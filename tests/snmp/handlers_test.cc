@@ -101,7 +101,7 @@ TEST_F(HandlersTest, ScalarMissingValues) {
     EXPECT_EQ(errorCode_, code) << text;
   }
   // A null value, or no host at all, is no such instance.
-  host_.SetNullValue("1.3.6.1.2.1.1.5.0");
+  host_.SetValue("1.3.6.1.2.1.1.5.0", std::nullopt);
   for (HostBridge* host : {static_cast<HostBridge*>(&host_), static_cast<HostBridge*>(nullptr)}) {
     InstallHost(host);
     errorCode_ = 0;

@@ -14,9 +14,9 @@ Oid MemoryHost::KeyOf(const HostValueQuery& query) {
   return ToOid(query.objectOid + "." + query.subId + query.instance.value_or(""));
 }
 
-void MemoryHost::SetValue(const std::string& oidText, const std::string& valueText) {
+void MemoryHost::SetValue(const std::string& oidText, std::optional<std::string> valueText) {
   std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{valueText, "-1", std::nullopt};
+  objects_[ToOid(oidText)] = Entry{std::move(valueText), "-1", std::nullopt};
 }
 
 void MemoryHost::SetError(const std::string& oidText, const std::string& errorText) {
@@ -24,11 +24,6 @@ void MemoryHost::SetError(const std::string& oidText, const std::string& errorTe
   Entry& entry = objects_[ToOid(oidText)];
   if (!entry.value) entry.value = "x";
   entry.error = errorText;
-}
-
-void MemoryHost::SetNullValue(const std::string& oidText) {
-  std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1", std::nullopt};
 }
 
 void MemoryHost::RefuseWrite(const std::string& oidText, const std::string& valueText) {

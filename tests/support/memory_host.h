@@ -16,12 +16,10 @@ namespace tessel {
 
 class MemoryHost : public HostBridge {
  public:
-  // oidText is dotted, with or without a leading dot.
-  void SetValue(const std::string& oidText, const std::string& valueText);
+  // oidText is dotted, with or without a leading dot; a value of nullopt is answered as null.
+  void SetValue(const std::string& oidText, std::optional<std::string> valueText);
   // The object answers [value, errorText] (its value, or "x" when it has none).
   void SetError(const std::string& oidText, const std::string& errorText);
-  // The object answers a null value.
-  void SetNullValue(const std::string& oidText);
   // A write of exactly valueText to the object is refused with genErr; other writes succeed.
   void RefuseWrite(const std::string& oidText, const std::string& valueText);
   std::string ValueOf(const std::string& oidText) const;
