@@ -20,12 +20,8 @@ Request GetOf(const std::string& oid) {
 std::uint32_t Count(SnmpCounter counter) { return SnmpCount(counter); }
 
 TEST_F(MessageTest, GetIsAnsweredWithTheFixedHeaderForm) {
-  auto reply = Send(GetOf("1.3.6.1.2.1.1.5.0"));
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->type, kGetResponse);
-  EXPECT_EQ(reply->requestId, 42);
-  ASSERT_EQ(reply->requestVarBinds.size(), 1u);
-  EXPECT_EQ(reply->requestVarBinds[0].value, VarValue::Octets(kAsnOctetString, "r1"));
+  ASSERT_TRUE(Send(GetOf("1.3.6.1.2.1.1.5.0")));
+  // Response 42 with sysName.0 = "r1", every SEQUENCE length in four octets.
   const std::vector<std::uint8_t> expected = {
       0x30, 0x82, 0x00, 0x2E, 0x02, 0x01, 0x01, 0x04, 0x06, 'p',  'u',  'b',  'l',
       'i',  'c',  0xA2, 0x82, 0x00, 0x1F, 0x02, 0x01, 0x2A, 0x02, 0x01, 0x00, 0x02,
