@@ -110,14 +110,13 @@ TEST_F(HandlersTest, ScalarMissingValues) {
   }
 }
 
-TEST_F(HandlersTest, ScalarSetTellsTheStoredPortAndRepeatsTheValue) {
-  Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
-  VarValue name = VarValue::Octets(kAsnOctetString, "AB");
-  EXPECT_EQ(ScalarProcessWriteReq(oid, name, &errorCode_, {&agent_, &system_}), name);
-  EXPECT_EQ(errorCode_, 0);
-  EXPECT_EQ(std::tie(host_.SetCalls().back().agentPort, host_.SetCalls().back().instance),
-            std::tuple(160, ".0"));
-  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "AB");
+// What a scalar Set writes is pinned by the PDU tests; here, the port it tells the host.
+TEST_F(HandlersTest, ScalarSetTellsTheStoredPort) {
+  const VarValue name = VarValue::Octets(kAsnOctetString, "AB");
+  EXPECT_EQ(
+      ScalarProcessWriteReq({1, 3, 6, 1, 2, 1, 1, 5, 0}, name, &errorCode_, {&agent_, &system_}),
+      name);
+  EXPECT_EQ(host_.SetCalls().back().agentPort, 160);
 }
 
 // Conversions by column type are pinned in value_text_test.cc; here, what the host is asked.
