@@ -19,6 +19,10 @@ class PduProcessingTest : public SnmpAgentTest {
       request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
     return request;
   }
+  // Error status and index of a reply; {-1, -1} when there was none.
+  static std::pair<std::int32_t, std::int32_t> Status(const std::optional<SnmpPdu>& reply) {
+    return reply ? std::pair(reply->errorStatus, reply->errorIndex) : std::pair(-1, -1);
+  }
   static std::vector<std::string> Names(const SnmpPdu& reply) {
     std::vector<std::string> names;
     for (const VarBind& binding : reply.requestVarBinds)
@@ -88,10 +92,7 @@ TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
   EXPECT_EQ(v2->requestVarBinds[1].name, O("1.3.6.1.2.1.31.1.1.1.6.2"));
   request.version = kSnmpV1;
   request.bindings[1].first = O("1.3.6.1.2.1.31.1.1.1.1.2");  // only Counter64 follows
-  auto v1 = Send(request);
-  ASSERT_TRUE(v1);
-  EXPECT_EQ(v1->errorStatus, kNoSuchName);
-  EXPECT_EQ(v1->errorIndex, 2);
+  EXPECT_EQ(Status(Send(request)), std::pair(kNoSuchName, 2));
 }
 
 TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
@@ -106,10 +107,7 @@ TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
   EXPECT_EQ(v2->requestVarBinds[3].value, VarValue::Unsigned(kAsnCounter64, 4294967296ull));
   request.version = kSnmpV1;
   request.bindings.erase(request.bindings.begin() + 1, request.bindings.begin() + 3);
-  auto v1 = Send(request);
-  ASSERT_TRUE(v1);
-  EXPECT_EQ(v1->errorStatus, kNoSuchName);
-  EXPECT_EQ(v1->errorIndex, 2);
+  EXPECT_EQ(Status(Send(request)), std::pair(kNoSuchName, 2));
 }
 
 TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
@@ -118,9 +116,9 @@ TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
   host_.SetValue("1.3.6.1.4.1.5.1.0", "1");
   host_.SetValue("1.3.6.1.4.1.5.2.0", "2");
   Request get = Of(kGetRequest, {"1.3.6.1.4.1.5.1.0"});
-  EXPECT_EQ(Send(get)->errorStatus, kNoAccess);
+  EXPECT_EQ(Status(Send(get)), std::pair(kNoAccess, 1));
   get.version = kSnmpV1;
-  EXPECT_EQ(Send(get)->errorStatus, kNoSuchName);
+  EXPECT_EQ(Status(Send(get)), std::pair(kNoSuchName, 1));
   // A walk steps over the column that is not accessible.
   EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.4.1.5").front(), "1.3.6.1.4.1.5.2.0");
 
@@ -131,7 +129,7 @@ TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
   EXPECT_EQ(written->requestVarBinds[0].value, VarValue::Integer(9));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.4.1.5.2.0"), "9");
   set.bindings[0].first = O("1.3.6.1.4.1.5.3.0");
-  EXPECT_EQ(Send(set)->errorStatus, kNotWritable);
+  EXPECT_EQ(Status(Send(set)), std::pair(kNotWritable, 1));
 }
 
 // A Set either changes every object it names or none of them.
@@ -148,10 +146,7 @@ TEST_F(PduProcessingTest, SetChangesNothingWhenABindingIsRefused) {
                         Case{kSnmpV2c, {descr, text}, kNotWritable},
                         Case{kSnmpV1, {location, VarValue::Integer(5)}, kBadValue},
                         Case{kSnmpV1, {descr, text}, kNoSuchName}}) {
-    auto reply = Send(SetOf(c.version, {{contact, text}, c.second}));
-    ASSERT_TRUE(reply);
-    EXPECT_EQ(reply->errorStatus, c.status);
-    EXPECT_EQ(reply->errorIndex, 2);
+    EXPECT_EQ(Status(Send(SetOf(c.version, {{contact, text}, c.second}))), std::pair(c.status, 2));
   }
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "ops");
   EXPECT_TRUE(host_.SetCalls().empty());  // refused before anything was written
@@ -162,18 +157,12 @@ TEST_F(PduProcessingTest, SetRestoresEarlierWritesWhenTheHostRefusesALaterOne) {
   Request set = SetOf(kSnmpV2c, {{O("1.3.6.1.2.1.1.4.0"), VarValue::Octets(kAsnOctetString, "x")},
                                  {O("1.3.6.1.2.1.1.5.0"), VarValue::Octets(kAsnOctetString, "y")},
                                  {O("1.3.6.1.2.1.1.6.0"), VarValue::Octets(kAsnOctetString, "z")}});
-  auto reply = Send(set);
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->errorStatus, kBadValue);
-  EXPECT_EQ(reply->errorIndex, 3);
+  EXPECT_EQ(Status(Send(set)), std::pair(kBadValue, 3));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "ops");
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "r1");
   // When the earlier value cannot be written back either, the manager is told so.
   host_.RefuseWrite("1.3.6.1.2.1.1.4.0", "ops");
-  reply = Send(set);
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->errorStatus, kUndoFailed);
-  EXPECT_EQ(reply->errorIndex, 0);
+  EXPECT_EQ(Status(Send(set)), std::pair(kUndoFailed, 0));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "x");
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "r1");
 }
