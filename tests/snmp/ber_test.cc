@@ -137,8 +137,7 @@ TEST(BerTest, LengthsAndHeaders) {
   remaining = 3;
   EXPECT_EQ(AsnBuildSequence(buffer, &remaining, kAsnSequence, 5), nullptr);
   EXPECT_EQ(remaining, 3);
-  for (std::size_t length : {std::size_t{0x7F}, std::size_t{0x80}, std::size_t{0xFF},
-                             std::size_t{0x100}, std::size_t{0xFFFF}}) {
+  for (std::size_t length : {0x7Full, 0x80ull, 0xFFull, 0x100ull, 0xFFFFull}) {
     remaining = 8;
     std::uint8_t* end = AsnBuildLength(buffer, &remaining, length);
     ASSERT_NE(end, nullptr);
@@ -146,29 +145,27 @@ TEST(BerTest, LengthsAndHeaders) {
     EXPECT_EQ(AsnParseLength(buffer, static_cast<std::int32_t>(end - buffer), &parsed), end);
     EXPECT_EQ(parsed, length);
   }
-  remaining = 8;
-  EXPECT_EQ(AsnBuildLength(buffer, &remaining, 0x10000), nullptr);
-  remaining = 2;
-  EXPECT_EQ(AsnBuildLength(buffer, &remaining, 0x100), nullptr);
-
+  for (auto [room, length] : {std::pair{8, 0x10000ull}, std::pair{2, 0x100ull}}) {
+    remaining = room;
+    EXPECT_EQ(AsnBuildLength(buffer, &remaining, length), nullptr) << length;
+  }
+  // Length octets: the four-octet form, cut off, indefinite, too many, above 31 bits.
   std::uint32_t length = 0;
   const Bytes four = {0x84, 0x00, 0x00, 0x01, 0x02};
   EXPECT_EQ(AsnParseLength(four.data(), 5, &length), four.data() + 5);
   EXPECT_EQ(length, 0x102u);
-  EXPECT_EQ(AsnParseLength(four.data(), 4, &length), nullptr);  // length octets cut off
-  for (Bytes bad : {Bytes{0x80, 0x00}, Bytes{0x85, 0, 0, 0, 0, 1}, Bytes{0x84, 0x80, 0, 0, 0}})
+  for (Bytes bad : {Bytes{0x84, 0, 0, 1}, Bytes{0x80, 0x00}, Bytes{0x85, 0, 0, 0, 0, 1},
+                    Bytes{0x84, 0x80, 0, 0, 0}})
     EXPECT_EQ(AsnParseLength(bad.data(), static_cast<std::int32_t>(bad.size()), &length), nullptr);
 
-  std::uint8_t type = 0;
-  for (std::uint8_t id : {std::uint8_t{0x1F}, std::uint8_t{0x3F}}) {
-    const Bytes multiOctet = {id, 0x01, 0x00};
-    remaining = 3;
-    EXPECT_EQ(AsnParseHeader(multiOctet.data(), &remaining, &type), nullptr);
-  }
+  // Multi-octet identifiers, and headers cut off or with contents past the end.
   const Bytes header = {0x04, 0x02, 'a', 'b'};
-  for (std::int32_t cut : {-1, 0, 1, 2, 3}) {
-    remaining = cut;
-    EXPECT_EQ(AsnParseHeader(header.data(), &remaining, &type), nullptr) << cut;
+  std::uint8_t type = 0;
+  for (auto [bytes, room] :
+       {std::pair{Bytes{0x1F, 0x01, 0x00}, 3}, std::pair{Bytes{0x3F, 1, 0}, 3},
+        std::pair{header, -1}, std::pair{header, 0}, std::pair{header, 1}, std::pair{header, 3}}) {
+    remaining = room;
+    EXPECT_EQ(AsnParseHeader(bytes.data(), &remaining, &type), nullptr) << room;
   }
   remaining = 4;
   EXPECT_EQ(AsnParseHeader(header.data(), &remaining, &type), header.data() + 2);
@@ -223,9 +220,7 @@ TEST(BerTest, ObjectIdentifierLimits) {
   const Bytes unfinished = encodedOid(4, {0x81});
   EXPECT_FALSE(DecodeAsnSyntaxValue(kAsnObjectId, unfinished.data(), unfinished.size(), &out));
 
-  // The same limits through the binding parser, and a name buffer smaller than the name.
-  EXPECT_EQ(Decode(Binding(Tlv(kAsnObjectId, tooLong), {0x05, 0x00})).type, 0xFF);
-  EXPECT_EQ(Decode(Binding(Tlv(kAsnObjectId, subIdTooLarge), {0x05, 0x00})).type, 0xFF);
+  // The longest name through the binding parser, and a name buffer smaller than the name.
   Oid parsed;
   EXPECT_EQ(Decode(Binding(Tlv(kAsnObjectId, longest), {0x05, 0x00}), &parsed).type, kAsnNull);
   EXPECT_EQ(parsed.size(), kMaxOidLength);

@@ -2,9 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include <memory>
+#include <tuple>
 
-#include "engine/agent.h"
 #include "snmp/pdu.h"
 #include "support/memory_host.h"
 
@@ -13,27 +12,13 @@ namespace {
 
 using namespace std::string_literals;
 
-// Keeps the last read query, and can answer a table GetNext with a fixed answer.
-class RecordingHost : public MemoryHost {
+// Can answer a table GetNext with a fixed answer in place of its stored objects.
+class FixedNextHost : public MemoryHost {
  public:
-  HostAnswer ScalarGetOidVal(const HostValueQuery& query) override {
-    last = query;
-    return MemoryHost::ScalarGetOidVal(query);
-  }
-  HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) override {
-    last = query;
-    return MemoryHost::ScalarGetNextOidVal(query);
-  }
-  HostAnswer TableGetOidVal(const HostValueQuery& query) override {
-    last = query;
-    return MemoryHost::TableGetOidVal(query);
-  }
   HostAnswer TableGetNextOidVal(const HostValueQuery& query) override {
-    last = query;
-    return fixedNext ? *fixedNext : MemoryHost::TableGetNextOidVal(query);
+    HostAnswer stored = MemoryHost::TableGetNextOidVal(query);
+    return fixedNext ? *fixedNext : stored;
   }
-
-  HostValueQuery last;
   std::optional<HostAnswer> fixedNext;
 };
 
@@ -50,13 +35,6 @@ class HandlersTest : public ::testing::Test {
  protected:
   void SetUp() override {
     InstallHost(&host_);
-    agent_.transport.localAddress = "127.0.0.1";
-    agent_.transport.configuredPortMinusOne = 160;
-    agent_.agentInfo = std::make_shared<AgentInfo>();
-    agent_.agentInfo->databaseName = "db";
-    agent_.agentInfo->tableName = "devices";
-    agent_.agentInfo->agentId = 7;
-
     system_.label = "system";
     system_.oid = {1, 3, 6, 1, 2, 1, 1, 1};
     system_.subIds = {1, 3, 5};
@@ -73,13 +51,19 @@ class HandlersTest : public ::testing::Test {
   }
   void TearDown() override { InstallHost(nullptr); }
 
+  std::optional<VarValue> ScalarRead(std::uint8_t type, Oid oid) {
+    return ScalarProcessReadReq(type, &oid, &errorCode_, {&agent_, &system_});
+  }
+  std::optional<VarValue> TableRead(std::uint8_t type, Oid* oid) {
+    return TableProcessReadReq(type, oid, &errorCode_, {&agent_, &table_});
+  }
   std::optional<VarValue> Set(const Oid& oid, const VarValue& value) {
     return TableProcessWriteReq(oid, value, &errorCode_, {&agent_, &table_});
   }
   std::string SentText() const { return host_.SetCalls().back().valueText; }
 
-  RecordingHost host_;
-  AgentSession agent_;
+  FixedNextHost host_;
+  AgentSession agent_ = LocalAgent(7);
   TreeCell system_;
   TreeCell table_;
   std::uint8_t errorCode_ = 0xEE;
@@ -87,83 +71,83 @@ class HandlersTest : public ::testing::Test {
 
 TEST_F(HandlersTest, ScalarGetAsksForTheGroupAndInstanceZero) {
   host_.SetValue("1.3.6.1.2.1.1.3.0", "12345");
-  Oid oid = {1, 3, 6, 1, 2, 1, 1, 3, 0};
-  EXPECT_EQ(ScalarProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &system_}),
+  EXPECT_EQ(ScalarRead(kGetRequest, {1, 3, 6, 1, 2, 1, 1, 3, 0}),
             VarValue::Unsigned(kAsnTimeTicks, 12345));
   EXPECT_EQ(errorCode_, 0);
-  const HostValueQuery& query = host_.last;
-  EXPECT_EQ(query.label, "system");
-  EXPECT_EQ(query.objectOid, ".1.3.6.1.2.1.1");
-  EXPECT_EQ(query.subId, "3");
-  EXPECT_EQ(query.instance, ".0");
-  EXPECT_EQ(query.dataType, kAsnTimeTicks);
-  EXPECT_EQ(query.syntax, std::nullopt);
-  EXPECT_EQ(query.agentPort, 161);  // the configured port
-  EXPECT_EQ(query.agentAddress, "127.0.0.1");
-  EXPECT_EQ(query.databaseName, "db");
-  EXPECT_EQ(query.tableName, "devices");
-  EXPECT_EQ(query.agentId, 7);
+  const HostValueQuery q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.label, q.objectOid, q.subId, q.instance, q.dataType, q.syntax),
+            std::tuple("system", ".1.3.6.1.2.1.1", "3", ".0", kAsnTimeTicks, std::nullopt));
+  // The configured port is the stored one plus one.
+  EXPECT_EQ(std::tie(q.agentPort, q.agentAddress, q.databaseName, q.tableName, q.agentId),
+            std::tuple(161, "127.0.0.1", "db", "agent1", 7));
 }
 
 TEST_F(HandlersTest, ScalarMissingValues) {
-  Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
-  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}),
-            std::nullopt);
+  const Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
+  EXPECT_EQ(ScalarRead(kGetNextRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
-  EXPECT_EQ(host_.last.previousSubId, "3");
+  EXPECT_EQ(host_.LastRead().previousSubId, "3");
   host_.SetError("1.3.6.1.2.1.1.5.0", "5");
-  EXPECT_EQ(ScalarProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &system_}),
-            std::nullopt);
+  EXPECT_EQ(ScalarRead(kGetRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kReadOnly);  // a Get keeps the host's code
-  EXPECT_EQ(ScalarProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &system_}),
-            std::nullopt);
+  EXPECT_EQ(ScalarRead(kGetNextRequest, oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
+  // An error is a plain number in the host's list; any other text is genErr.
+  const std::pair<const char*, int> errors[] = {
+      {"1", kNoSuchObject}, {"6", kGenErr}, {"abc", kGenErr}, {"017", kGenErr}};
+  for (auto [text, code] : errors) {
+    host_.SetError("1.3.6.1.2.1.1.5.0", text);
+    EXPECT_EQ(ScalarRead(kGetRequest, oid), std::nullopt);
+    EXPECT_EQ(errorCode_, code) << text;
+  }
+  // A null value, or no host at all, is no such instance.
+  host_.SetValue("1.3.6.1.2.1.1.5.0", std::nullopt);
+  for (HostBridge* host : {static_cast<HostBridge*>(&host_), static_cast<HostBridge*>(nullptr)}) {
+    InstallHost(host);
+    errorCode_ = 0;
+    EXPECT_EQ(ScalarRead(kGetRequest, oid), std::nullopt);
+    EXPECT_EQ(errorCode_, kNoSuchInstance);
+  }
 }
 
-TEST_F(HandlersTest, ScalarSetTellsTheStoredPortAndRepeatsTheValue) {
-  Oid oid = {1, 3, 6, 1, 2, 1, 1, 5, 0};
-  VarValue name = VarValue::Octets(kAsnOctetString, "AB");
-  EXPECT_EQ(ScalarProcessWriteReq(oid, name, &errorCode_, {&agent_, &system_}), name);
-  EXPECT_EQ(errorCode_, 0);
+// What a scalar Set writes is pinned by the PDU tests; here, the port it tells the host.
+TEST_F(HandlersTest, ScalarSetTellsTheStoredPort) {
+  const VarValue name = VarValue::Octets(kAsnOctetString, "AB");
+  EXPECT_EQ(
+      ScalarProcessWriteReq({1, 3, 6, 1, 2, 1, 1, 5, 0}, name, &errorCode_, {&agent_, &system_}),
+      name);
   EXPECT_EQ(host_.SetCalls().back().agentPort, 160);
-  EXPECT_EQ(host_.SetCalls().back().instance, ".0");
-  EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "AB");
 }
 
 // Conversions by column type are pinned in value_text_test.cc; here, what the host is asked.
 TEST_F(HandlersTest, TableGetAsksForTheEntryColumnAndInstance) {
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.10.0.0.1.161", "-5");
   Oid oid = Column(2, {10, 0, 0, 1, 161});
-  EXPECT_EQ(TableProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &table_}),
-            VarValue::Integer(-5));
+  EXPECT_EQ(TableRead(kGetRequest, &oid), VarValue::Integer(-5));
   EXPECT_EQ(errorCode_, 0);
-  EXPECT_EQ(host_.last.instance, ".10.0.0.1.161");
-  EXPECT_EQ(host_.last.objectOid, ".1.3.6.1.2.1.2.2.1");
-  EXPECT_EQ(host_.last.subId, "2");
+  const HostValueQuery q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.instance, q.objectOid, q.subId),
+            std::tuple(".10.0.0.1.161", ".1.3.6.1.2.1.2.2.1", "2"));
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.10.0.0.1.161", "3000000000");  // does not convert
-  EXPECT_EQ(TableProcessReadReq(kGetRequest, &oid, &errorCode_, {&agent_, &table_}), std::nullopt);
+  EXPECT_EQ(TableRead(kGetRequest, &oid), std::nullopt);
   EXPECT_EQ(errorCode_, kGenErr);
 }
 
 TEST_F(HandlersTest, TableGetNextFollowsTheHostAnswer) {
   host_.SetValue("1.3.6.1.2.1.2.2.1.2.3", "7");
   Oid oid = Column(2);
-  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
-            VarValue::Integer(7));
+  EXPECT_EQ(TableRead(kGetNextRequest, &oid), VarValue::Integer(7));
   EXPECT_EQ(errorCode_, 0);
   EXPECT_EQ(oid, Column(2, {3}));
-  EXPECT_EQ(host_.last.instance, std::nullopt);
-  EXPECT_EQ(host_.last.column, 2);
-  EXPECT_EQ(host_.last.nextColumn, 3);
-  EXPECT_EQ(host_.last.nextDataType, kAsnCounter64);
-  EXPECT_EQ(host_.last.agentPort, 161);
+  HostValueQuery q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.instance, q.column, q.nextColumn, q.nextDataType, q.agentPort),
+            std::tuple(std::nullopt, 2, 3, kAsnCounter64, 161));
 
   oid = Column(6, {1});  // last column: nothing after it, and the host has nothing
-  EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
-            std::nullopt);
+  EXPECT_EQ(TableRead(kGetNextRequest, &oid), std::nullopt);
   EXPECT_EQ(errorCode_, kNoSuchInstance);
-  EXPECT_EQ(host_.last.nextColumn, -1);
-  EXPECT_EQ(host_.last.nextDataType, 0);
+  q = host_.LastRead();
+  EXPECT_EQ(std::tie(q.nextColumn, q.nextDataType), std::tuple(-1, 0));
 }
 
 TEST_F(HandlersTest, TableGetNextRefusesUnusableAnswers) {
@@ -177,8 +161,7 @@ TEST_F(HandlersTest, TableGetNextRefusesUnusableAnswers) {
   for (const HostAnswer& answer : answers) {
     host_.fixedNext = answer;
     Oid oid = Column(2, {3});
-    EXPECT_EQ(TableProcessReadReq(kGetNextRequest, &oid, &errorCode_, {&agent_, &table_}),
-              std::nullopt);
+    EXPECT_EQ(TableRead(kGetNextRequest, &oid), std::nullopt);
     EXPECT_EQ(errorCode_, kNoSuchInstance);
     EXPECT_EQ(oid, Column(2, {3}));
   }
@@ -189,9 +172,8 @@ TEST_F(HandlersTest, TableSetSendsTheColumnTextAndRepeatsTheValue) {
   EXPECT_EQ(Set(Column(5, {5}), mac), mac);  // by the column's syntax
   EXPECT_EQ(errorCode_, 0);
   EXPECT_EQ(SentText(), "00:1a:2b:3c:4d:5e");
-  EXPECT_EQ(host_.SetCalls().back().instance, ".5");
-  EXPECT_EQ(host_.SetCalls().back().subId, "5");
-  EXPECT_EQ(host_.SetCalls().back().agentPort, 160);
+  const HostValueQuery sent = host_.SetCalls().back();
+  EXPECT_EQ(std::tie(sent.instance, sent.subId, sent.agentPort), std::tuple(".5", "5", 160));
   EXPECT_EQ(Set(Column(2, {5}), VarValue::Octets(kAsnOctetString, "A")), std::nullopt);
   EXPECT_EQ(errorCode_, kWrongType);
   EXPECT_EQ(Set(Column(2), VarValue::Integer(1)), std::nullopt);

@@ -9,21 +9,35 @@ namespace {
 
 class PduProcessingTest : public SnmpAgentTest {
  protected:
-  // One GetNext per step from `from`, as a manager's walk does; the names answered.
-  std::vector<std::string> Walk(std::int32_t version, const std::string& from) {
+  // A request of the given type that names each OID with a NULL value.
+  static Request Of(std::uint8_t type, std::vector<std::string> oids,
+                    std::int32_t version = kSnmpV2c) {
+    Request request;
+    request.version = version;
+    request.type = type;
+    for (const std::string& oid : oids)
+      request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
+    return request;
+  }
+  // Error status and index of a reply; {-1, -1} when there was none.
+  static std::pair<std::int32_t, std::int32_t> Status(const std::optional<SnmpPdu>& reply) {
+    return reply ? std::pair(reply->errorStatus, reply->errorIndex) : std::pair(-1, -1);
+  }
+  static std::vector<std::string> Names(const SnmpPdu& reply) {
     std::vector<std::string> names;
-    Oid next = O(from);
+    for (const VarBind& binding : reply.requestVarBinds)
+      names.push_back(OidToPlainText(binding.name));
+    return names;
+  }
+
+  // One GetNext per step from `from`, as a manager's walk does; the names answered.
+  std::vector<std::string> Walk(std::int32_t version, std::string from) {
+    std::vector<std::string> names;
     for (int step = 0; step < 100; ++step) {
-      Request request;
-      request.version = version;
-      request.type = kGetNextRequest;
-      request.bindings = {{next, VarValue::Empty(kAsnNull)}};
-      auto reply = Send(request);
+      auto reply = Send(Of(kGetNextRequest, {from}, version));
       if (!reply || reply->errorStatus != 0) break;
-      const VarBind& answer = reply->requestVarBinds.at(0);
-      if (answer.value.type == kEndOfMibView) break;
-      names.push_back(OidToPlainText(answer.name));
-      next = answer.name;
+      if (reply->requestVarBinds.at(0).value.type == kEndOfMibView) break;
+      names.push_back(from = Names(*reply).at(0));
     }
     return names;
   }
@@ -39,12 +53,9 @@ class PduProcessingTest : public SnmpAgentTest {
 
   SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions,
                std::vector<std::string> oids) {
-    Request request;
-    request.type = kGetBulkRequest;
+    Request request = Of(kGetBulkRequest, oids);
     request.field1 = nonRepeaters;
     request.field2 = maxRepetitions;
-    for (const std::string& oid : oids)
-      request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
     auto reply = Send(request);
     EXPECT_TRUE(reply);
     return reply.value_or(SnmpPdu{});
@@ -73,10 +84,7 @@ TEST_F(PduProcessingTest, WalkVisitsEveryObjectInOrderAcrossCellsAndColumns) {
 }
 
 TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
-  Request request;
-  request.type = kGetNextRequest;
-  request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.31.1.1.1.6.2"), VarValue::Empty(kAsnNull)}};
+  Request request = Of(kGetNextRequest, {"1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.31.1.1.1.6.2"});
   auto v2 = Send(request);
   ASSERT_TRUE(v2);
   EXPECT_EQ(v2->errorStatus, 0);
@@ -84,18 +92,12 @@ TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
   EXPECT_EQ(v2->requestVarBinds[1].name, O("1.3.6.1.2.1.31.1.1.1.6.2"));
   request.version = kSnmpV1;
   request.bindings[1].first = O("1.3.6.1.2.1.31.1.1.1.1.2");  // only Counter64 follows
-  auto v1 = Send(request);
-  ASSERT_TRUE(v1);
-  EXPECT_EQ(v1->errorStatus, kNoSuchName);
-  EXPECT_EQ(v1->errorIndex, 2);
+  EXPECT_EQ(Status(Send(request)), std::pair(kNoSuchName, 2));
 }
 
 TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
-  Request request;
-  request.bindings = {{O("1.3.6.1.2.1.1.3.0"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.1.9.0"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.2.2.1.2.7"), VarValue::Empty(kAsnNull)},
-                      {O("1.3.6.1.2.1.31.1.1.1.6.1"), VarValue::Empty(kAsnNull)}};
+  Request request = Of(kGetRequest, {"1.3.6.1.2.1.1.3.0", "1.3.6.1.2.1.1.9.0",
+                                     "1.3.6.1.2.1.2.2.1.2.7", "1.3.6.1.2.1.31.1.1.1.6.1"});
   auto v2 = Send(request);
   ASSERT_TRUE(v2);
   ASSERT_EQ(v2->requestVarBinds.size(), 4u);
@@ -105,10 +107,7 @@ TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
   EXPECT_EQ(v2->requestVarBinds[3].value, VarValue::Unsigned(kAsnCounter64, 4294967296ull));
   request.version = kSnmpV1;
   request.bindings.erase(request.bindings.begin() + 1, request.bindings.begin() + 3);
-  auto v1 = Send(request);
-  ASSERT_TRUE(v1);
-  EXPECT_EQ(v1->errorStatus, kNoSuchName);
-  EXPECT_EQ(v1->errorIndex, 2);
+  EXPECT_EQ(Status(Send(request)), std::pair(kNoSuchName, 2));
 }
 
 TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
@@ -116,25 +115,21 @@ TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
   StoreTreeCellsRefInArray();
   host_.SetValue("1.3.6.1.4.1.5.1.0", "1");
   host_.SetValue("1.3.6.1.4.1.5.2.0", "2");
-  Request get;
-  get.bindings = {{O("1.3.6.1.4.1.5.1.0"), VarValue::Empty(kAsnNull)}};
-  EXPECT_EQ(Send(get)->errorStatus, kNoAccess);
+  Request get = Of(kGetRequest, {"1.3.6.1.4.1.5.1.0"});
+  EXPECT_EQ(Status(Send(get)), std::pair(kNoAccess, 1));
   get.version = kSnmpV1;
-  EXPECT_EQ(Send(get)->errorStatus, kNoSuchName);
+  EXPECT_EQ(Status(Send(get)), std::pair(kNoSuchName, 1));
   // A walk steps over the column that is not accessible.
   EXPECT_EQ(Walk(kSnmpV2c, "1.3.6.1.4.1.5").front(), "1.3.6.1.4.1.5.2.0");
 
-  Request set;
-  set.type = kSetRequest;
-  set.community = "private";
-  set.bindings = {{O("1.3.6.1.4.1.5.2.0"), VarValue::Integer(9)}};
+  Request set = SetOf(kSnmpV2c, {{O("1.3.6.1.4.1.5.2.0"), VarValue::Integer(9)}});
   auto written = Send(set);
   ASSERT_TRUE(written);
   EXPECT_EQ(written->errorStatus, 0);
   EXPECT_EQ(written->requestVarBinds[0].value, VarValue::Integer(9));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.4.1.5.2.0"), "9");
   set.bindings[0].first = O("1.3.6.1.4.1.5.3.0");
-  EXPECT_EQ(Send(set)->errorStatus, kNotWritable);
+  EXPECT_EQ(Status(Send(set)), std::pair(kNotWritable, 1));
 }
 
 // A Set either changes every object it names or none of them.
@@ -151,10 +146,7 @@ TEST_F(PduProcessingTest, SetChangesNothingWhenABindingIsRefused) {
                         Case{kSnmpV2c, {descr, text}, kNotWritable},
                         Case{kSnmpV1, {location, VarValue::Integer(5)}, kBadValue},
                         Case{kSnmpV1, {descr, text}, kNoSuchName}}) {
-    auto reply = Send(SetOf(c.version, {{contact, text}, c.second}));
-    ASSERT_TRUE(reply);
-    EXPECT_EQ(reply->errorStatus, c.status);
-    EXPECT_EQ(reply->errorIndex, 2);
+    EXPECT_EQ(Status(Send(SetOf(c.version, {{contact, text}, c.second}))), std::pair(c.status, 2));
   }
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "ops");
   EXPECT_TRUE(host_.SetCalls().empty());  // refused before anything was written
@@ -165,31 +157,22 @@ TEST_F(PduProcessingTest, SetRestoresEarlierWritesWhenTheHostRefusesALaterOne) {
   Request set = SetOf(kSnmpV2c, {{O("1.3.6.1.2.1.1.4.0"), VarValue::Octets(kAsnOctetString, "x")},
                                  {O("1.3.6.1.2.1.1.5.0"), VarValue::Octets(kAsnOctetString, "y")},
                                  {O("1.3.6.1.2.1.1.6.0"), VarValue::Octets(kAsnOctetString, "z")}});
-  auto reply = Send(set);
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->errorStatus, kBadValue);
-  EXPECT_EQ(reply->errorIndex, 3);
+  EXPECT_EQ(Status(Send(set)), std::pair(kBadValue, 3));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "ops");
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "r1");
   // When the earlier value cannot be written back either, the manager is told so.
   host_.RefuseWrite("1.3.6.1.2.1.1.4.0", "ops");
-  reply = Send(set);
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->errorStatus, kUndoFailed);
-  EXPECT_EQ(reply->errorIndex, 0);
+  EXPECT_EQ(Status(Send(set)), std::pair(kUndoFailed, 0));
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.4.0"), "x");
   EXPECT_EQ(host_.ValueOf("1.3.6.1.2.1.1.5.0"), "r1");
 }
 
 TEST_F(PduProcessingTest, GetBulkRepeatsTheRepeatersAfterTheNonRepeaters) {
   SnmpPdu reply = Bulk(1, 3, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1", "1.3.6.1.2.1.2.2.1.2"});
-  std::vector<std::string> names;
-  for (const VarBind& binding : reply.requestVarBinds)
-    names.push_back(OidToPlainText(binding.name));
-  EXPECT_EQ(names, (std::vector<std::string>{"1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1",
-                                             "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.1.2",
-                                             "1.3.6.1.2.1.2.2.1.2.2", "1.3.6.1.2.1.2.2.1.2.1",
-                                             "1.3.6.1.2.1.2.2.1.10.1"}));
+  EXPECT_EQ(Names(reply), (std::vector<std::string>{
+                              "1.3.6.1.2.1.1.1.0", "1.3.6.1.2.1.2.2.1.1.1", "1.3.6.1.2.1.2.2.1.2.1",
+                              "1.3.6.1.2.1.2.2.1.1.2", "1.3.6.1.2.1.2.2.1.2.2",
+                              "1.3.6.1.2.1.2.2.1.2.1", "1.3.6.1.2.1.2.2.1.10.1"}));
   EXPECT_EQ(Bulk(1, 0, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 1u);
   EXPECT_EQ(Bulk(-5, -1, {"1.3.6.1.2.1.1.1", "1.3.6.1.2.1.2.2.1.1"}).requestVarBinds.size(), 0u);
   EXPECT_EQ(Bulk(-5, 2, {"1.3.6.1.2.1.1.1"}).requestVarBinds.size(), 2u);
@@ -209,10 +192,9 @@ TEST_F(PduProcessingTest, GetBulkReplyIsTrimmedOnlyAtItsEnd) {
   ASSERT_LT(reply.requestVarBinds.size(), 399u);
   EXPECT_LE(lastReply_.size(), kMaxSnmpMessage);
   EXPECT_GT(lastReply_.size(), kMaxSnmpMessage - 200);
-  for (std::size_t i = 0; i < reply.requestVarBinds.size(); ++i) {
-    EXPECT_EQ(OidToPlainText(reply.requestVarBinds[i].name),
-              "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
-  }
+  std::vector<std::string> rows = Names(reply);
+  for (std::size_t i = 0; i < rows.size(); ++i)
+    EXPECT_EQ(rows[i], "1.3.6.1.2.1.2.2.1.2." + std::to_string(i + 1));
 }
 
 }  // namespace

@@ -14,9 +14,9 @@ Oid MemoryHost::KeyOf(const HostValueQuery& query) {
   return ToOid(query.objectOid + "." + query.subId + query.instance.value_or(""));
 }
 
-void MemoryHost::SetValue(const std::string& oidText, const std::string& valueText) {
+void MemoryHost::SetValue(const std::string& oidText, std::optional<std::string> valueText) {
   std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{valueText, "-1", std::nullopt};
+  objects_[ToOid(oidText)] = Entry{std::move(valueText), "-1", std::nullopt};
 }
 
 void MemoryHost::SetError(const std::string& oidText, const std::string& errorText) {
@@ -24,11 +24,6 @@ void MemoryHost::SetError(const std::string& oidText, const std::string& errorTe
   Entry& entry = objects_[ToOid(oidText)];
   if (!entry.value) entry.value = "x";
   entry.error = errorText;
-}
-
-void MemoryHost::SetNullValue(const std::string& oidText) {
-  std::lock_guard<std::mutex> lock(mutex_);
-  objects_[ToOid(oidText)] = Entry{std::nullopt, "-1", std::nullopt};
 }
 
 void MemoryHost::RefuseWrite(const std::string& oidText, const std::string& valueText) {
@@ -57,9 +52,15 @@ void MemoryHost::PrintStatus(const std::string& text) {
   statusLines_.push_back(text);
 }
 
-HostAnswer MemoryHost::Answer(const Oid& oid) {
+HostValueQuery MemoryHost::LastRead() const {
   std::lock_guard<std::mutex> lock(mutex_);
-  auto found = objects_.find(oid);
+  return lastRead_;
+}
+
+HostAnswer MemoryHost::Answer(const HostValueQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  lastRead_ = query;
+  auto found = objects_.find(KeyOf(query));
   if (found == objects_.end()) return std::nullopt;
   return std::vector<std::optional<std::string>>{found->second.value, found->second.error};
 }
@@ -74,15 +75,13 @@ HostAnswer MemoryHost::Store(const Oid& oid, const HostValueQuery& query) {
   return std::vector<std::optional<std::string>>{query.valueText, std::string("-1")};
 }
 
-HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) { return Answer(KeyOf(query)); }
+HostAnswer MemoryHost::ScalarGetOidVal(const HostValueQuery& query) { return Answer(query); }
 
-HostAnswer MemoryHost::ScalarGetNextOidVal(const HostValueQuery& query) {
-  return Answer(KeyOf(query));
-}
+HostAnswer MemoryHost::ScalarGetNextOidVal(const HostValueQuery& query) { return Answer(query); }
 
 HostAnswer MemoryHost::SetOidVal(const HostValueQuery& query) { return Store(KeyOf(query), query); }
 
-HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) { return Answer(KeyOf(query)); }
+HostAnswer MemoryHost::TableGetOidVal(const HostValueQuery& query) { return Answer(query); }
 
 HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   Oid entryOid = ToOid(query.objectOid);
@@ -91,6 +90,7 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   Oid from =
       ToOid(query.objectOid + "." + std::to_string(query.column) + query.instance.value_or(""));
   std::lock_guard<std::mutex> lock(mutex_);
+  lastRead_ = query;
   auto next = query.instance ? objects_.upper_bound(from) : objects_.lower_bound(from);
   if (next == objects_.end() || next->first.size() <= columnOid.size() ||
       !std::equal(columnOid.begin(), columnOid.end(), next->first.begin())) {

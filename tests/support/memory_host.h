@@ -16,17 +16,16 @@ namespace tessel {
 
 class MemoryHost : public HostBridge {
  public:
-  // oidText is dotted, with or without a leading dot.
-  void SetValue(const std::string& oidText, const std::string& valueText);
+  // oidText is dotted, with or without a leading dot; a value of nullopt is answered as null.
+  void SetValue(const std::string& oidText, std::optional<std::string> valueText);
   // The object answers [value, errorText] (its value, or "x" when it has none).
   void SetError(const std::string& oidText, const std::string& errorText);
-  // The object answers a null value.
-  void SetNullValue(const std::string& oidText);
   // A write of exactly valueText to the object is refused with genErr; other writes succeed.
   void RefuseWrite(const std::string& oidText, const std::string& valueText);
   std::string ValueOf(const std::string& oidText) const;
   std::vector<std::string> StatusLines() const;
   std::vector<HostValueQuery> SetCalls() const;
+  HostValueQuery LastRead() const;  // the query of the last Get or GetNext
 
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
@@ -45,13 +44,14 @@ class MemoryHost : public HostBridge {
   static Oid ToOid(const std::string& oidText);
   // The object a scalar or exact table call names: object OID, sub-identifier, instance.
   static Oid KeyOf(const HostValueQuery& query);
-  HostAnswer Answer(const Oid& oid);
+  HostAnswer Answer(const HostValueQuery& query);
   HostAnswer Store(const Oid& oid, const HostValueQuery& query);
 
   mutable std::mutex mutex_;
   std::map<Oid, Entry> objects_;
   std::vector<std::string> statusLines_;
   std::vector<HostValueQuery> setCalls_;
+  HostValueQuery lastRead_;
 };
 
 // The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community
