@@ -1,0 +1,79 @@
+package com.kestrelon.simulator.tessel.network;
+
+import com.kestrelon.simulator.tessel.data.ValueText;
+import java.nio.ByteBuffer;
+import java.nio.file.Path;
+import java.util.List;
+import java.util.Optional;
+
+/**
+ * A simulated network as a network file describes it: groups of devices, each group on a range of
+ * consecutive IPv4 addresses, plus where the engine logs, where the control interface listens and
+ * where a run keeps what the next one needs. Immutable; every path is resolved already.
+ *
+ * @param admin where the control interface listens; empty when it is off
+ * @param stateDir the folder a run keeps state in for the next run
+ * @param groups the device groups in file order; their address ranges do not overlap
+ */
+public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group> groups) {
+
+  public Network {
+    groups = List.copyOf(groups);
+  }
+
+  /** The total number of devices. */
+  public long devices() {
+    return groups.stream().mapToLong(Group::count).sum();
+  }
+
+  /** The engine's log: level 0 (no log) to 3 (every operation), and its file. */
+  public record Log(int level, Path file) {}
+
+  /** The address the control interface listens on: a host name or IP literal and a TCP port. */
+  public record Admin(String host, int port) {}
+
+  /**
+   * Devices that share their protocols and data. Device i (0-based) is at {@code firstAddress + i}.
+   *
+   * @param firstAddress the IPv4 address of device 0 as an unsigned 32-bit number
+   * @param deviceName the name template: {@code {n}} stands for the 1-based number of the device
+   *     in the group, {@code {address}} for its address
+   * @param snmp the group's SNMP agents; empty when the group serves no SNMP
+   */
+  public record Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp) {
+
+    public long lastAddress() {
+      return firstAddress + count - 1;
+    }
+
+    /** The dotted address of device {@code index} (0-based). */
+    public String address(int index) {
+      return dotted(firstAddress + index);
+    }
+
+    /** The name of device {@code index} (0-based). */
+    public String deviceName(int index) {
+      return deviceName.replace("{n}", Integer.toString(index + 1)).replace("{address}", address(index));
+    }
+  }
+
+  /**
+   * The SNMP agent every device of a group runs.
+   *
+   * @param port the UDP port; the engine also binds {@link #notificationPort()} on every address
+   * @param data the device data each agent starts from
+   * @param v3 the SNMPv3 users, contexts, groups, access rows and views, if any
+   * @param readCommunity the community for reads
+   * @param writeCommunity the community for writes, also accepted for reads
+   */
+  public record Snmp(int port, Path data, Optional<Path> v3, String readCommunity, String writeCommunity) {
+
+    public int notificationPort() {
+      return port + 1;
+    }
+  }
+
+  static String dotted(long address) {
+    return ValueText.ipText(ByteBuffer.allocate(4).putInt((int) address).array());
+  }
+}

@@ -1,0 +1,310 @@
+package com.kestrelon.simulator.tessel.network;
+
+import com.kestrelon.simulator.tessel.data.ValueText;
+import com.kestrelon.simulator.tessel.network.Network.Admin;
+import com.kestrelon.simulator.tessel.network.Network.Group;
+import com.kestrelon.simulator.tessel.network.Network.Log;
+import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import java.io.IOException;
+import java.io.Reader;
+import java.nio.ByteBuffer;
+import java.nio.file.Files;
+import java.nio.file.InvalidPathException;
+import java.nio.file.NoSuchFileException;
+import java.nio.file.Path;
+import java.util.ArrayList;
+import java.util.LinkedHashMap;
+import java.util.List;
+import java.util.Map;
+import java.util.Optional;
+import java.util.regex.Matcher;
+import java.util.regex.Pattern;
+import org.yaml.snakeyaml.Yaml;
+import org.yaml.snakeyaml.error.Mark;
+import org.yaml.snakeyaml.error.MarkedYAMLException;
+import org.yaml.snakeyaml.error.YAMLException;
+import org.yaml.snakeyaml.nodes.MappingNode;
+import org.yaml.snakeyaml.nodes.Node;
+import org.yaml.snakeyaml.nodes.NodeTuple;
+import org.yaml.snakeyaml.nodes.ScalarNode;
+import org.yaml.snakeyaml.nodes.SequenceNode;
+import org.yaml.snakeyaml.nodes.Tag;
+
+/**
+ * Reads a network file (YAML) into a {@link Network}, checking all of it before anything starts:
+ * every fault names the file and the line of the key it is about. Paths in the file are relative to
+ * the file's folder; {@code ~} is the user's home.
+ *
+ * <p>The reader works on the YAML node tree rather than on constructed objects, so that every
+ * value keeps its line and is taken as the text it was written as ({@code off} stays a word).
+ */
+public final class NetworkFile {
+  private static final List<String> NETWORK_KEYS = List.of("log", "admin", "state-dir", "trap-sinks", "groups");
+  private static final List<String> GROUP_KEYS =
+      List.of("name", "count", "address", "device-name", "snmp", "tl1", "cli");
+  private static final List<String> SNMP_KEYS = List.of("port", "data", "v3", "read-community", "write-community");
+  /** Protocol sections whose devices the host cannot serve yet. */
+  private static final List<String> LATER_PROTOCOLS = List.of("tl1", "cli");
+  private static final Pattern LISTEN = Pattern.compile("(?:\\[([^\\]]+)\\]|([^:\\[\\]]+)):([0-9]{1,5})");
+  private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
+
+  private final String name;
+  private final Path folder;
+  private final List<Group> groups = new ArrayList<>();
+  private final List<PortUse> ports = new ArrayList<>();
+
+  /** A port a group's devices bind on each of their addresses, and what for. */
+  private record PortUse(int number, String purpose, String group) {}
+
+  private NetworkFile(Path file) {
+    name = file.toString();
+    folder = file.toAbsolutePath().normalize().getParent();
+  }
+
+  /** The network {@code file} describes. */
+  public static Network read(Path file) throws NetworkFileException {
+    return new NetworkFile(file).network(file);
+  }
+
+  private Network network(Path file) throws NetworkFileException {
+    Node root = compose(file);
+    Map<String, NodeTuple> keys = mapping(root, "the network", NETWORK_KEYS);
+    if (keys.containsKey("trap-sinks")) {
+      NodeTuple sinks = keys.get("trap-sinks");
+      if (!(sinks.getValueNode() instanceof SequenceNode list)) {
+        throw fault(sinks, "trap-sinks takes a list");
+      }
+      if (!list.getValue().isEmpty()) {
+        throw fault(sinks, "trap-sinks is not available yet");
+      }
+    }
+    Log log = log(keys.get("log"));
+    Optional<Admin> admin =
+        keys.containsKey("admin") ? admin(keys.get("admin")) : Optional.of(new Admin("127.0.0.1", 8161));
+    Path stateDir = keys.containsKey("state-dir") ? path(keys.get("state-dir"))
+        : Path.of(System.getProperty("user.home"), ".local", "state", "tessel");
+    NodeTuple groupList = required(keys, "groups", root, "the network");
+    if (!(groupList.getValueNode() instanceof SequenceNode list) || list.getValue().isEmpty()) {
+      throw fault(groupList, "groups takes a list of at least one group");
+    }
+    for (Node group : list.getValue()) {
+      groups.add(group(group));
+    }
+    return new Network(log, admin, stateDir, groups);
+  }
+
+  private Node compose(Path file) throws NetworkFileException {
+    try (Reader reader = Files.newBufferedReader(file)) {
+      Node root = new Yaml().compose(reader);
+      if (root == null) {
+        throw new NetworkFileException(name, 1, "the file is empty; a network needs at least 'groups'");
+      }
+      return root;
+    } catch (MarkedYAMLException e) {
+      Mark mark = e.getProblemMark() != null ? e.getProblemMark() : e.getContextMark();
+      throw new NetworkFileException(name, mark == null ? 1 : mark.getLine() + 1, e.getProblem());
+    } catch (NoSuchFileException e) {
+      throw new NetworkFileException(name, 1, "no such file");
+    } catch (IOException | YAMLException e) {
+      throw new NetworkFileException(name, 1, "cannot be read: " + e.getMessage());
+    }
+  }
+
+  private Log log(NodeTuple entry) throws NetworkFileException {
+    if (entry == null) {
+      return new Log(0, folder.resolve("tessel.log"));
+    }
+    Map<String, NodeTuple> keys = mapping(entry.getValueNode(), "log", List.of("level", "file"));
+    int level = keys.containsKey("level") ? number(keys.get("level"), 0, 3) : 0;
+    Path file = keys.containsKey("file") ? path(keys.get("file")) : folder.resolve("tessel.log");
+    return new Log(level, file);
+  }
+
+  /** {@code admin: off}, {@code admin: {listen: off}} or {@code admin: {listen: HOST:PORT}}. */
+  private Optional<Admin> admin(NodeTuple entry) throws NetworkFileException {
+    NodeTuple listen = entry;
+    if (!isWord(entry.getValueNode(), "off")) {
+      Map<String, NodeTuple> keys = mapping(entry.getValueNode(), "admin", List.of("listen"));
+      listen = required(keys, "listen", entry.getKeyNode(), "admin");
+    }
+    if (isWord(listen.getValueNode(), "off")) {
+      return Optional.empty();
+    }
+    Matcher address = LISTEN.matcher(text(listen));
+    if (!address.matches() || Integer.parseInt(address.group(3)) < 1 || Integer.parseInt(address.group(3)) > 65535) {
+      throw fault(listen, "listen takes HOST:PORT (such as 127.0.0.1:8161 or [::1]:8161) or off, not '"
+          + text(listen) + "'");
+    }
+    String host = address.group(1) != null ? address.group(1) : address.group(2);
+    return Optional.of(new Admin(host, Integer.parseInt(address.group(3))));
+  }
+
+  private Group group(Node node) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(node, "a group", GROUP_KEYS);
+    for (String protocol : LATER_PROTOCOLS) {
+      if (keys.containsKey(protocol)) {
+        throw fault(keys.get(protocol), protocol + " is not available yet");
+      }
+    }
+    NodeTuple nameEntry = required(keys, "name", node, "a group");
+    String groupName = text(nameEntry);
+    if (groups.stream().anyMatch(earlier -> earlier.name().equals(groupName))) {
+      throw fault(nameEntry, "a second group named '" + groupName + "'");
+    }
+    int count = number(required(keys, "count", node, "a group"), 1, Integer.MAX_VALUE);
+    NodeTuple addressEntry = required(keys, "address", node, "a group");
+    long first = address(addressEntry);
+    if (first + count - 1 > LAST_ADDRESS) {
+      throw fault(addressEntry, count + " devices from " + Network.dotted(first) + " run past 255.255.255.255");
+    }
+    for (Group earlier : groups) {
+      if (first <= earlier.lastAddress() && earlier.firstAddress() <= first + count - 1) {
+        throw fault(addressEntry, "addresses " + Network.dotted(first) + " to " + Network.dotted(first + count - 1)
+            + " overlap group " + earlier.name() + " (" + earlier.address(0) + " to "
+            + earlier.address(earlier.count() - 1) + ")");
+      }
+    }
+    String deviceName = keys.containsKey("device-name") ? deviceName(keys.get("device-name")) : "{address}";
+    Optional<Snmp> snmp = keys.containsKey("snmp") ? Optional.of(snmp(keys.get("snmp"), groupName)) : Optional.empty();
+    if (snmp.isEmpty()) {
+      throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp)");
+    }
+    return new Group(groupName, count, first, deviceName, snmp);
+  }
+
+  private Snmp snmp(NodeTuple entry, String group) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(entry.getValueNode(), "snmp", SNMP_KEYS);
+    NodeTuple portEntry = keys.get("port");
+    // The engine binds port + 1 for notifications, so the agents' port stops one short of 65535.
+    int port = portEntry == null ? 1161 : number(portEntry, 1, 65534);
+    claim(portEntry == null ? entry : portEntry,
+        new PortUse(port, "SNMP port", group), new PortUse(port + 1, "notification port", group));
+    Path data = existingFile(required(keys, "data", entry.getKeyNode(), "snmp"));
+    Optional<Path> v3 = keys.containsKey("v3") ? Optional.of(existingFile(keys.get("v3"))) : Optional.empty();
+    String read = keys.containsKey("read-community") ? community(keys.get("read-community")) : "public";
+    String write = keys.containsKey("write-community") ? community(keys.get("write-community")) : "private";
+    return new Snmp(port, data, v3, read, write);
+  }
+
+  /**
+   * Groups never share an address, so they may share a port for the same purpose; a port one group
+   * uses for one purpose and another for a different one would be bound twice on the same address.
+   */
+  private void claim(NodeTuple entry, PortUse... uses) throws NetworkFileException {
+    for (PortUse use : uses) {
+      for (PortUse earlier : ports) {
+        if (earlier.number() == use.number() && !earlier.purpose().equals(use.purpose())) {
+          throw fault(entry, use.purpose() + " " + use.number() + " clashes with the " + earlier.purpose()
+              + " of group " + earlier.group() + " (the notification port is the SNMP port + 1)");
+        }
+      }
+    }
+    ports.addAll(List.of(uses));
+  }
+
+  /** The entries of a mapping by key, in file order; a key outside {@code known} is a fault. */
+  private Map<String, NodeTuple> mapping(Node node, String what, List<String> known) throws NetworkFileException {
+    if (!(node instanceof MappingNode map)) {
+      throw fault(node, what + " takes a mapping of " + String.join(", ", known));
+    }
+    Map<String, NodeTuple> entries = new LinkedHashMap<>();
+    for (NodeTuple entry : map.getValue()) {
+      String key = entry.getKeyNode() instanceof ScalarNode scalar ? scalar.getValue() : "";
+      if (!known.contains(key)) {
+        throw fault(entry, "unknown key '" + key + "' in " + what + " (known: " + String.join(", ", known) + ")");
+      }
+      if (entries.putIfAbsent(key, entry) != null) {
+        throw fault(entry, "a second '" + key + "' in " + what);
+      }
+    }
+    return entries;
+  }
+
+  private NodeTuple required(Map<String, NodeTuple> keys, String key, Node owner, String what)
+      throws NetworkFileException {
+    NodeTuple entry = keys.get(key);
+    if (entry == null) {
+      throw fault(owner, what + " needs '" + key + "'");
+    }
+    return entry;
+  }
+
+  private String text(NodeTuple entry) throws NetworkFileException {
+    if (entry.getValueNode() instanceof ScalarNode scalar && !scalar.getTag().equals(Tag.NULL)
+        && !scalar.getValue().isEmpty()) {
+      return scalar.getValue();
+    }
+    throw fault(entry, key(entry) + " takes a non-empty text");
+  }
+
+  private int number(NodeTuple entry, int low, int high) throws NetworkFileException {
+    String text = entry.getValueNode() instanceof ScalarNode scalar ? scalar.getValue() : "";
+    if (text.matches("[0-9]{1,10}") && Long.parseLong(text) >= low && Long.parseLong(text) <= high) {
+      return Integer.parseInt(text);
+    }
+    throw fault(entry, key(entry) + " takes a whole number from " + low + " to " + high + ", not '" + text + "'");
+  }
+
+  private long address(NodeTuple entry) throws NetworkFileException {
+    String text = text(entry);
+    try {
+      return Integer.toUnsignedLong(ByteBuffer.wrap(ValueText.parseIpAddress(text)).getInt());
+    } catch (IllegalArgumentException e) {
+      throw fault(entry, "address takes an IPv4 address such as 127.0.1.1, not '" + text + "'");
+    }
+  }
+
+  private String deviceName(NodeTuple entry) throws NetworkFileException {
+    String template = text(entry);
+    String rest = template.replace("{n}", "").replace("{address}", "");
+    if (rest.indexOf('{') >= 0 || rest.indexOf('}') >= 0) {
+      throw fault(entry, "device-name may hold {n} and {address}, nothing else in braces: '" + template + "'");
+    }
+    return template;
+  }
+
+  /** The engine reads a community list split at ',', so one community cannot hold one. */
+  private String community(NodeTuple entry) throws NetworkFileException {
+    String community = text(entry);
+    if (community.indexOf(',') >= 0) {
+      throw fault(entry, key(entry) + " cannot hold ',': '" + community + "'");
+    }
+    return community;
+  }
+
+  private Path path(NodeTuple entry) throws NetworkFileException {
+    String text = text(entry);
+    try {
+      if (text.equals("~") || text.startsWith("~/")) {
+        return Path.of(System.getProperty("user.home") + text.substring(1)).normalize();
+      }
+      return folder.resolve(text).normalize();
+    } catch (InvalidPathException e) {
+      throw fault(entry, key(entry) + " is not a path: " + e.getReason());
+    }
+  }
+
+  private Path existingFile(NodeTuple entry) throws NetworkFileException {
+    Path file = path(entry);
+    if (!Files.isRegularFile(file)) {
+      throw fault(entry, key(entry) + " file " + file + " does not exist");
+    }
+    return file;
+  }
+
+  private static boolean isWord(Node node, String word) {
+    return node instanceof ScalarNode scalar && scalar.getValue().equals(word);
+  }
+
+  private static String key(NodeTuple entry) {
+    return ((ScalarNode) entry.getKeyNode()).getValue();
+  }
+
+  private NetworkFileException fault(NodeTuple entry, String reason) {
+    return fault(entry.getKeyNode(), reason);
+  }
+
+  private NetworkFileException fault(Node node, String reason) {
+    return new NetworkFileException(name, node.getStartMark().getLine() + 1, reason);
+  }
+}

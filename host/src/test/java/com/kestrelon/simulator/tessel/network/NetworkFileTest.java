@@ -1,0 +1,150 @@
+package com.kestrelon.simulator.tessel.network;
+
+import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertThrows;
+import static org.junit.jupiter.api.Assertions.assertTrue;
+
+import com.kestrelon.simulator.tessel.network.Network.Admin;
+import com.kestrelon.simulator.tessel.network.Network.Group;
+import com.kestrelon.simulator.tessel.network.Network.Log;
+import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import java.nio.file.Files;
+import java.nio.file.Path;
+import java.util.List;
+import java.util.Optional;
+import java.util.stream.Stream;
+import org.junit.jupiter.api.Test;
+import org.junit.jupiter.api.io.TempDir;
+import org.junit.jupiter.params.ParameterizedTest;
+import org.junit.jupiter.params.provider.Arguments;
+import org.junit.jupiter.params.provider.MethodSource;
+
+/** Network files: what a good one describes, and that every fault names its line. */
+class NetworkFileTest {
+  /** Every fault case starts with this valid group on lines 1 and 2. */
+  private static final String FIRST_GROUP = """
+      groups:
+        - {name: a, count: 10, address: 127.0.1.1, snmp: {data: d.snmprec}}
+      """;
+
+  @TempDir
+  Path dir;
+
+  static Stream<Arguments> faults() {
+    return Stream.of(
+        fault("sate-dir: /tmp\n", "3: unknown key 'sate-dir' in the network"),
+        fault("  - {name: b, cont: 1, address: 127.0.2.1, snmp: {data: d.snmprec}}\n",
+            "3: unknown key 'cont' in a group"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec, prot: 1}}\n",
+            "3: unknown key 'prot' in snmp"),
+        fault("  - {name: b, count: 1, count: 2, address: 127.0.2.1, snmp: {data: d.snmprec}}\n",
+            "3: a second 'count' in a group"),
+        fault("  - {name: b, count: 0, address: 127.0.2.1, snmp: {data: d.snmprec}}\n",
+            "3: count takes a whole number from 1 to 2147483647, not '0'"),
+        fault("  - {name: b, count: [1], address: 127.0.2.1, snmp: {data: d.snmprec}}\n",
+            "3: count takes a whole number"),
+        fault("  - {name: b, address: 127.0.2.1, snmp: {data: d.snmprec}}\n", "3: a group needs 'count'"),
+        fault("  - name: b\n    count: 1\n    address:\n      127.0.2.300\n",
+            "5: address takes an IPv4 address such as 127.0.1.1, not '127.0.2.300'"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec, port: 65535}}\n",
+            "3: port takes a whole number from 1 to 65534"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1, device-name: 'B{x}', snmp: {data: d.snmprec}}\n",
+            "3: device-name may hold {n} and {address}"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec, read-community: 'a,b'}}\n",
+            "3: read-community cannot hold ','"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: gone.snmprec}\n",
+            "6: data file "),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec, v3: gone.conf}\n",
+            "6: v3 file "),
+        fault("  - name: b\n    count: 17\n    address: 255.255.255.240\n",
+            "5: 17 devices from 255.255.255.240 run past"),
+        fault("  - name: b\n    count: 5\n    address: 127.0.1.10\n    snmp: {data: d.snmprec}\n",
+            "5: addresses 127.0.1.10 to 127.0.1.14 overlap group a (127.0.1.1 to 127.0.1.10)"),
+        fault("  - name: b\n    count: 5\n    address: 127.0.0.253\n    snmp: {data: d.snmprec}\n",
+            "5: addresses 127.0.0.253 to 127.0.1.1 overlap group a"),
+        fault("  - {name: a, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec}}\n", "3: a second group named 'a'"),
+        fault("  - {count: 1, address: 127.0.2.1,\n     name: b}\n", "4: group b has no protocol section"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1,\n     snmp: {data: d.snmprec, port: 1162}}\n",
+            "4: SNMP port 1162 clashes with the notification port of group a"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec, port: 1160}}\n",
+            "3: notification port 1161 clashes with the SNMP port of group a"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    tl1: {port: 3083}\n",
+            "6: tl1 is not available yet"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    cli: {port: 2323}\n",
+            "6: cli is not available yet"),
+        fault("trap-sinks: [127.0.0.1:162]\n", "3: trap-sinks is not available yet"),
+        fault("log: {level: 4}\n", "3: level takes a whole number from 0 to 3"),
+        fault("admin: {listen: 127.0.0.1}\n", "3: listen takes HOST:PORT"),
+        fault("state-dir: [a\n", "4: "));
+  }
+
+  private static Arguments fault(String rest, String expected) {
+    return Arguments.of(FIRST_GROUP + rest, expected);
+  }
+
+  @ParameterizedTest(name = "{1}")
+  @MethodSource("faults")
+  void eachFaultNamesItsLine(String yaml, String expected) throws Exception {
+    Path file = write(yaml);
+    NetworkFileException fault = assertThrows(NetworkFileException.class, () -> NetworkFile.read(file));
+    assertTrue(fault.getMessage().startsWith(file + ":" + expected), fault.getMessage());
+  }
+
+  @Test
+  void readsGroupsWithDefaultsAndPathsRelativeToTheFile() throws Exception {
+    Files.createDirectories(dir.resolve("conf"));
+    Files.writeString(dir.resolve("conf/v3.conf"), "");
+    Path file = write("""
+        log: {level: 2, file: logs/t.log}
+        admin: {listen: '[::1]:9000'}
+        state-dir: state
+        trap-sinks: []
+        groups:
+          - name: core
+            count: 3
+            address: 10.0.0.254
+            device-name: "C{n}@{address}"
+            snmp: {port: 2161, data: d.snmprec, v3: conf/../conf/v3.conf, read-community: r, write-community: w}
+          - {name: edge, count: 2, address: 10.0.1.1, snmp: {data: ./d.snmprec}}
+        """);
+    Network network = NetworkFile.read(file);
+    Snmp coreSnmp = new Snmp(2161, dir.resolve("d.snmprec"), Optional.of(dir.resolve("conf/v3.conf")), "r", "w");
+    Snmp edgeSnmp = new Snmp(1161, dir.resolve("d.snmprec"), Optional.empty(), "public", "private");
+    assertEquals(new Network(new Log(2, dir.resolve("logs/t.log")), Optional.of(new Admin("::1", 9000)),
+        dir.resolve("state"), List.of(new Group("core", 3, 0x0A00_00FEL, "C{n}@{address}", Optional.of(coreSnmp)),
+            new Group("edge", 2, 0x0A00_0101L, "{address}", Optional.of(edgeSnmp)))), network);
+    Group core = network.groups().get(0);
+    assertEquals(List.of("10.0.0.254", "10.0.0.255", "10.0.1.0"),
+        List.of(core.address(0), core.address(1), core.address(2)));
+    assertEquals("C3@10.0.1.0", core.deviceName(2));
+    assertEquals("10.0.1.2", network.groups().get(1).deviceName(1));
+    assertEquals(5, network.devices());
+  }
+
+  @Test
+  void adminOffDefaultsAndGroupsSharingAPort() throws Exception {
+    Network network = NetworkFile.read(write("admin: off\n" + FIRST_GROUP
+        + "  - {name: b, count: 1, address: 127.0.1.11, snmp: {data: d.snmprec}}\n"));
+    assertEquals(Optional.empty(), network.admin());
+    assertEquals(new Log(0, dir.resolve("tessel.log")), network.log());
+    assertEquals(Path.of(System.getProperty("user.home"), ".local/state/tessel"), network.stateDir());
+    assertEquals(Optional.empty(), NetworkFile.read(write("admin: {listen: off}\n" + FIRST_GROUP)).admin());
+  }
+
+  @Test
+  void shippedDefaultNetworkIsTheHundredRouters() throws Exception {
+    Path profiles = Path.of(System.getProperty("tessel.profiles.dir", "profiles")).toAbsolutePath().normalize();
+    Network network = NetworkFile.read(profiles.resolve("network.yaml"));
+    Snmp snmp = new Snmp(1161, profiles.resolve("router.snmprec"), Optional.of(profiles.resolve("snmpv3.conf")),
+        "public", "private");
+    assertEquals(List.of(new Group("routers", 100, 0x7F00_0101L, "R{n}", Optional.of(snmp))), network.groups());
+    assertEquals(Optional.of(new Admin("127.0.0.1", 8161)), network.admin());
+    assertEquals(0, network.log().level());
+    assertEquals("127.0.1.100", network.groups().get(0).address(99));
+  }
+
+  private Path write(String yaml) throws Exception {
+    Files.writeString(dir.resolve("d.snmprec"), "1.3.6.1.2.1.1.5.0|4|x\n");
+    return Files.writeString(dir.resolve("network.yaml"), yaml);
+  }
+}
