@@ -203,6 +203,8 @@ class AgentSocketRegistryTest : public AgentRegistryTest {
 
 TEST_F(AgentSocketRegistryTest, NoStartStopOrRestartLosesASocket) {
   RegisterAgentInfo(Agent(kAddress, port_, 1));
+  // The shards' epolls exist before standard input closes: restoring it must not replace one.
+  for (int shard = 0; shard < AgentSocketShards(); ++shard) ASSERT_GE(AgentSocketsEpoll(shard), 0);
   int input = dup(STDIN_FILENO);
   close(STDIN_FILENO);
   bool started = StartAgent(kAddress, port_, 1);

@@ -34,6 +34,7 @@ Oid Column(std::uint32_t column, const Oid& instance = {}) {
 class HandlersTest : public ::testing::Test {
  protected:
   void SetUp() override {
+    host_.RecordReads();
     InstallHost(&host_);
     system_.label = "system";
     system_.oid = {1, 3, 6, 1, 2, 1, 1, 1};

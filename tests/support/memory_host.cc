@@ -59,7 +59,7 @@ HostValueQuery MemoryHost::LastRead() const {
 
 HostAnswer MemoryHost::Answer(const HostValueQuery& query) {
   std::lock_guard<std::mutex> lock(mutex_);
-  lastRead_ = query;
+  if (recordReads_) lastRead_ = query;
   auto found = objects_.find(KeyOf(query));
   if (found == objects_.end()) return std::nullopt;
   return std::vector<std::optional<std::string>>{found->second.value, found->second.error};
@@ -90,7 +90,7 @@ HostAnswer MemoryHost::TableGetNextOidVal(const HostValueQuery& query) {
   Oid from =
       ToOid(query.objectOid + "." + std::to_string(query.column) + query.instance.value_or(""));
   std::lock_guard<std::mutex> lock(mutex_);
-  lastRead_ = query;
+  if (recordReads_) lastRead_ = query;
   auto next = query.instance ? objects_.upper_bound(from) : objects_.lower_bound(from);
   if (next == objects_.end() || next->first.size() <= columnOid.size() ||
       !std::equal(columnOid.begin(), columnOid.end(), next->first.begin())) {

@@ -25,6 +25,9 @@ class MemoryHost : public HostBridge {
   std::string ValueOf(const std::string& oidText) const;
   std::vector<std::string> StatusLines() const;
   std::vector<HostValueQuery> SetCalls() const;
+  // Keeps the query of every Get and GetNext for LastRead (off by default: the micro-benchmarks
+  // serve from this host and should not pay for the copy).
+  void RecordReads() { recordReads_ = true; }
   HostValueQuery LastRead() const;  // the query of the last Get or GetNext
 
   void PrintStatus(const std::string& text) override;
@@ -52,6 +55,7 @@ class MemoryHost : public HostBridge {
   std::vector<std::string> statusLines_;
   std::vector<HostValueQuery> setCalls_;
   HostValueQuery lastRead_;
+  bool recordReads_ = false;
 };
 
 // The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community
