@@ -30,7 +30,11 @@ public final class DeviceStore {
   private final Map<Integer, Map<Integer, String>> overlays = new ConcurrentHashMap<>();
 
   /** The objects below one table entry: positions [first, end), entry of {@code length} sub-ids. */
-  private record EntryRange(int length, int first, int end) {}
+  private record EntryRange(Oid entry, int first, int end) {
+    int length() {
+      return entry.length();
+    }
+  }
 
   public DeviceStore(DeviceData data) {
     this(data.objects());
@@ -66,16 +70,16 @@ public final class DeviceStore {
    */
   public String[] nextInColumn(int agentId, String entryOid, int column, String instance) {
     EntryRange range = entryRange(entryOid);
-    Oid key = columnKey(entryOid, column, instance);
-    if (range == null || key == null) {
+    Oid key = range == null ? null : columnKey(range.entry(), column, instance);
+    if (key == null) {
       return null;
     }
     int found = Arrays.binarySearch(oids, range.first, range.end, key);
     int position = found >= 0 ? found + 1 : -found - 1;
-    if (position == range.end || oids[position].get(range.length) != Integer.toUnsignedLong(column)) {
+    if (position == range.end || oids[position].get(range.length()) != Integer.toUnsignedLong(column)) {
       return null;
     }
-    return new String[] {valueAt(agentId, position), oids[position].suffixText(range.length)};
+    return new String[] {valueAt(agentId, position), oids[position].suffixText(range.length())};
   }
 
   /**
@@ -123,22 +127,28 @@ public final class DeviceStore {
     while (end < oids.length && oids[end].startsWith(entry)) {
       end++;
     }
-    EntryRange range = new EntryRange(entry.length(), first, end);
+    EntryRange range = new EntryRange(entry, first, end);
     entries.putIfAbsent(entryOid, range);
     return range;
   }
 
   /**
    * The OID of the entry's column followed by the instance: where a column walk stands. Null when
-   * the instance is malformed.
+   * the instance is malformed. Only the instance is parsed: the walk's hot path.
    */
-  private static Oid columnKey(String entryOid, int column, String instance) {
+  private static Oid columnKey(Oid entry, int column, String instance) {
     String suffix = instance == null ? "" : instance;
     if (!suffix.isEmpty() && suffix.charAt(0) != '.') {
       return null;
     }
     try {
-      return Oid.parse(entryOid + "." + Integer.toUnsignedString(column) + suffix);
+      Oid rest = suffix.isEmpty() ? null : Oid.parse(suffix);
+      long[] more = new long[1 + (rest == null ? 0 : rest.length())];
+      more[0] = Integer.toUnsignedLong(column);
+      for (int i = 1; i < more.length; i++) {
+        more[i] = rest.get(i - 1);
+      }
+      return entry.append(more);
     } catch (IllegalArgumentException e) {
       return null;
     }
