@@ -34,7 +34,7 @@ class Network:
         command = [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
                    f"-Dtessel.profiles.dir={ROOT / 'profiles'}", "-cp", str(jars[0]),
                    "com.kestrelon.simulator.tessel.Launcher", "--snmp-data", str(data), "--devices", str(devices),
-                   "--address", address, "--snmp-port", str(port), *extra]
+                   "--address", address, "--snmp-port", str(port), "--admin", "off", *extra]
         self.process = subprocess.Popen(command, cwd=self.workdir, stdout=subprocess.PIPE, stderr=subprocess.PIPE,
                                         text=True)
         lines, deadline = [], time.monotonic() + 60

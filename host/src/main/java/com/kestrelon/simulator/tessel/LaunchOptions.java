@@ -1,43 +1,82 @@
 package com.kestrelon.simulator.tessel;
 
 import com.kestrelon.simulator.tessel.data.ValueText;
+import com.kestrelon.simulator.tessel.network.Network;
+import com.kestrelon.simulator.tessel.network.Network.Admin;
+import com.kestrelon.simulator.tessel.network.Network.Group;
+import com.kestrelon.simulator.tessel.network.Network.Log;
+import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.NetworkFile;
+import com.kestrelon.simulator.tessel.network.NetworkFileException;
 import java.nio.ByteBuffer;
 import java.nio.file.Path;
+import java.util.ArrayList;
+import java.util.List;
+import java.util.Optional;
+import picocli.CommandLine;
+import picocli.CommandLine.Command;
+import picocli.CommandLine.Option;
+import picocli.CommandLine.ParameterException;
 
 /**
- * The options of {@code ./tessel run}: what network to start. Each option takes its value as the
- * next argument or after '=' ({@code --devices 10}, {@code --devices=10}). Immutable.
- *
- * @param dataFile the device data every device starts from
- * @param snmpV3File the SNMPv3 configuration: users, contexts, groups, access rows and views
- * @param devices how many devices; device i is at {@code firstAddress + i}
- * @param firstAddress the IPv4 address of device 0 as an unsigned 32-bit number
- * @param port the UDP port of every device
- * @param logLevel the engine's log level, 0 (no log) to 3 (every operation)
- * @param help true when only the usage text is asked for
+ * The options of {@code ./tessel run}: a network file, or the flags of a one-group network, plus
+ * what overrides either (log, control interface, state folder). Each option takes its value as the
+ * next argument or after '=' ({@code --devices 10}, {@code --devices=10}).
  */
-public record LaunchOptions(Path dataFile, Path snmpV3File, int devices, long firstAddress, int port,
-    String readCommunity, String writeCommunity, int logLevel, String logFile, boolean help) {
-
-  public static final String USAGE = """
-      usage: ./tessel run [options]
-      Starts a network of simulated SNMP devices and serves it until Ctrl-C or SIGTERM.
-
-        --snmp-data FILE      device data: a .snmprec file or snmpwalk -On output
-                              (default: the router profile in profiles/)
-        --snmpv3 FILE         SNMPv3 users, contexts, groups, access rows and views
-                              (default: profiles/snmpv3.conf)
-        --devices N           number of devices (default 100)
-        --address A           IPv4 address of device 0; device i is at A + i (default 127.0.1.1)
-        --snmp-port P         UDP port of every device (default 1161)
-        --read-community C    community for reads (default public)
-        --write-community C   community for writes, also accepted for reads (default private)
-        --log-level 0..3      detail of the engine's log; 0 writes none (default 0)
-        --log-file F          the engine's log file (default tessel.log)
-        --help                print this text
-      """;
-
+@Command(name = "./tessel run", sortOptions = false, usageHelpWidth = 100,
+    description = {"Starts a simulated network and serves it until Ctrl-C or SIGTERM: the network file given,",
+        "a one-group network the device flags describe, or without either profiles/network.yaml."})
+public final class LaunchOptions {
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
+
+  @Option(names = "--network", paramLabel = "FILE", description = "the network file (YAML) to start")
+  Path networkFile;
+
+  @Option(names = "--snmp-data", paramLabel = "FILE",
+      description = "device data: a .snmprec file or snmpwalk -On output (default: profiles/router.snmprec)")
+  Path dataFile;
+
+  @Option(names = "--snmpv3", paramLabel = "FILE",
+      description = "SNMPv3 users, contexts, groups, access rows and views (default: profiles/snmpv3.conf)")
+  Path snmpV3File;
+
+  @Option(names = "--devices", paramLabel = "N", description = "number of devices (default 100)")
+  Integer devices;
+
+  @Option(names = "--address", paramLabel = "A",
+      description = "IPv4 address of device 0; device i is at A + i (default 127.0.1.1)")
+  String address;
+
+  @Option(names = "--snmp-port", paramLabel = "P", description = "UDP port of every device (default 1161)")
+  Integer port;
+
+  @Option(names = "--read-community", paramLabel = "C", description = "community for reads (default public)")
+  String readCommunity;
+
+  @Option(names = "--write-community", paramLabel = "C",
+      description = "community for writes, also accepted for reads (default private)")
+  String writeCommunity;
+
+  @Option(names = "--log-level", paramLabel = "0..3", description = "detail of the engine's log; 0 writes none")
+  Integer logLevel;
+
+  @Option(names = "--log-file", paramLabel = "F", description = "the engine's log file (default tessel.log)")
+  Path logFile;
+
+  @Option(names = "--admin", paramLabel = "HOST:PORT|off",
+      description = "where the control interface listens (default 127.0.0.1:8161)")
+  String admin;
+
+  @Option(names = "--admin-token-file", paramLabel = "F",
+      description = "the control interface's secret; needed to listen on an address outside loopback")
+  Path adminTokenFile;
+
+  @Option(names = "--state-dir", paramLabel = "DIR",
+      description = "where a run keeps what the next needs (default ~/.local/state/tessel)")
+  Path stateDir;
+
+  @Option(names = {"-h", "--help"}, usageHelp = true, description = "print this text")
+  boolean help;
 
   /** A command line that does not ask for a network this launcher can start. */
   public static final class UsageException extends Exception {
@@ -48,115 +87,110 @@ public record LaunchOptions(Path dataFile, Path snmpV3File, int devices, long fi
     }
   }
 
+  /** Reads the command line. */
+  public static LaunchOptions parse(String[] args) throws UsageException {
+    LaunchOptions options = new LaunchOptions();
+    try {
+      new CommandLine(options).parseArgs(args);
+    } catch (ParameterException e) {
+      throw new UsageException(e.getMessage());
+    }
+    return options;
+  }
+
+  /** The usage text. */
+  public static String usage() {
+    return new CommandLine(new LaunchOptions()).getUsageMessage();
+  }
+
+  public boolean help() {
+    return help;
+  }
+
+  public Optional<Path> adminTokenFile() {
+    return Optional.ofNullable(adminTokenFile);
+  }
+
   /**
-   * Reads the command line; unset options take their defaults, the data file {@code defaultData}
-   * and the SNMPv3 configuration {@code defaultSnmpV3}.
+   * The network to start: the network file (or {@code defaultNetwork} when no device flag is
+   * given), or the one group the device flags describe; the log, control and state options
+   * override either.
    */
-  public static LaunchOptions parse(String[] args, Path defaultData, Path defaultSnmpV3)
-      throws UsageException {
-    Builder options = new Builder(defaultData, defaultSnmpV3);
-    for (int i = 0; i < args.length; i++) {
-      String name = args[i];
-      String value = null;
-      int equals = name.indexOf('=');
-      if (name.startsWith("--") && equals > 0) {
-        value = name.substring(equals + 1);
-        name = name.substring(0, equals);
-      }
-      if (name.equals("--help") || name.equals("-h")) {
-        options.help = true;
-        continue;
-      }
-      if (value == null) {
-        if (i + 1 == args.length) {
-          throw new UsageException(knownOption(name) + " needs a value");
-        }
-        value = args[++i];
-      }
-      options.set(name, value);
-    }
-    return options.build();
-  }
-
-  private static String knownOption(String name) throws UsageException {
-    return switch (name) {
-      case "--snmp-data", "--snmpv3", "--devices", "--address", "--snmp-port", "--read-community",
-          "--write-community", "--log-level", "--log-file" -> name;
-      default -> throw new UsageException("unknown option '" + name + "'");
-    };
-  }
-
-  /** The dotted text of the address of device {@code index}. */
-  public String address(int index) {
-    return dotted(firstAddress + index);
-  }
-
-  private static String dotted(long address) {
-    return ValueText.ipText(ByteBuffer.allocate(4).putInt((int) address).array());
-  }
-
-  private static final class Builder {
-    Path dataFile;
-    Path snmpV3File;
-    int devices = 100;
-    long firstAddress = 0x7F00_0101L; // 127.0.1.1
-    int port = 1161;
-    String readCommunity = "public";
-    String writeCommunity = "private";
-    int logLevel = 0;
-    String logFile = "tessel.log";
-    boolean help;
-
-    Builder(Path defaultData, Path defaultSnmpV3) {
-      dataFile = defaultData;
-      snmpV3File = defaultSnmpV3;
-    }
-
-    void set(String name, String value) throws UsageException {
-      switch (knownOption(name)) {
-        case "--snmp-data" -> dataFile = Path.of(nonEmpty(name, value));
-        case "--snmpv3" -> snmpV3File = Path.of(nonEmpty(name, value));
-        case "--devices" -> devices = number(name, value, 1, Integer.MAX_VALUE);
-        case "--address" -> firstAddress = parseAddress(value);
-        case "--snmp-port" -> port = number(name, value, 1, 65535);
-        case "--read-community" -> readCommunity = community(name, value);
-        case "--write-community" -> writeCommunity = community(name, value);
-        case "--log-level" -> logLevel = number(name, value, 0, 3);
-        default -> logFile = nonEmpty(name, value);
+  public Network network(Path defaultNetwork) throws UsageException, NetworkFileException {
+    Object[][] paths = {{"--network", networkFile}, {"--snmp-data", dataFile}, {"--snmpv3", snmpV3File},
+        {"--log-file", logFile}, {"--admin-token-file", adminTokenFile}, {"--state-dir", stateDir}};
+    for (Object[] path : paths) {
+      if (path[1] != null && path[1].toString().isEmpty()) {
+        throw new UsageException(path[0] + " needs a value");
       }
     }
-
-    LaunchOptions build() throws UsageException {
-      if (firstAddress + devices - 1 > LAST_ADDRESS) {
-        throw new UsageException(devices + " devices from " + dotted(firstAddress)
-            + " run past 255.255.255.255");
-      }
-      return new LaunchOptions(dataFile, snmpV3File, devices, firstAddress, port, readCommunity, writeCommunity,
-          logLevel, logFile, help);
+    List<String> groupFlags = groupFlags();
+    if (networkFile != null && !groupFlags.isEmpty()) {
+      throw new UsageException("--network cannot be mixed with " + String.join(", ", groupFlags)
+          + ": describe the devices in the network file");
     }
+    Network network = groupFlags.isEmpty()
+        ? NetworkFile.read(networkFile != null ? networkFile : defaultNetwork)
+        : flagNetwork();
+    return overridden(network);
   }
 
-  private static String nonEmpty(String name, String value) throws UsageException {
-    if (value.isEmpty()) {
-      throw new UsageException(name + " needs a value");
+  private List<String> groupFlags() {
+    List<String> given = new ArrayList<>();
+    Object[][] flags = {{"--snmp-data", dataFile}, {"--snmpv3", snmpV3File}, {"--devices", devices},
+        {"--address", address}, {"--snmp-port", port}, {"--read-community", readCommunity},
+        {"--write-community", writeCommunity}};
+    for (Object[] flag : flags) {
+      if (flag[1] != null) {
+        given.add((String) flag[0]);
+      }
+    }
+    return given;
+  }
+
+  /** The one-group network of the device flags, named after its data file. */
+  private Network flagNetwork() throws UsageException {
+    int count = devices == null ? 100 : number("--devices", devices, 1, Integer.MAX_VALUE);
+    long first = address == null ? 0x7F00_0101L : parseAddress(address);
+    if (first + count - 1 > LAST_ADDRESS) {
+      throw new UsageException(count + " devices from " + Network.dotted(first) + " run past 255.255.255.255");
+    }
+    Path data = dataFile != null ? dataFile : Launcher.defaultData();
+    Snmp snmp = new Snmp(port == null ? 1161 : number("--snmp-port", port, 1, 65534), data,
+        Optional.of(snmpV3File != null ? snmpV3File : Launcher.defaultSnmpV3()),
+        community("--read-community", readCommunity, "public"),
+        community("--write-community", writeCommunity, "private"));
+    String name = data.getFileName().toString().replaceFirst("\\.[^.]*$", "");
+    Group group = new Group(name.isEmpty() ? "devices" : name, count, first, "{address}", Optional.of(snmp));
+    return new Network(new Log(0, Path.of("tessel.log")), Optional.of(new Admin("127.0.0.1", 8161)),
+        Path.of(System.getProperty("user.home"), ".local", "state", "tessel"), List.of(group));
+  }
+
+  private Network overridden(Network network) throws UsageException {
+    Log log = new Log(logLevel == null ? network.log().level() : number("--log-level", logLevel, 0, 3),
+        logFile == null ? network.log().file() : logFile);
+    Optional<Admin> listen = network.admin();
+    if (admin != null) {
+      listen = Admin.parse(admin);
+      if (listen == null) {
+        throw new UsageException("--admin takes " + Admin.expected() + ", not '" + admin + "'");
+      }
+    }
+    return new Network(log, listen, stateDir == null ? network.stateDir() : stateDir, network.groups());
+  }
+
+  private static int number(String name, int value, int low, int high) throws UsageException {
+    if (value < low || value > high) {
+      throw new UsageException(name + " takes a number from " + low + " to " + high + ", not '" + value + "'");
     }
     return value;
   }
 
-  private static int number(String name, String value, int low, int high) throws UsageException {
-    try {
-      int number = Integer.parseInt(value);
-      if (number >= low && number <= high) {
-        return number;
-      }
-    } catch (NumberFormatException e) {
-      // reported below
-    }
-    throw new UsageException(name + " takes a number from " + low + " to " + high + ", not '" + value + "'");
-  }
-
   /** The engine reads a community list split at ',', so one community cannot hold one. */
-  private static String community(String name, String value) throws UsageException {
+  private static String community(String name, String value, String otherwise) throws UsageException {
+    if (value == null) {
+      return otherwise;
+    }
     if (value.isEmpty() || value.indexOf(',') >= 0) {
       throw new UsageException(name + " takes a non-empty community without ',', not '" + value + "'");
     }

@@ -6,6 +6,9 @@ import static org.junit.jupiter.api.Assertions.assertFalse;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 import static org.junit.jupiter.api.Assertions.fail;
 
+import com.kestrelon.simulator.tessel.control.AgentState;
+import com.kestrelon.simulator.tessel.control.Device;
+import com.kestrelon.simulator.tessel.control.DeviceTable;
 import java.io.ByteArrayOutputStream;
 import java.io.IOException;
 import java.io.PrintStream;
@@ -25,9 +28,6 @@ import org.junit.jupiter.params.provider.CsvSource;
 
 /** The command line of ./tessel run, its exit statuses, and real starts and stops. */
 class LauncherTest {
-  private static final Path DATA = Path.of("d.snmprec");
-  private static final Path V3 = Path.of("v3.conf");
-
   private final ByteArrayOutputStream out = new ByteArrayOutputStream();
   private final ByteArrayOutputStream err = new ByteArrayOutputStream();
 
@@ -53,10 +53,10 @@ class LauncherTest {
     return status.get();
   }
 
-  /** Waits, 10 s at most, until devices have said they started or the launch has ended. */
-  private void awaitStarted(Thread network, int devices) throws InterruptedException {
+  /** Waits, 10 s at most, until the network serves (its summary line) or the launch has ended. */
+  private void awaitServing(Thread network) throws InterruptedException {
     long deadline = System.nanoTime() + 10_000_000_000L;
-    while (started() < devices && System.nanoTime() < deadline && network.isAlive()) {
+    while (!err().contains(" devices running: ") && System.nanoTime() < deadline && network.isAlive()) {
       Thread.sleep(20);
     }
   }
@@ -74,7 +74,11 @@ class LauncherTest {
   }
 
   private static boolean bindable(String address) {
-    try (DatagramSocket socket = new DatagramSocket(new InetSocketAddress(address, 0))) {
+    return bindable(address, 0);
+  }
+
+  private static boolean bindable(String address, int port) {
+    try (DatagramSocket socket = new DatagramSocket(new InetSocketAddress(address, port))) {
       return socket.isBound();
     } catch (IOException e) {
       return false;
@@ -93,31 +97,17 @@ class LauncherTest {
     return !thread.isAlive();
   }
 
-  @Test
-  void optionsTakeTheirValuesInEitherFormAndDefaultsOtherwise() throws Exception {
-    assertEquals(new LaunchOptions(DATA, V3, 100, 0x7F000101L, 1161, "public", "private", 0,
-        "tessel.log", false), LaunchOptions.parse(new String[0], DATA, V3));
-    LaunchOptions set = LaunchOptions.parse(new String[] {"--snmp-data", "x.walk",
-        "--snmpv3=u.conf", "--devices=3", "--address", "10.0.0.254", "--snmp-port=11161",
-        "--read-community", "r", "--write-community=w", "--log-level", "3", "--log-file", "e.log"},
-        DATA, V3);
-    assertEquals(new LaunchOptions(Path.of("x.walk"), Path.of("u.conf"), 3, 0x0A0000FEL, 11161,
-        "r", "w", 3, "e.log", false), set);
-    assertEquals(List.of("10.0.0.254", "10.0.0.255", "10.0.1.0"),
-        List.of(set.address(0), set.address(1), set.address(2)), "addresses carry into the next octet");
-    assertEquals("255.255.255.255",
-        LaunchOptions.parse(new String[] {"--address", "255.255.255.254", "--devices", "2"}, DATA, V3).address(1));
-  }
-
   @ParameterizedTest
   @CsvSource(delimiter = ';', value = {
-      "--bogus;                    unknown option '--bogus'",
-      "--devices;                  --devices needs a value",
-      "--snmp-data=;               --snmp-data needs a value",
+      "--bogus;                    Unknown option: '--bogus'",
+      "--devices;                  Missing required parameter for option '--devices'",
       "--devices 0;                --devices takes a number from 1",
-      "--snmp-port 65536;          --snmp-port takes a number from 1 to 65535",
+      "--snmp-data=;               --snmp-data needs a value",
+      "--snmp-port 65535;          --snmp-port takes a number from 1 to 65534",
       "--address 127.0.1.256;      --address takes an IPv4 address such as 127.0.1.1, not '127.0.1.256'",
       "--read-community a,b;       --read-community takes a non-empty community without ','",
+      "--admin 127.0.0.1;          --admin takes HOST:PORT",
+      "--network n.yaml --devices=2; --network cannot be mixed with --devices",
       "--address 255.255.255.254 --devices 3; 3 devices from 255.255.255.254 run past 255.255.255.255"})
   void usageErrorsExitWithStatusTwo(String args, String message) throws Exception {
     assertEquals(2, runToEnd(args.split(" ")));
@@ -128,7 +118,8 @@ class LauncherTest {
   @Test
   void helpGoesToStandardOutput() throws Exception {
     assertEquals(0, runToEnd("--devices", "5", "--help"));
-    assertEquals(LaunchOptions.USAGE, out());
+    assertEquals(LaunchOptions.usage(), out());
+    assertTrue(out().contains("--network=FILE"), out());
     assertEquals("", err());
   }
 
@@ -143,6 +134,11 @@ class LauncherTest {
       assertEquals(2, runToEnd(option, dir.resolve("missing").toString()));
       assertEquals(dir.resolve("missing") + ": no such file", err().strip(), option);
     }
+    Path network = dir.resolve("network.yaml");
+    Files.writeString(network, "groups:\n  - name: a\n    count: 0\n");
+    err.reset();
+    assertEquals(2, runToEnd("--network", network.toString()));
+    assertTrue(err().startsWith(network + ":3: count takes a whole number from 1"), err());
     assertEquals("", out());
   }
 
@@ -150,7 +146,7 @@ class LauncherTest {
   void noDeviceStartedExitsWithStatusOne() throws Exception {
     String nowhere = "203.0.113.1"; // a documentation address, on no interface of a test machine
     assertFalse(bindable(nowhere), "this machine has " + nowhere);
-    assertEquals(1, runToEnd("--address", nowhere, "--devices", "1", "--snmp-port", "28161"));
+    assertEquals(1, runToEnd("--address", nowhere, "--devices", "1", "--snmp-port", "28161", "--admin", "off"));
     assertTrue(out().contains("Unable to start SNMP Agent at Port : 28161 and at IpAddress : " + nowhere), out());
     assertTrue(out().contains("Network resources cleared Successfully"));
     assertEquals("tessel: no device started", err().strip());
@@ -177,10 +173,10 @@ class LauncherTest {
     }));
     AtomicInteger status = new AtomicInteger(-1);
     Thread network = startNetwork(launcher.get(), status, "--devices", String.valueOf(fit + 2),
-        "--address", "127.0.3.1", "--snmp-port", "28162");
+        "--address", "127.0.3.1", "--snmp-port", "28162", "--admin", "off");
     try {
       // What the devices answer is the integration tests' part (tests/integration).
-      awaitStarted(network, fit);
+      awaitServing(network);
     } finally {
       launcher.get().requestStop();
       network.join(5000);
@@ -190,10 +186,56 @@ class LauncherTest {
     assertEquals(fit, started(), out());
     assertTrue(out().contains("Snmp Agent Started at port : 28162 and at IPAddress : 127.0.4.1\n"));
     assertTrue(out().endsWith("Network resources cleared Successfully\n"));
-    assertEquals(budget.shortfall(fit + 2), err().strip());
+    assertEquals(budget.shortfall(fit + 2) + "\n" + fit + " devices running: router " + fit + "/" + (fit + 2)
+        + " (2 failed)", err().strip());
     assertTrue(err().startsWith("tessel: the open-file limit allows " + fit + " agents, not " + (fit + 2)), err());
     assertTrue(secondRequestReturned.get(), "a second stop request waited for the first");
     launcher.get().requestStop();
     assertEquals(1, stops.get(), "the engine is stopped once");
+  }
+
+  @Test
+  void groupsOfANetworkFileServeTheirOwnDataAndDevicesStopAndStartOneByOne(@TempDir Path dir) throws Exception {
+    Path hosts = Path.of(System.getProperty("tessel.data.dir"), "linux-host.walk");
+    Path network = dir.resolve("network.yaml");
+    Files.writeString(network, String.join("\n", "admin: off", "log: {file: logs/engine.log}", "groups:",
+        "  - {name: routers, count: 2, address: 127.0.3.1, device-name: 'R{n}',",
+        "     snmp: {port: 28163, data: " + Launcher.defaultData().toAbsolutePath() + "}}",
+        "  - {name: hosts, count: 1, address: 127.0.3.9, snmp: {port: 28165, data: " + hosts + "}}", ""));
+    Launcher launcher = new Launcher();
+    AtomicInteger status = new AtomicInteger(-1);
+    Thread running = startNetwork(launcher, status, "--network", network.toString());
+    try {
+      awaitServing(running);
+      assertEquals("3 devices running: routers 2/2, hosts 1/1", err().strip());
+      assertTrue(Files.isDirectory(dir.resolve("logs")), "the log's folder is made, relative to the file");
+      DeviceTable devices = launcher.devices();
+      assertEquals("R2 routers {snmp=RUNNING}", describe(devices.find("127.0.3.2").orElseThrow()));
+      assertEquals("127.0.3.9 hosts {snmp=RUNNING}", describe(devices.find("127.0.3.9").orElseThrow()));
+      assertFalse(bindable("127.0.3.9", 28165));
+
+      devices.stop("127.0.3.9", Optional.empty());
+      assertTrue(bindable("127.0.3.9", 28165), "a stopped device gives its port back");
+      assertEquals(Optional.empty(), devices.start("127.0.3.9", Optional.of("snmp")).orElseThrow().failure());
+      assertFalse(bindable("127.0.3.9", 28165), "a started device holds its port again");
+
+      devices.stop("127.0.3.1", Optional.empty());
+      try (DatagramSocket squatter = new DatagramSocket(new InetSocketAddress("127.0.3.1", 28163))) {
+        assertTrue(squatter.isBound());
+        DeviceTable.Change change = devices.start("127.0.3.1", Optional.empty()).orElseThrow();
+        assertTrue(change.failure().orElseThrow().contains("UDP port 28163 on 127.0.3.1"), change.toString());
+        assertEquals(AgentState.FAILED, change.device().protocols().get("snmp"));
+      }
+      assertEquals(AgentState.RUNNING,
+          devices.restart("127.0.3.1", Optional.empty()).orElseThrow().device().protocols().get("snmp"));
+    } finally {
+      launcher.requestStop();
+      running.join(5000);
+    }
+    assertEquals(0, status.get());
+  }
+
+  private static String describe(Device device) {
+    return device.name() + " " + device.group() + " " + device.protocols();
   }
 }

@@ -9,6 +9,8 @@ import java.util.Arrays;
 import java.util.Collections;
 import java.util.Comparator;
 import java.util.List;
+import java.util.Map;
+import java.util.TreeMap;
 
 /**
  * The recorded objects of one device, sorted by OID, each OID once.
@@ -70,6 +72,21 @@ public final class DeviceData {
             }
         }
         return new DeviceData(source, sorted);
+    }
+
+    /**
+     * The objects of several data sets in one, for a MIB layout that serves them all: where two
+     * hold the same OID, the earlier set's object is kept.
+     */
+    public static DeviceData union(List<DeviceData> sets) {
+        if (sets.size() == 1) {
+            return sets.get(0);
+        }
+        Map<Oid, DeviceObject> objects = new TreeMap<>();
+        for (DeviceData set : sets) {
+            set.objects.forEach(object -> objects.putIfAbsent(object.oid(), object));
+        }
+        return new DeviceData("the union of " + sets.size() + " data sets", new ArrayList<>(objects.values()));
     }
 
     /**

@@ -5,6 +5,8 @@ import java.nio.ByteBuffer;
 import java.nio.file.Path;
 import java.util.List;
 import java.util.Optional;
+import java.util.regex.Matcher;
+import java.util.regex.Pattern;
 
 /**
  * A simulated network as a network file describes it: groups of devices, each group on a range of
@@ -30,7 +32,27 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
   public record Log(int level, Path file) {}
 
   /** The address the control interface listens on: a host name or IP literal and a TCP port. */
-  public record Admin(String host, int port) {}
+  public record Admin(String host, int port) {
+    private static final Pattern LISTEN = Pattern.compile("(?:\\[([^\\]]+)\\]|([^:\\[\\]]+)):([0-9]{1,5})");
+
+    /** {@code HOST:PORT} or {@code [IPv6]:PORT}; empty for {@code off}; null when it is neither. */
+    public static Optional<Admin> parse(String text) {
+      if (text.equals("off")) {
+        return Optional.empty();
+      }
+      Matcher address = LISTEN.matcher(text);
+      if (!address.matches() || Integer.parseInt(address.group(3)) < 1 || Integer.parseInt(address.group(3)) > 65535) {
+        return null;
+      }
+      return Optional.of(new Admin(address.group(1) != null ? address.group(1) : address.group(2),
+          Integer.parseInt(address.group(3))));
+    }
+
+    /** What {@link #parse} takes, for messages. */
+    public static String expected() {
+      return "HOST:PORT (such as 127.0.0.1:8161 or [::1]:8161) or off";
+    }
+  }
 
   /**
    * Devices that share their protocols and data. Device i (0-based) is at {@code firstAddress + i}.
@@ -73,7 +95,8 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
     }
   }
 
-  static String dotted(long address) {
+  /** The dotted text of an IPv4 address held as an unsigned 32-bit number. */
+  public static String dotted(long address) {
     return ValueText.ipText(ByteBuffer.allocate(4).putInt((int) address).array());
   }
 }

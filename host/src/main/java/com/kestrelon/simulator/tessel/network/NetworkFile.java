@@ -17,8 +17,6 @@ import java.util.LinkedHashMap;
 import java.util.List;
 import java.util.Map;
 import java.util.Optional;
-import java.util.regex.Matcher;
-import java.util.regex.Pattern;
 import org.yaml.snakeyaml.Yaml;
 import org.yaml.snakeyaml.error.Mark;
 import org.yaml.snakeyaml.error.MarkedYAMLException;
@@ -45,7 +43,6 @@ public final class NetworkFile {
   private static final List<String> SNMP_KEYS = List.of("port", "data", "v3", "read-community", "write-community");
   /** Protocol sections whose devices the host cannot serve yet. */
   private static final List<String> LATER_PROTOCOLS = List.of("tl1", "cli");
-  private static final Pattern LISTEN = Pattern.compile("(?:\\[([^\\]]+)\\]|([^:\\[\\]]+)):([0-9]{1,5})");
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
 
   private final String name;
@@ -127,16 +124,11 @@ public final class NetworkFile {
       Map<String, NodeTuple> keys = mapping(entry.getValueNode(), "admin", List.of("listen"));
       listen = required(keys, "listen", entry.getKeyNode(), "admin");
     }
-    if (isWord(listen.getValueNode(), "off")) {
-      return Optional.empty();
+    Optional<Admin> admin = Admin.parse(text(listen));
+    if (admin == null) {
+      throw fault(listen, "listen takes " + Admin.expected() + ", not '" + text(listen) + "'");
     }
-    Matcher address = LISTEN.matcher(text(listen));
-    if (!address.matches() || Integer.parseInt(address.group(3)) < 1 || Integer.parseInt(address.group(3)) > 65535) {
-      throw fault(listen, "listen takes HOST:PORT (such as 127.0.0.1:8161 or [::1]:8161) or off, not '"
-          + text(listen) + "'");
-    }
-    String host = address.group(1) != null ? address.group(1) : address.group(2);
-    return Optional.of(new Admin(host, Integer.parseInt(address.group(3))));
+    return admin;
   }
 
   private Group group(Node node) throws NetworkFileException {

@@ -1,11 +1,13 @@
 package com.kestrelon.simulator.tessel.snmp;
 
 import com.kestrelon.simulator.tessel.NativeLibrary;
+import java.util.function.IntFunction;
 
 /**
  * The SNMP side of the engine: agent registration and lifecycle, and the value methods the engine
  * calls, concurrently from its request threads, for every Get, GetNext and Set. Values come from
- * a {@link DeviceStore}: the recorded data every device shares plus each agent's own Sets.
+ * the {@link DeviceStore} of the agent's device: the recorded data its devices share plus each
+ * agent's own Sets.
  *
  * <p>What the engine can rely on:
  * <ul>
@@ -36,7 +38,7 @@ public class SnmpHandler {
   private static final String WRONG_VALUE = "10";
   private static final String NOT_WRITABLE = "17";
 
-  private final DeviceStore store;
+  private final IntFunction<DeviceStore> stores;
   private volatile String status = "";
   private volatile int progress;
 
@@ -45,12 +47,14 @@ public class SnmpHandler {
     this(DeviceStore.empty());
   }
 
+  /** A handler whose every agent serves the values of {@code store}. */
   public SnmpHandler(DeviceStore store) {
-    this.store = store;
+    this(agentId -> store);
   }
 
-  public DeviceStore store() {
-    return store;
+  /** A handler whose agent {@code id} serves the values of {@code stores.apply(id)}. */
+  public SnmpHandler(IntFunction<DeviceStore> stores) {
+    this.stores = stores;
   }
 
   public String status() {
@@ -110,7 +114,7 @@ public class SnmpHandler {
 
   private String[] store(int agentId, String oidText, String value) {
     try {
-      String stored = store.set(agentId, oidText, value);
+      String stored = stores.apply(agentId).set(agentId, oidText, value);
       return stored == null ? new String[] {value, NOT_WRITABLE} : new String[] {stored, NO_ERROR};
     } catch (IllegalArgumentException e) {
       return new String[] {value, WRONG_VALUE};
@@ -120,13 +124,13 @@ public class SnmpHandler {
   public String[] ScalarGetOidVal(String label, String groupOid, String subId, String instance,
       String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
       String address, int port, String syntax) {
-    return answer(store.get(agentId, groupOid + "." + subId + instance));
+    return answer(stores.apply(agentId).get(agentId, groupOid + "." + subId + instance));
   }
 
   public String[] ScalarGetNextOidVal(String label, String groupOid, String subId, String instance,
       String previousSubId, String databaseName, String tableName, int dataType, int agentId,
       int rowStatusColumn, String address, int port, String syntax) {
-    return answer(store.get(agentId, groupOid + "." + subId + instance));
+    return answer(stores.apply(agentId).get(agentId, groupOid + "." + subId + instance));
   }
 
   public String[] SetOidVal(String label, String groupOid, String subId, String instance,
@@ -138,13 +142,13 @@ public class SnmpHandler {
   public String[] TableGetOidVal(String label, String entryOid, String column, String instance,
       String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
       String address, int port, String syntax) {
-    return instance == null ? null : answer(store.get(agentId, entryOid + "." + column + instance));
+    return instance == null ? null : answer(stores.apply(agentId).get(agentId, entryOid + "." + column + instance));
   }
 
   public String[] TableGetNextOidVal(String label, String entryOid, String instance, int column,
       int nextColumn, int dataType, int nextDataType, String databaseName, String tableName,
       int agentId, int rowStatusColumn, String address, int port, String syntax) {
-    String[] next = store.nextInColumn(agentId, entryOid, column, instance);
+    String[] next = stores.apply(agentId).nextInColumn(agentId, entryOid, column, instance);
     return next == null ? null : new String[] {next[0], next[1], NO_ERROR};
   }
 
