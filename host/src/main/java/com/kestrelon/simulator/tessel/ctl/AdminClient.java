@@ -110,7 +110,10 @@ final class AdminClient {
       throw new UnreachableException("interrupted while waiting for " + base);
     }
     Optional<JsonElement> json = parse(response.body());
-    if (response.statusCode() >= 400) {
+    // The interface's refusals are {"error": ...}; one is an error whatever the status says.
+    boolean refused = json.filter(JsonElement::isJsonObject).map(element -> element.getAsJsonObject().has("error"))
+        .orElse(false);
+    if (response.statusCode() >= 400 || refused) {
       throw new ApiException(errorMessage(response.statusCode(), json, response.body()));
     }
     return json.orElseThrow(() -> new ApiException(base + " answered " + request.uri().getPath()
