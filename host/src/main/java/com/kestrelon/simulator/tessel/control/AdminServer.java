@@ -22,6 +22,7 @@ import java.util.HashSet;
 import java.util.LinkedHashMap;
 import java.util.List;
 import java.util.Map;
+import java.util.Objects;
 import java.util.Optional;
 import java.util.Set;
 import java.util.concurrent.ExecutorService;
@@ -171,7 +172,8 @@ public final class AdminServer implements AutoCloseable {
       throw new Refusal(403, "the Host header must name this server: localhost or an IP address");
     }
     String method = exchange.getRequestMethod();
-    String path = exchange.getRequestURI().getRawPath();
+    // An opaque request target (such as mailto:x) has no path; it matches no route.
+    String path = Objects.requireNonNullElse(exchange.getRequestURI().getRawPath(), "");
     boolean page = path.equals("/") && method.equals("GET");
     if (!page && !access.authorized(exchange.getRequestHeaders().getFirst("Authorization"))) {
       throw new Refusal(401, "this request needs the header Authorization: Bearer TOKEN",
