@@ -65,20 +65,26 @@ class Network:
 
 class FileNetwork:
     """A network that a network file describes, started by the launcher with its control interface on
-    127.0.0.1:admin_port. `groups` is the YAML text of the file's group list; its log and state stay in a
-    folder of its own. Ready once the launcher's summary line is on standard error."""
+    127.0.0.1:admin_port, which needs `token` when one is given. `groups` is the YAML text of the file's group
+    list; its log, state and token file stay in a folder of its own. Ready once the launcher's summary line is
+    on standard error."""
 
     SUMMARY = re.compile(r"^\d+ devices running: ")
 
-    def __init__(self, groups, admin_port):
+    def __init__(self, groups, admin_port, token=None):
         self.workdir = Path(tempfile.mkdtemp(prefix="tessel-net-"))
         self.admin = f"http://127.0.0.1:{admin_port}"
         path = self.workdir / "network.yaml"
         path.write_text(f"log: {{level: 0, file: tessel.log}}\nstate-dir: {self.workdir / 'state'}\n"
                         f"groups:\n{textwrap.indent(textwrap.dedent(groups).strip(), '  ')}\n")
+        self.token, self.token_file = token, self.workdir / "token"
+        access = ("--admin", f"127.0.0.1:{admin_port}")
+        if token:
+            self.token_file.write_text(f"{token}\n")
+            access += ("--admin-token-file", str(self.token_file))
         self.output = open(self.workdir / "status.txt", "w")  # the engine's status lines
-        self.process = subprocess.Popen(launcher("--network", str(path), "--admin", f"127.0.0.1:{admin_port}"),
-                                        cwd=self.workdir, stdout=self.output, stderr=subprocess.PIPE, text=True)
+        self.process = subprocess.Popen(launcher("--network", str(path), *access), cwd=self.workdir,
+                                        stdout=self.output, stderr=subprocess.PIPE, text=True)
         self.errors = queue.Queue()
         threading.Thread(target=self._read_errors, daemon=True).start()
         self.summary = self._wait_for_summary(time.monotonic() + 60)
@@ -106,6 +112,8 @@ class FileNetwork:
     def api(self, path, method="GET"):
         """The control interface's JSON answer to one request."""
         request = urllib.request.Request(self.admin + path, method=method)
+        if self.token:
+            request.add_header("Authorization", f"Bearer {self.token}")
         with urllib.request.urlopen(request, timeout=10) as answer:
             return json.load(answer)
 

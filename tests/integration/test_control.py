@@ -1,10 +1,15 @@
 """The control interface end to end: `./tessel ctl` and the dashboard in a real browser drive a network
 started from a network file, and SNMP managers see what they did."""
 
+import base64
+import fcntl
 import json
+import os
 import re
+import select
 import shutil
 import subprocess
+import time
 
 import pytest
 
@@ -14,6 +19,7 @@ ROUTER_PORT, HOST_PORT, ADMIN_PORT, SILENT_PORT = BASE_PORT + 4, BASE_PORT + 6, 
 HOST_DATA = ROOT / "host" / "src" / "test" / "resources" / "data" / "linux-host.walk"
 SYS_DESCR = "1.3.6.1.2.1.1.1.0"
 SCREENSHOT = BUILD / "tests" / "integration" / "dashboard.png"
+TOKEN = "integration-token-0123456789"
 
 
 @pytest.fixture(scope="module")
@@ -29,7 +35,7 @@ def network():
           address: 127.0.7.1
           device-name: "host-{{n}}"
           snmp: {{port: {HOST_PORT}, data: {HOST_DATA}}}
-        """, ADMIN_PORT)
+        """, ADMIN_PORT, TOKEN)
     yield net
     assert net.stop() == 0
 
@@ -50,13 +56,13 @@ def test_ctl_stops_and_starts_a_device_that_managers_then_miss_and_find(network)
     described = sys_descr(host)
     assert described and described != sys_descr(router), "each group serves its own data"
 
-    stopped = ctl("stop", "127.0.7.2", "--admin", network.admin)
+    stopped = ctl("stop", "127.0.7.2", "--admin", network.admin, "--token-file", str(network.token_file))
     assert stopped.returncode == 0, stopped.stderr
     assert re.search(r"^127\.0\.7\.2 +host-2 +hosts +stopped$", stopped.stdout, re.M), stopped.stdout
     assert sys_descr(host) is None
     assert sys_descr(router), "the other devices keep serving"
 
-    listed = ctl("--json", "--admin", network.admin, "devices")
+    listed = ctl("--json", "--admin", network.admin, "--token-file", str(network.token_file), "devices")
     assert listed.returncode == 0, listed.stderr
     devices = json.loads(listed.stdout)
     assert devices["total"] == 5
@@ -64,44 +70,116 @@ def test_ctl_stops_and_starts_a_device_that_managers_then_miss_and_find(network)
         "127.0.6.1": ("routers", {"snmp": "running"}), "127.0.6.2": ("routers", {"snmp": "running"}),
         "127.0.6.3": ("routers", {"snmp": "running"}), "127.0.7.1": ("hosts", {"snmp": "running"}),
         "127.0.7.2": ("hosts", {"snmp": "stopped"})}
-    only_stopped = ctl("devices", "--state", "stopped", "--admin", network.admin)
+    only_stopped = ctl("--token-file", str(network.token_file), "devices", "--state", "stopped", "--admin", network.admin)
     assert [line.split()[0] for line in only_stopped.stdout.splitlines()[1:]] == ["127.0.7.2"]
 
-    started = ctl("--admin", network.admin, "start", "127.0.7.2", "--protocol", "snmp")
+    started = ctl("--admin", network.admin, "start", "127.0.7.2", "--protocol", "snmp", "--token-file",
+                  str(network.token_file))
     assert started.returncode == 0, started.stderr
     assert sys_descr(host) == described
 
 
 def test_ctl_exit_status_tells_a_refusal_from_a_silent_network(network):
-    unknown = ctl("device", "127.0.9.9", "--admin", network.admin)
-    assert unknown.returncode == 1 and unknown.stderr.strip(), unknown
+    unknown = ctl("device", "127.0.9.9", "--admin", network.admin, "--token-file", str(network.token_file))
+    assert unknown.returncode == 1 and "127.0.9.9" in unknown.stderr, unknown
+    without_token = ctl("device", "127.0.6.1", "--admin", network.admin)
+    assert without_token.returncode == 1 and "Bearer" in without_token.stderr, without_token
     silent = ctl("stats", "--admin", f"127.0.0.1:{SILENT_PORT}")
     assert silent.returncode == 3 and f"http://127.0.0.1:{SILENT_PORT}" in silent.stderr, silent
 
 
-def chromium(directory, *args):
-    """Headless Chromium with a profile of its own on the dashboard, after its first refreshes."""
-    assert shutil.which("chromium"), "chromium is missing: ./tessel installs it"
-    return subprocess.run(["chromium", "--headless", "--no-sandbox", "--disable-gpu", f"--user-data-dir={directory}",
-                           "--virtual-time-budget=6000", "--window-size=1280,1000", *args],
-                          capture_output=True, text=True, timeout=120)
+class Browser:
+    """Headless Chromium with a profile of its own, driven through the DevTools protocol on a pipe (it reads
+    commands from descriptor 3 and writes answers to descriptor 4, each a JSON text ending in a NUL)."""
+
+    def __init__(self, directory):
+        assert shutil.which("chromium"), "chromium is missing: ./tessel installs it"
+        commands, self.commands = os.pipe()
+        self.answers, answers = os.pipe()
+
+        def descriptors():  # in the child: the pipe ends at 3 and 4, kept across exec
+            low = [fcntl.fcntl(fd, fcntl.F_DUPFD, 10) for fd in (commands, answers)]
+            os.dup2(low[0], 3)
+            os.dup2(low[1], 4)
+
+        self.process = subprocess.Popen(
+            ["chromium", "--headless", "--no-sandbox", "--disable-gpu", "--remote-debugging-pipe",
+             f"--user-data-dir={directory}", "--window-size=1280,1000", "about:blank"],
+            close_fds=False, preexec_fn=descriptors, stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
+            stderr=subprocess.DEVNULL)
+        os.close(commands)
+        os.close(answers)
+        self.pending, self.next_id, self.session = b"", 0, None
+
+    def call(self, method, **params):
+        self.next_id += 1
+        message = {"id": self.next_id, "method": method, "params": params}
+        if self.session:
+            message["sessionId"] = self.session
+        os.write(self.commands, json.dumps(message).encode() + b"\0")
+        deadline = time.monotonic() + 30
+        while True:
+            while b"\0" not in self.pending:
+                assert select.select([self.answers], [], [], max(0, deadline - time.monotonic()))[0], f"no answer to {method}"
+                chunk = os.read(self.answers, 1 << 16)
+                assert chunk, "chromium closed its DevTools pipe"
+                self.pending += chunk
+            text, self.pending = self.pending.split(b"\0", 1)
+            answer = json.loads(text)
+            if answer.get("id") == self.next_id:
+                assert "error" not in answer, answer
+                return answer["result"]
+
+    def open(self, url):
+        target = self.call("Target.createTarget", url=url)["targetId"]
+        self.session = self.call("Target.attachToTarget", targetId=target, flatten=True)["sessionId"]
+
+    def evaluate(self, expression):
+        result = self.call("Runtime.evaluate", expression=expression, awaitPromise=True, returnByValue=True)
+        assert "exceptionDetails" not in result, result
+        return result["result"].get("value")
+
+    def wait_for(self, expression, timeout=20):
+        """Until `expression` holds; it may fail while the page is still loading."""
+        deadline = time.monotonic() + timeout
+        while not self.evaluate(f"(() => {{ try {{ return {expression}; }} catch (e) {{ return false; }} }})()"):
+            assert time.monotonic() < deadline, f"the page never showed {expression}"
+            time.sleep(0.2)
+
+    def screenshot(self, path):
+        path.parent.mkdir(parents=True, exist_ok=True)
+        path.write_bytes(base64.b64decode(self.call("Page.captureScreenshot")["data"]))
+
+    def close(self):
+        self.process.terminate()
+        self.process.wait(timeout=15)
+        os.close(self.commands)
+        os.close(self.answers)
 
 
-def test_dashboard_shows_the_network_in_a_browser(network, tmp_path):
+def test_dashboard_asks_for_the_token_then_shows_and_starts_a_stopped_device(network, tmp_path):
     network.api("/api/devices/127.0.6.2/stop", "POST")
+    browser = Browser(tmp_path / "profile")
     try:
-        page = chromium(tmp_path / "profile", "--dump-dom", network.admin + "/")
-        dom = page.stdout
-        assert 'data-refreshed="' in dom, f"the page never finished a refresh: {page.stderr[-2000:]}"
-        assert re.search(r'id="device-count">5<', dom)
-        row = re.search(r'<tr[^>]*id="device-127\.0\.6\.2"[^>]*>(.*?)</tr>', dom, re.S)
-        assert row and "R2" in row.group(1) and ">stopped<" in row.group(1), dom
-        routers = re.search(r'<tr data-group="routers">(.*?)</tr>', dom, re.S)
-        assert routers and re.search(r'data-state="stopped">1<', routers.group(1)), dom
-
-        SCREENSHOT.parent.mkdir(parents=True, exist_ok=True)
+        browser.open(network.admin + "/")
+        browser.wait_for('!document.getElementById("token-form").hidden')
+        assert browser.evaluate('document.getElementById("device-count").textContent') == "–"
+        browser.evaluate(f'document.getElementById("token-input").value = "{TOKEN}";'
+                         'document.querySelector("#token-form form").requestSubmit()')
+        browser.wait_for("document.body.dataset.refreshed")  # a whole refresh with the token
+        assert browser.evaluate('document.getElementById("device-count").textContent') == "5"
+        state = 'document.querySelector(\'tr[data-address="127.0.6.2"] .state\').textContent'
+        assert browser.evaluate(state) == "stopped"
+        assert browser.evaluate('document.querySelector(\'tr[data-group="routers"] [data-state="stopped"]\')'
+                                '.textContent') == "1"
+        assert browser.evaluate('document.querySelector(\'tr[data-address="127.0.6.2"]\').textContent').startswith(
+            "127.0.6.2R2routers")
         SCREENSHOT.unlink(missing_ok=True)
-        chromium(tmp_path / "profile", f"--screenshot={SCREENSHOT}", network.admin + "/")
+        browser.screenshot(SCREENSHOT)
         assert SCREENSHOT.stat().st_size > 10_000
+
+        browser.evaluate('document.querySelector(\'tr[data-address="127.0.6.2"] [data-action="start"]\').click()')
+        browser.wait_for(f'{state} === "running"')
+        assert network.api("/api/devices/127.0.6.2")["protocols"] == {"snmp": "running"}
     finally:
-        network.api("/api/devices/127.0.6.2/start", "POST")
+        browser.close()
