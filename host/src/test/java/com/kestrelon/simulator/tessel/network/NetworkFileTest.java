@@ -139,6 +139,7 @@ class NetworkFileTest {
         "public", "private");
     assertEquals(List.of(new Group("routers", 100, 0x7F00_0101L, "R{n}", Optional.of(snmp))), network.groups());
     assertEquals(Optional.of(new Admin("127.0.0.1", 8161)), network.admin());
+    assertEquals(Path.of(System.getProperty("user.home"), ".local/state/tessel"), network.stateDir());
   }
 
   private Path write(String yaml) throws Exception {
