@@ -194,7 +194,6 @@ class AdminServerTest {
       POST   | /api/devices/127.0.1.1/stop       | application/json | '{"protocl": "snmp"}'     | 400 | -
       POST   | /api/devices/127.0.1.1/stop       | application/json | '{"protocol": snmp}'      | 400 | -
       POST   | /api/devices/127.0.1.1/stop       | application/json | '{} {}'                   | 400 | -
-      POST   | /api/devices/127.0.1.1/stop       | text/plain       | protocol=snmp             | 415 | -
       POST   | /api/devices/127.0.1.1/stop       | text/plain       | ''                        | 415 | -
       POST   | /api/devices/127.0.1.1/stop       | -                | '{"protocol": "snmp"}'    | 415 | -
       POST   | /api/devices/10.0.0.1/stop        | -                | -                         | 404 | -
