@@ -1,0 +1,226 @@
+#include "notify/notifier.h"
+
+#include <arpa/inet.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <thread>
+
+#include "engine/agent_registry.h"
+#include "snmp/message.h"
+#include "snmp/service.h"
+#include "support/snmp_agent_fixture.h"
+
+namespace tessel {
+namespace {
+
+const std::uint16_t kDevicePort = static_cast<std::uint16_t>(20005 + (::getpid() % 300) * 40);
+const std::string kDevice = "127.78.1.1";
+constexpr std::int32_t kAgentId = 41;
+
+// A manager's UDP socket on loopback.
+class ManagerSocket {
+ public:
+  ManagerSocket() {
+    sockaddr_in address{AF_INET, 0, {}, {}};
+    inet_pton(AF_INET, "127.0.0.1", &address.sin_addr);
+    bind(socket_, reinterpret_cast<sockaddr*>(&address), sizeof address);
+    socklen_t length = sizeof address;
+    getsockname(socket_, reinterpret_cast<sockaddr*>(&address), &length);
+    port_ = ntohs(address.sin_port);
+  }
+  ~ManagerSocket() { close(socket_); }
+  std::uint16_t Port() const { return port_; }
+
+  // The next datagram within the wait and where it came from ("address:port").
+  std::optional<std::pair<std::vector<std::uint8_t>, std::string>> Receive(int waitMs = 2000) {
+    pollfd ready{socket_, POLLIN, 0};
+    if (poll(&ready, 1, waitMs) != 1) return std::nullopt;
+    std::vector<std::uint8_t> datagram(kMaxSnmpMessage);
+    sockaddr_in source{};
+    socklen_t length = sizeof source;
+    ssize_t size = recvfrom(socket_, datagram.data(), datagram.size(), 0,
+                            reinterpret_cast<sockaddr*>(&source), &length);
+    if (size <= 0) return std::nullopt;
+    datagram.resize(static_cast<std::size_t>(size));
+    char text[INET_ADDRSTRLEN] = {};
+    inet_ntop(AF_INET, &source.sin_addr, text, sizeof text);
+    return std::make_pair(datagram,
+                          std::string(text) + ":" + std::to_string(ntohs(source.sin_port)));
+  }
+  void SendToDevice(const std::vector<std::uint8_t>& datagram) {
+    sockaddr_in to{AF_INET, htons(kDevicePort), {}, {}};
+    inet_pton(AF_INET, kDevice.c_str(), &to.sin_addr);
+    sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
+           sizeof to);
+  }
+
+ private:
+  int socket_ = ::socket(AF_INET, SOCK_DGRAM, 0);
+  std::uint16_t port_ = 0;
+};
+
+// Where the PDU of a community message starts: behind 30 82 LL LL, the version and community.
+std::size_t PduOffset(const std::vector<std::uint8_t>& message) { return 4 + 3 + 2 + message[8]; }
+
+// Parses an SNMPv2-Trap or InformRequest (the codec refuses traps: read it as an inform).
+std::optional<SnmpPdu> ParseV2Notification(std::vector<std::uint8_t> message) {
+  std::uint8_t& type = message.at(PduOffset(message));
+  if (type != kTrapV2 && type != kInformRequest) return std::nullopt;
+  type = kInformRequest;
+  SnmpPdu pdu;
+  if (ParseSnmpMessage(message.data(), message.size(), &pdu) != 1) return std::nullopt;
+  return pdu;
+}
+
+bool Contains(const std::vector<std::uint8_t>& bytes, const std::vector<std::uint8_t>& part) {
+  return std::search(bytes.begin(), bytes.end(), part.begin(), part.end()) != bytes.end();
+}
+
+class NotifierTest : public SnmpAgentTest {
+ protected:
+  void SetUp() override {
+    SnmpAgentTest::SetUp();
+    InitSnmpParams();
+    ASSERT_GT(
+        FillAgentInfoAndStartAgent({kAgentId, kDevice, kDevicePort, {"public"}, {}, 0, "", "", 0}),
+        0);
+    ASSERT_TRUE(InitSnmpGeneralServices());
+    InitNotifications();
+  }
+  void TearDown() override {
+    StopNotifications();
+    StopSnmpGeneralServices();
+    FreeSimulatorResources();
+    InstallSessionTransport(nullptr, nullptr);
+    SnmpAgentTest::TearDown();
+  }
+
+  NotificationRequest Request(std::uint8_t type, std::int32_t version) const {
+    NotificationRequest request;
+    request.pduType = type;
+    request.version = version;
+    request.managerHost = "127.0.0.1";
+    request.managerPort = manager_.Port();
+    request.community = "public";
+    request.enterprise = "1.3.6.1.4.1.99";
+    request.genericTrap = 6;
+    request.specificTrap = 7;
+    request.trapOid = ".1.3.6.1.4.1.99.0.7";
+    request.bindings = {std::vector<std::string>{"1.3.6.1.2.1.2.2.1.1.2"},
+                        std::vector<std::int32_t>{kAsnInteger}, std::vector<std::string>{"2"}};
+    request.agentId = kAgentId;
+    request.agentText = kDevice;
+    return request;
+  }
+  static bool WaitFor(const std::function<bool()>& done) {
+    for (int wait = 0; wait < 400 && !done(); ++wait)
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    return done();
+  }
+
+  ManagerSocket manager_;
+  const std::string device_ = kDevice + ":" + std::to_string(kDevicePort);
+};
+
+// Traps leave from the device's own address and SNMP port, in the manager's version: a v2c
+// manager gets the SNMPv2-Trap with its bindings, a v1 manager the same trap as an SNMPv1 Trap
+// whose agent-addr is the device.
+TEST_F(NotifierTest, TrapsLeaveFromTheDeviceInTheManagersVersion) {
+  ASSERT_EQ(SendNotification(Request(kTrapV2, kSnmpV2c)).result, NotifyResult::kSent);
+  auto received = manager_.Receive();
+  ASSERT_TRUE(received);
+  EXPECT_EQ(received->second, device_);
+  std::optional<SnmpPdu> pdu = ParseV2Notification(received->first);
+  ASSERT_TRUE(pdu);
+  EXPECT_EQ(pdu->community, "public");
+  ASSERT_EQ(pdu->requestVarBinds.size(), 3u);
+  EXPECT_EQ(pdu->requestVarBinds[1].value.oid, O("1.3.6.1.4.1.99.0.7"));
+  EXPECT_EQ(pdu->requestVarBinds[2].value, VarValue::Integer(2));
+
+  ASSERT_EQ(SendNotification(Request(kTrapV2, kSnmpV1)).result, NotifyResult::kSent);
+  received = manager_.Receive();
+  ASSERT_TRUE(received);
+  EXPECT_EQ(received->second, device_);
+  EXPECT_EQ(received->first.at(PduOffset(received->first)), kTrapV1);
+  // enterprise 1.3.6.1.4.1.99, agent-addr 127.78.1.1, generic 6, specific 7
+  EXPECT_TRUE(Contains(received->first, {0x06, 0x06, 0x2b, 6, 1,    4, 1, 99,   0x40, 4,
+                                         127,  78,   1,    1, 0x02, 1, 6, 0x02, 1,    7}));
+}
+
+TEST_F(NotifierTest, RefusedNotificationsSendNothing) {
+  NotificationRequest shortValues = Request(kTrapV2, kSnmpV2c);
+  shortValues.bindings = {std::vector<std::string>{"1.3.6.1.1", "1.3.6.1.2", "1.3.6.1.3"},
+                          std::vector<std::int32_t>{2, 2, 2}, std::vector<std::string>{"1", "2"}};
+  EXPECT_EQ(SendNotification(shortValues).result, NotifyResult::kBadArrays);
+  NotificationRequest badValue = Request(kTrapV2, kSnmpV2c);
+  (*badValue.bindings.values)[0] = "4294967296";  // beyond 32 bits
+  EXPECT_EQ(SendNotification(badValue).result, NotifyResult::kBadBinding);
+  NotificationRequest unresolved = Request(kTrapV2, kSnmpV2c);
+  unresolved.managerHost = "1:::2";
+  EXPECT_EQ(SendNotification(unresolved).result, NotifyResult::kUnresolved);
+  NotificationRequest noDevice = Request(kTrapV2, kSnmpV2c);
+  noDevice.agentId = kAgentId + 1;
+  EXPECT_EQ(SendNotification(noDevice).result, NotifyResult::kNoDevice);
+  EXPECT_EQ(SendNotification(Request(kInformRequest, kSnmpV1)).result, NotifyResult::kNoForm);
+  EXPECT_FALSE(manager_.Receive(200));
+
+  NotificationRequest noBindings = Request(kTrapV1, kSnmpV1);
+  noBindings.bindings = {};
+  EXPECT_EQ(SendNotification(noBindings).result, NotifyResult::kSent);
+  EXPECT_TRUE(manager_.Receive());
+}
+
+// A Response from another port of the manager's host does not acknowledge the inform; the one
+// from the manager does, and the host is told with the Response's bindings.
+TEST_F(NotifierTest, InformIsAcknowledgedOnlyByTheManagerItWasSentTo) {
+  NotifyOutcome outcome = SendNotification(Request(kInformRequest, kSnmpV2c));
+  ASSERT_EQ(outcome.result, NotifyResult::kSent);
+  auto received = manager_.Receive();
+  ASSERT_TRUE(received);
+  EXPECT_EQ(received->second, device_);
+  std::vector<std::uint8_t> response = received->first;
+  ASSERT_EQ(response.at(PduOffset(response)), kInformRequest);
+  response[PduOffset(response)] = kGetResponse;
+
+  ManagerSocket spoofer;
+  spoofer.SendToDevice(response);
+  std::this_thread::sleep_for(std::chrono::milliseconds(200));
+  EXPECT_EQ(PendingInforms(), 1u);
+  EXPECT_TRUE(host_.AnsweredInforms().empty());
+
+  manager_.SendToDevice(response);
+  ASSERT_TRUE(WaitFor([&] { return !host_.AnsweredInforms().empty(); }));
+  EXPECT_EQ(PendingInforms(), 0u);
+  InformReport report = host_.AnsweredInforms()[0];
+  EXPECT_EQ(report.informId, outcome.informId);
+  EXPECT_EQ(report.managerPort, manager_.Port());
+  EXPECT_EQ(report.deviceAddress, kDevice);
+  ASSERT_EQ(report.oids.size(), 3u);
+  EXPECT_EQ(report.oids[1], ".1.3.6.1.6.3.1.1.4.1.0");
+  EXPECT_EQ(report.types[2], "Integer");
+  EXPECT_EQ(report.values[2], "2");
+  EXPECT_TRUE(host_.DroppedInforms().empty());
+}
+
+// Nobody answers: the inform is sent 1 + retries times, a timeout apart, then reported dropped.
+TEST_F(NotifierTest, UnansweredInformIsResentThenReportedDropped) {
+  NotificationRequest request = Request(kInformRequest, kSnmpV2c);
+  request.timeout = 1;
+  request.retries = 1;
+  auto start = std::chrono::steady_clock::now();
+  ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
+  ASSERT_TRUE(manager_.Receive());
+  ASSERT_TRUE(manager_.Receive(3000));
+  EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(900));
+  ASSERT_TRUE(WaitFor([&] { return !host_.DroppedInforms().empty(); }));
+  EXPECT_FALSE(manager_.Receive(100));
+  EXPECT_EQ(host_.DroppedInforms()[0].managerPort, manager_.Port());
+  EXPECT_EQ(host_.DroppedInforms()[0].community, "public");
+  EXPECT_EQ(PendingInforms(), 0u);
+}
+
+}  // namespace
+}  // namespace tessel
