@@ -232,12 +232,12 @@ NotifyOutcome SendNotification(const NotificationRequest& request) {
   return Deliver(*pdu, target, *device);
 }
 
-bool ReceiveResponse(const SnmpPdu& pdu, const AgentSession& agent) {
+bool AcknowledgeInform(InformList& informs, const SnmpPdu& pdu, const AgentSession& agent) {
   ResponseOrigin origin;
   origin.device = {agent.transport.localAddress, ConfiguredPort(agent.transport)};
   origin.manager = agent.transport.peerSockAddr;
   origin.community = pdu.community;
-  std::optional<PendingInform> answered = Informs().Acknowledge(origin, pdu.requestId);
+  std::optional<PendingInform> answered = informs.Acknowledge(origin, pdu.requestId);
   if (!answered) {
     LOG_TRACE("No inform is outstanding: the response is dropped\n");
     return false;
@@ -251,6 +251,10 @@ bool ReceiveResponse(const SnmpPdu& pdu, const AgentSession& agent) {
   if (HostBridge* host = InstalledHost()) host->LogResponseMessage(report);
   LOG_INFO("\n Inform Id = %u \n", answered->informId);
   return true;
+}
+
+bool ReceiveResponse(const SnmpPdu& pdu, const AgentSession& agent) {
+  return AcknowledgeInform(Informs(), pdu, agent);
 }
 
 void InitNotifications() {

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "engine/agent.h"
+#include "notify/inform_list.h"
 #include "snmp/pdu.h"
 
 namespace tessel {
@@ -66,8 +67,10 @@ void InitNotifications();
 void StopNotifications();
 std::size_t PendingInforms();
 
-// Acknowledges the inform a Response answers, and tells the host; false when it answers none.
-// The receiver installed for agents' Responses.
+// Acknowledges the inform of informs that a Response reaching agent answers, and tells the host;
+// false when it answers none. ReceiveResponse, the receiver installed for agents' Responses, does
+// so with the engine's informs.
+bool AcknowledgeInform(InformList& informs, const SnmpPdu& pdu, const AgentSession& agent);
 bool ReceiveResponse(const SnmpPdu& pdu, const AgentSession& agent);
 
 }  // namespace tessel
