@@ -149,6 +149,21 @@ void SendV2(JNIEnv* env, jstring host, jint port, jstring community, jstring tra
   });
 }
 
+void SendV3(JNIEnv* env, jstring host, jint port, jstring community, jstring trapOid,
+            jstring userName, jstring contextName, jobjectArray oids, jintArray types,
+            jobjectArray values, jint agentId, jstring agentText) {
+  GuardedVoid([&] {
+    NotificationRequest request =
+        Notification(env, host, port, community, oids, types, values, agentId, agentText);
+    request.pduType = kTrapV2;
+    request.version = kSnmpV3;
+    request.trapOid = Text(env, trapOid);
+    request.userName = Text(env, userName);
+    request.contextName = Text(env, contextName);
+    SendNotification(request);
+  });
+}
+
 }  // namespace
 }  // namespace tessel
 
@@ -369,6 +384,14 @@ JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_
     jobjectArray oids, jintArray types, jobjectArray values, jint agentId, jstring agentText,
     jint selector) {
   SendV2(env, host, port, community, trapOid, oids, types, values, agentId, agentText, selector);
+}
+
+JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_SendV3Trap(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jstring userName, jstring contextName, jobjectArray oids, jintArray types, jobjectArray values,
+    jint agentId, jstring agentText) {
+  SendV3(env, host, port, community, trapOid, userName, contextName, oids, types, values, agentId,
+         agentText);
 }
 
 // ---- com.kestrelon.simulator.tessel.snmp.SnmpInformInterfaceImpl ----

@@ -13,6 +13,7 @@
 #include "notify/inform_list.h"
 #include "notify/notification_log.h"
 #include "notify/trap_pdu.h"
+#include "notify/v3_notification.h"
 #include "snmp/agent_sockets.h"
 #include "snmp/message.h"
 #include "snmp/statistics.h"
@@ -182,11 +183,19 @@ NotifyOutcome Deliver(const SnmpPdu& built, const NotificationTarget& target,
                       const AgentSession& device) {
   std::optional<SnmpPdu> pdu =
       NotificationForVersion(built, target.version, AgentAddressOf(device.transport.localAddress));
-  if (!pdu) return {NotifyResult::kNoForm};
-  pdu->community = target.community;
+  if (!pdu || (target.version == kSnmpV3 && pdu->type == kInformRequest)) {
+    LOG_ERROR("The notification has no form for an SNMP version %d manager\n", target.version);
+    return {NotifyResult::kNoForm};
+  }
+  pdu->community = target.version == kSnmpV3 ? "" : target.community;
   pdu->requestId = NextNotificationRequestId();
   DumpNotification(target, *pdu);
-  std::vector<std::uint8_t> message = EncodeNotification(*pdu);
+  V3Refusal refusal = V3Refusal::kNone;
+  std::vector<std::uint8_t> message = target.version == kSnmpV3
+                                          ? EncodeV3Trap(*pdu, target, device, &refusal)
+                                          : EncodeNotification(*pdu);
+  if (refusal != V3Refusal::kNone && refusal != V3Refusal::kNotEncoded)
+    return {NotifyResult::kRefused};
   if (message.empty()) return {NotifyResult::kNoForm};
   DeviceEndpoint endpoint{device.transport.localAddress, ConfiguredPort(device.transport)};
   if (pdu->type != kInformRequest) {
@@ -214,6 +223,8 @@ NotifyOutcome SendNotification(const NotificationRequest& request) {
   NotificationTarget target;
   target.version = request.version;
   target.community = request.community;
+  target.userName = request.userName;
+  target.contextName = request.contextName;
   target.timeout = request.timeout;
   target.retries = request.retries;
   if (!ResolveManager(request.managerHost, static_cast<std::uint16_t>(request.managerPort),

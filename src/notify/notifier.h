@@ -1,9 +1,9 @@
 // Notifications that the host asks a device to send: an SNMPv1 Trap, an SNMPv2-Trap or an
-// InformRequest to one manager, built once, put in the form of the manager's version and sent from
-// the device's own address and SNMP port (its agent socket), so that the manager sees the device
-// as the sender and answers an inform there. Informs are kept until a Response from that manager
-// acknowledges them, and sent again or dropped by the inform timer; the host is told of each
-// answered and each dropped inform. Safe from any thread.
+// InformRequest (SNMPv1 and SNMPv2c; over SNMPv3 traps only) to one manager, built once, put in the
+// form of the manager's version and sent from the device's own address and SNMP port (its agent
+// socket), so that the manager sees the device as the sender and answers an inform there. Informs
+// are kept until a Response from that manager acknowledges them, and sent again or dropped by the
+// inform timer; the host is told of each answered and each dropped inform. Safe from any thread.
 #pragma once
 
 #include <cstdint>
@@ -30,7 +30,9 @@ struct NotificationRequest {
   std::int32_t version = kSnmpV2c;  // the manager's
   std::string managerHost;          // a name, an IPv4 address, or an IPv6 address (it has ':')
   std::int32_t managerPort = 162;
-  std::string community;
+  std::string community;  // SNMPv1 and SNMPv2c
+  std::string userName;   // SNMPv3: a user of the engine's USM table, sent at its level
+  std::string contextName;
   // SNMPv1 form: the enterprise, generic-trap and specific-trap.
   std::string enterprise;
   std::int32_t genericTrap = 0;
@@ -51,6 +53,7 @@ enum class NotifyResult {
   kUnresolved,  // the manager host
   kNoDevice,    // no started device has that agent ID
   kNoForm,      // the notification has no form for the manager's version, or does not fit
+  kRefused,     // SNMPv3: an unknown user or context, or the user's notify view excludes it
   kNotSent,     // the device's socket refused it (an inform is then reported dropped)
 };
 

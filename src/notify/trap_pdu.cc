@@ -97,6 +97,23 @@ void WriteV1TrapFields(MessageWriter& writer, const SnmpPdu& pdu) {
   });
 }
 
+void WritePdu(MessageWriter& writer, const SnmpPdu& pdu) {
+  std::uint8_t* body = writer.Open(pdu.type);
+  if (pdu.type == kTrapV1) {
+    WriteV1TrapFields(writer, pdu);
+  } else {
+    writer.Integer(pdu.requestId).Integer(0).Integer(0);
+  }
+  std::uint8_t* list = writer.Open(kAsnSequence);
+  for (const VarBind& binding : pdu.requestVarBinds) {
+    writer.Add([&](std::uint8_t* at, std::int32_t* room) {
+      return BuildVarOp(at, binding.name.data(), binding.name.size(), binding.value, room);
+    });
+  }
+  writer.Close(list, kAsnSequence);
+  writer.Close(body, pdu.type);
+}
+
 }  // namespace
 
 AgentAddress AgentAddressOf(const std::string& deviceAddress) {
@@ -203,24 +220,17 @@ std::optional<SnmpPdu> NotificationForVersion(const SnmpPdu& pdu, std::int32_t v
   return converted;
 }
 
+std::vector<std::uint8_t> EncodeNotificationPdu(const SnmpPdu& pdu) {
+  MessageWriter writer;
+  WritePdu(writer, pdu);
+  return writer.Take();
+}
+
 std::vector<std::uint8_t> EncodeNotification(const SnmpPdu& pdu) {
   MessageWriter writer;
   std::uint8_t* message = writer.Open(kAsnSequence);
   writer.Integer(pdu.version).Octets(kAsnOctetString, pdu.community);
-  std::uint8_t* body = writer.Open(pdu.type);
-  if (pdu.type == kTrapV1) {
-    WriteV1TrapFields(writer, pdu);
-  } else {
-    writer.Integer(pdu.requestId).Integer(0).Integer(0);
-  }
-  std::uint8_t* list = writer.Open(kAsnSequence);
-  for (const VarBind& binding : pdu.requestVarBinds) {
-    writer.Add([&](std::uint8_t* at, std::int32_t* room) {
-      return BuildVarOp(at, binding.name.data(), binding.name.size(), binding.value, room);
-    });
-  }
-  writer.Close(list, kAsnSequence);
-  writer.Close(body, pdu.type);
+  WritePdu(writer, pdu);
   writer.Close(message, kAsnSequence);
   std::vector<std::uint8_t> encoded = writer.Take();
   if (encoded.empty()) LOG_ERROR("Send Trap Message is failed....\n");

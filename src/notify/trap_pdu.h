@@ -60,5 +60,7 @@ std::optional<SnmpPdu> NotificationForVersion(const SnmpPdu& pdu, std::int32_t v
 // The whole SNMPv1/SNMPv2c message that carries the notification, with pdu.version and
 // pdu.community; empty when it does not fit in a message of kMaxSnmpMessage octets.
 std::vector<std::uint8_t> EncodeNotification(const SnmpPdu& pdu);
+// The PDU alone, for the scoped PDU of an SNMPv3 message; empty when it does not fit.
+std::vector<std::uint8_t> EncodeNotificationPdu(const SnmpPdu& pdu);
 
 }  // namespace tessel

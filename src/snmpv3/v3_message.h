@@ -7,8 +7,10 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <string>
 
 #include "engine/agent.h"
+#include "snmpv3/usm_crypto.h"
 
 namespace tessel {
 
@@ -27,6 +29,31 @@ enum class V3Counter : int {
 };
 std::uint32_t V3Count(V3Counter counter);
 void ResetV3Statistics();
+
+// What an SNMPv3 message carries around its PDU: the header, the user-based security parameters
+// (keys already localised to engineId) and the scoped PDU's context.
+struct V3Envelope {
+  std::int32_t msgId = 0;
+  std::int32_t msgMaxSize = 0;
+  std::uint8_t level = kNoAuthNoPriv;
+  bool reportable = false;
+  std::string engineId;  // msgAuthoritativeEngineID
+  std::uint32_t boots = 0;
+  std::uint32_t time = 0;
+  std::string userName;
+  AuthProtocol auth = AuthProtocol::kNone;
+  std::string authKey;
+  PrivProtocol priv = PrivProtocol::kNone;
+  std::string privKey;
+  std::string contextEngineId;
+  std::string contextName;
+};
+
+// Encodes the whole message around an encoded PDU into out (capacity *length in, the message's
+// length out): the scoped PDU, encrypted at authPriv, and the digest at authNoPriv and above.
+// False when it does not fit or a cryptographic step fails.
+bool EncodeV3Message(const V3Envelope& envelope, const std::uint8_t* pdu, std::size_t pduLength,
+                     std::uint8_t* out, std::size_t* length);
 
 // Processes one SNMPv3 datagram for the agent, as ProcessSnmpMessage does for v1/v2c: 1 send the
 // reply (a Response or a Report) in reply/*replyLength, 0 drop, 99 memory exhausted.

@@ -21,10 +21,12 @@ FIELDS = "%b|%a|%N|%w|%q|%P|%v\n"
 
 
 def probe(manager_port, kind, trap, *bindings, community="public"):
-    """Runs NotifyProbe; what it reports (the engine's status lines left out)."""
+    """Runs NotifyProbe, with the default SNMPv3 users; what it reports (the engine's status lines
+    left out)."""
     jars = sorted(BUILD.glob("host/tessel-host*.jar"))
     assert len(jars) == 2, f"host jars not found under {BUILD}/host"
     command = [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
+               f"-Dtessel.snmpv3={ROOT / 'profiles' / 'snmpv3.conf'}",
                "-cp", ":".join(str(j) for j in jars) + ":/usr/share/java/gson.jar",
                "com.kestrelon.simulator.tessel.snmp.NotifyProbe", DEVICE, str(DEVICE_PORT), "127.0.0.1",
                str(manager_port), kind, community, trap, *bindings]
@@ -38,7 +40,11 @@ def trapd():
     """snmptrapd logging every notification with community public, one line each."""
     workdir = tempfile.mkdtemp(prefix="tessel-trapd-")
     config, log = Path(workdir) / "snmptrapd.conf", Path(workdir) / "traps.log"
-    config.write_text("authCommunity log public\n")
+    engine_id = f"{DEVICE}#{DEVICE_PORT}".encode().hex()
+    config.write_text("authCommunity log public\n"
+                      f"createUser -e 0x{engine_id} shaaes SHA shapassword AES aespassword\n"
+                      f"createUser -e 0x{engine_id} restricted SHA restrictedpw\n"
+                      "authUser log shaaes\nauthUser log restricted auth\n")
     process = subprocess.Popen(
         ["snmptrapd", "-f", "-C", "-c", str(config), "-M", "/dev/null", "-m", "", "-n", "-On",
          "-Lf", str(log), "-F", FIELDS, f"udp:127.0.0.1:{TRAPD_PORT}"],
@@ -105,3 +111,26 @@ def test_inform_nobody_answers_is_sent_once_then_reported_dropped():
         assert sends[0][1] == (DEVICE, DEVICE_PORT)
     finally:
         silent.close()
+
+
+def test_v3_traps_arrive_authenticated_and_encrypted_and_only_within_the_notify_view(trapd):
+    before = len(trapd(0, wait=0))
+    assert probe(TRAPD_PORT, "v3trap", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.2.2.1.1.2", "2", "2",
+                 community="shaaes") == ["sent"]
+    # restricted's notify view leaves out the interfaces group: this one is not sent ...
+    assert probe(TRAPD_PORT, "v3trap", "1.3.6.1.4.1.99.0.8", "1.3.6.1.2.1.2.2.1.1.2", "2", "2",
+                 community="restricted") == ["sent"]
+    # ... and this one is.
+    assert probe(TRAPD_PORT, "v3trap", "1.3.6.1.4.1.99.0.9", "1.3.6.1.2.1.1.5.0", "4", "core-7",
+                 community="restricted") == ["sent"]
+    rows = trapd(before + 2)[before:]
+    time.sleep(0.5)
+    assert len(trapd(0, wait=0)) == before + 2, "the trap outside the notify view is not sent"
+    private, authenticated = rows
+    for row in rows:
+        assert source(row) == f"{DEVICE}:{DEVICE_PORT}"
+    assert private[5].startswith("TRAP2, SNMP v3, user shaaes, context")
+    assert private[6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.7",
+                                          ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: 2"]
+    assert authenticated[5].startswith("TRAP2, SNMP v3, user restricted, context")
+    assert authenticated[6].split("\t")[1] == ".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.9"

@@ -11,6 +11,9 @@
 #include "engine/agent_registry.h"
 #include "snmp/message.h"
 #include "snmp/service.h"
+#include "snmpv3/engine_id.h"
+#include "snmpv3/v3_config.h"
+#include "snmpv3/vacm.h"
 #include "support/snmp_agent_fixture.h"
 
 namespace tessel {
@@ -91,6 +94,7 @@ class NotifierTest : public SnmpAgentTest {
     InitNotifications();
   }
   void TearDown() override {
+    FreeSnmpV3Resources();
     StopNotifications();
     StopSnmpGeneralServices();
     FreeSimulatorResources();
@@ -220,6 +224,44 @@ TEST_F(NotifierTest, UnansweredInformIsResentThenReportedDropped) {
   EXPECT_EQ(host_.DroppedInforms()[0].managerPort, manager_.Port());
   EXPECT_EQ(host_.DroppedInforms()[0].community, "public");
   EXPECT_EQ(PendingInforms(), 0u);
+}
+
+// SNMPv3 traps go to users of the engine's table, in a known context, within the user's notify
+// view; the device is the authoritative engine that the message names.
+TEST_F(NotifierTest, V3TrapsNameTheDeviceAndKeepToTheNotifyView) {
+  ClearEngineId();
+  ASSERT_EQ(AddUsmUserFromHost("watcher", "NO_AUTH", "-", "NO_PRIV", "-", 1), 1);
+  CreateAndAddSnmpVacmContextTableEntry("");
+  CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, "watcher", "watchers", 3);
+  CreateAndAddNewSnmpVacmAccessTableEntry("watchers", "", 3, 0, 1, "", "", "traps", 3);
+  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("traps", "1.3.6.1.4.1.99", "", 1, 3);
+  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("traps", "1.3.6.1.4.1.99.0.8", "", 2, 3);
+  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("traps", "1.3.6.1.2.1.2", "", 1, 3);
+  CreateLCDVacmAccessTable();
+  CreateLCDVacmViewTreeFamilyTable();
+  NotificationRequest request = Request(kTrapV2, kSnmpV3);
+  request.userName = "watcher";
+  ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
+  auto received = manager_.Receive();
+  ASSERT_TRUE(received);
+  EXPECT_EQ(received->second, device_);
+  std::string engineId = kDevice + "#" + std::to_string(kDevicePort);
+  std::vector<std::uint8_t> engineIdField = {0x04, static_cast<std::uint8_t>(engineId.size())};
+  engineIdField.insert(engineIdField.end(), engineId.begin(), engineId.end());
+  EXPECT_TRUE(Contains(received->first, engineIdField));
+  EXPECT_TRUE(Contains(received->first, {0x06, 0x08, 0x2b, 6, 1, 4, 1, 99, 0, 7}));
+
+  NotificationRequest excludedTrap = request, outsideBinding = request, stranger = request,
+                      otherContext = request;
+  excludedTrap.trapOid = "1.3.6.1.4.1.99.0.8";
+  outsideBinding.bindings = {std::vector<std::string>{"1.3.6.1.2.1.1.5.0"},
+                             std::vector<std::int32_t>{kAsnOctetString},
+                             std::vector<std::string>{"x"}};
+  stranger.userName = "stranger";
+  otherContext.contextName = "elsewhere";
+  for (const NotificationRequest& refused : {excludedTrap, outsideBinding, stranger, otherContext})
+    EXPECT_EQ(SendNotification(refused).result, NotifyResult::kRefused);
+  EXPECT_FALSE(manager_.Receive(200));
 }
 
 }  // namespace

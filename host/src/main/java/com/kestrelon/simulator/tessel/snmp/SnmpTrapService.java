@@ -23,4 +23,14 @@ public class SnmpTrapService {
   public native void SendV2Trap(String managerHost, int managerPort, String community,
       String trapOid, String[] oids, int[] types, String[] values, int agentId, String agentText,
       int selector);
+
+  /**
+   * An SNMPv2-Trap over SNMPv3 to userName, a user of the engine's SNMPv3 configuration, at the
+   * user's level and in contextName; the device is the authoritative engine. Not sent when the
+   * user or context is unknown, or when the user's notify view leaves out the trap or a binding.
+   * The community is not used.
+   */
+  public native void SendV3Trap(String managerHost, int managerPort, String community,
+      String trapOid, String userName, String contextName, String[] oids, int[] types,
+      String[] values, int agentId, String agentText);
 }

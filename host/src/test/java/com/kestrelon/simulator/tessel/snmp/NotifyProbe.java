@@ -13,8 +13,9 @@ import java.util.concurrent.TimeUnit;
  *
  * <pre>NotifyProbe DEVICE PORT MANAGER_HOST MANAGER_PORT KIND COMMUNITY TRAP [OID TYPE VALUE]...</pre>
  *
- * KIND is v1trap (TRAP is ENTERPRISE/GENERIC/SPECIFIC), v2trap or v2inform (TRAP is the
- * snmpTrapOID); TYPE is the BER type code. Prints "probe: sent" once the notification is on its way,
+ * KIND is v1trap (TRAP is ENTERPRISE/GENERIC/SPECIFIC), v2trap, v2inform or v3trap (TRAP is the
+ * snmpTrapOID; for v3trap COMMUNITY is USER/CONTEXT, users from the SNMPv3 configuration named by
+ * the system property tessel.snmpv3); TYPE is the BER type code. Prints "probe: sent" once the notification is on its way,
  * and for an inform then "probe: answered" or "probe: dropped" as the engine reports it (within 15 seconds).
  */
 public final class NotifyProbe {
@@ -58,6 +59,10 @@ public final class NotifyProbe {
         || !handler.jniJVMparams()) {
       throw new IllegalStateException("the engine did not start");
     }
+    String snmpV3 = System.getProperty("tessel.snmpv3");
+    if (snmpV3 != null) {
+      SnmpV3Config.load(java.nio.file.Path.of(snmpV3)).apply(new SerToCConverter());
+    }
     int[] sockets = handler.startSnmpNetwork(new int[] {1}, new String[] {"t"},
         new String[] {device}, new int[] {port}, new String[] {"public"},
         new String[] {"private"}, new int[] {0}, "db", new int[] {0});
@@ -77,6 +82,11 @@ public final class NotifyProbe {
           oidArray, types, valueArray, 1, device, 1);
       case "v2inform" -> new SnmpInformInterfaceImpl().SendV2Inform(managerHost, managerPort,
           community, trap, oidArray, types, valueArray, 1, device, 2);
+      case "v3trap" -> {
+        String[] principal = (community + "/").split("/", -1);
+        new SnmpTrapService().SendV3Trap(managerHost, managerPort, "", trap, principal[0],
+            principal[1], oidArray, types, valueArray, 1, device);
+      }
       default -> throw new IllegalArgumentException("unknown kind " + kind);
     }
     System.out.println("probe: sent");
