@@ -149,13 +149,13 @@ void SendV2(JNIEnv* env, jstring host, jint port, jstring community, jstring tra
   });
 }
 
-void SendV3(JNIEnv* env, jstring host, jint port, jstring community, jstring trapOid,
-            jstring userName, jstring contextName, jobjectArray oids, jintArray types,
-            jobjectArray values, jint agentId, jstring agentText) {
+void SendV3(std::uint8_t pduType, JNIEnv* env, jstring host, jint port, jstring community,
+            jstring trapOid, jstring userName, jstring contextName, jobjectArray oids,
+            jintArray types, jobjectArray values, jint agentId, jstring agentText) {
   GuardedVoid([&] {
     NotificationRequest request =
         Notification(env, host, port, community, oids, types, values, agentId, agentText);
-    request.pduType = kTrapV2;
+    request.pduType = pduType;
     request.version = kSnmpV3;
     request.trapOid = Text(env, trapOid);
     request.userName = Text(env, userName);
@@ -390,8 +390,8 @@ JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_
     JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
     jstring userName, jstring contextName, jobjectArray oids, jintArray types, jobjectArray values,
     jint agentId, jstring agentText) {
-  SendV3(env, host, port, community, trapOid, userName, contextName, oids, types, values, agentId,
-         agentText);
+  SendV3(kTrapV2, env, host, port, community, trapOid, userName, contextName, oids, types, values,
+         agentId, agentText);
 }
 
 // ---- com.kestrelon.simulator.tessel.snmp.SnmpInformInterfaceImpl ----
@@ -402,6 +402,15 @@ Java_com_kestrelon_simulator_tessel_snmp_SnmpInformInterfaceImpl_SendV2Inform(
     jobjectArray oids, jintArray types, jobjectArray values, jint agentId, jstring agentText,
     jint selector) {
   SendV2(env, host, port, community, trapOid, oids, types, values, agentId, agentText, selector);
+}
+
+JNIEXPORT void JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SnmpInformInterfaceImpl_SendV3Inform(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jstring userName, jstring contextName, jobjectArray oids, jintArray types, jobjectArray values,
+    jint agentId, jstring agentText) {
+  SendV3(kInformRequest, env, host, port, community, trapOid, userName, contextName, oids, types,
+         values, agentId, agentText);
 }
 
 // ---- com.kestrelon.simulator.tessel.snmp.SnmpRegister ----

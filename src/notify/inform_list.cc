@@ -83,6 +83,17 @@ std::optional<PendingInform> InformList::Acknowledge(const ResponseOrigin& origi
   return answered;
 }
 
+std::optional<V3InformSecurity> InformList::FindV3(const ResponseOrigin& origin,
+                                                   std::int32_t msgId) const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  for (const PendingInform& inform : informs_) {
+    if (inform.v3 && inform.v3->msgId == msgId && inform.device == origin.device &&
+        SameSocketAddress(inform.target.managerSockAddr, origin.manager))
+      return inform.v3;
+  }
+  return std::nullopt;
+}
+
 std::optional<std::uint64_t> InformList::Expire(std::uint64_t now) {
   std::vector<PendingInform> dropped;
   std::optional<std::uint64_t> earliest;

@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "snmp/pdu.h"
+#include "snmpv3/usm_users.h"
 #include "transport/transport_domain.h"
 
 namespace tessel {
@@ -41,6 +42,15 @@ struct DeviceEndpoint {
   bool operator==(const DeviceEndpoint&) const = default;
 };
 
+// What an SNMPv3 inform's Response must carry: the manager (authoritative for the inform) answers
+// with the inform's msgID, authenticated by the user at the inform's level.
+struct V3InformSecurity {
+  std::int32_t msgId = 0;
+  std::string engineId;
+  std::uint8_t level = 0;
+  UsmUser user;
+};
+
 struct PendingInform {
   std::uint32_t informId = 0;
   std::int32_t requestId = 0;
@@ -48,6 +58,7 @@ struct PendingInform {
   NotificationTarget target;
   std::vector<std::uint8_t> message;  // the encoded InformRequest
   VarBindList bindings;               // reported to the host
+  std::optional<V3InformSecurity> v3;
   std::uint32_t retriesLeft = 0;
   std::uint32_t sends = 0;
   std::uint64_t deadline = 0;  // milliseconds
@@ -82,6 +93,8 @@ class InformList {
   // Takes the inform that a Response with this request-id answers: one sent by that device to
   // exactly that manager address and port, with that community.
   std::optional<PendingInform> Acknowledge(const ResponseOrigin& origin, std::int32_t requestId);
+  // The security of the SNMPv3 inform that device sent to that manager with this msgID.
+  std::optional<V3InformSecurity> FindV3(const ResponseOrigin& origin, std::int32_t msgId) const;
   // Sends again every inform whose deadline has passed and that has retries left; drops and
   // reports the others. The earliest deadline still pending, if any.
   std::optional<std::uint64_t> Expire(std::uint64_t now);

@@ -13,11 +13,13 @@
 #include "notify/inform_list.h"
 #include "notify/notification_log.h"
 #include "notify/trap_pdu.h"
+#include "notify/v3_inform.h"
 #include "notify/v3_notification.h"
 #include "snmp/agent_sockets.h"
 #include "snmp/message.h"
 #include "snmp/statistics.h"
 #include "snmp/value_text.h"
+#include "snmpv3/v3_message.h"
 #include "transport/udp.h"
 
 namespace tessel {
@@ -87,6 +89,51 @@ InformList& Informs() {
       },
       ReportDropped);
   return *informs;
+}
+
+V3InformSender& V3Informs() {
+  static V3InformSender* sender =  // never destroyed, as the inform list it feeds
+      new V3InformSender(Informs(), ReportDropped, SteadyMilliseconds);
+  return *sender;
+}
+
+// An SNMPv3 inform goes to the sender's thread, which discovers the manager first.
+NotifyOutcome QueueV3Inform(const SnmpPdu& pdu, const NotificationTarget& target,
+                            const AgentSession& device) {
+  V3Refusal refusal = V3Refusal::kNone;
+  std::optional<UsmUser> user = V3Principal(pdu, target, &refusal);
+  if (!user) return {NotifyResult::kRefused};
+  V3InformJob job;
+  job.pdu = pdu;
+  job.target = target;
+  job.device = {device.transport.localAddress, ConfiguredPort(device.transport)};
+  job.ipv6 = device.transport.isIPv6 != 0;
+  job.user = std::move(*user);
+  V3Informs().Queue(std::move(job));
+  return {NotifyResult::kSent};
+}
+
+// A message of another engine that reaches a device: the Response to one of its SNMPv3 informs
+// when it names the inform's msgID and is authentic at the inform's level. Whatever else names
+// that msgID (a Report of the manager's) is taken too, and leaves the inform waiting: it is no
+// request of the agent's to answer.
+bool ReceiveV3Message(const std::uint8_t* message, std::size_t length, const AgentSession& agent) {
+  V3Received header;
+  ParseV3Message(message, length, nullptr, &header);
+  ResponseOrigin origin;
+  origin.device = {agent.transport.localAddress, ConfiguredPort(agent.transport)};
+  origin.manager = agent.transport.peerSockAddr;
+  std::optional<V3InformSecurity> security = Informs().FindV3(origin, header.msgId);
+  if (!security) return false;
+  V3Received received;
+  if (!ParseV3Message(message, length, &security->user, &received) ||
+      received.level != security->level || received.engineId != security->engineId ||
+      received.pdu.type != kGetResponse) {
+    LOG_ERROR("The answer to an SNMPv3 inform is not its authentic Response\n");
+    return true;
+  }
+  AcknowledgeInform(Informs(), received.pdu, agent);
+  return true;
 }
 
 std::optional<Oid> OidFromText(const std::string& text) {
@@ -183,12 +230,14 @@ NotifyOutcome Deliver(const SnmpPdu& built, const NotificationTarget& target,
                       const AgentSession& device) {
   std::optional<SnmpPdu> pdu =
       NotificationForVersion(built, target.version, AgentAddressOf(device.transport.localAddress));
-  if (!pdu || (target.version == kSnmpV3 && pdu->type == kInformRequest)) {
+  if (!pdu) {
     LOG_ERROR("The notification has no form for an SNMP version %d manager\n", target.version);
     return {NotifyResult::kNoForm};
   }
   pdu->community = target.version == kSnmpV3 ? "" : target.community;
   pdu->requestId = NextNotificationRequestId();
+  if (target.version == kSnmpV3 && pdu->type == kInformRequest)
+    return QueueV3Inform(*pdu, target, device);
   DumpNotification(target, *pdu);
   V3Refusal refusal = V3Refusal::kNone;
   std::vector<std::uint8_t> message = target.version == kSnmpV3
@@ -270,10 +319,12 @@ bool ReceiveResponse(const SnmpPdu& pdu, const AgentSession& agent) {
 
 void InitNotifications() {
   InstallResponseReceiver(ReceiveResponse);
+  InstallV3MessageReceiver(ReceiveV3Message);
   Informs().StartTimer(SteadyMilliseconds);
 }
 
 void StopNotifications() {
+  V3Informs().Stop();
   Informs().StopTimer();
   Informs().Clear();
 }

@@ -1,5 +1,5 @@
 // Notifications that the host asks a device to send: an SNMPv1 Trap, an SNMPv2-Trap or an
-// InformRequest (SNMPv1 and SNMPv2c; over SNMPv3 traps only) to one manager, built once, put in the
+// InformRequest to one manager, built once, put in the
 // form of the manager's version and sent from the device's own address and SNMP port (its agent
 // socket), so that the manager sees the device as the sender and answers an inform there. Informs
 // are kept until a Response from that manager acknowledges them, and sent again or dropped by the

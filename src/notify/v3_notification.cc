@@ -31,26 +31,33 @@ bool NotifyViewAllows(const SnmpPdu& notification, const std::string& contextNam
   return true;
 }
 
-std::vector<std::uint8_t> EncodeV3Trap(const SnmpPdu& notification,
-                                       const NotificationTarget& target, const AgentSession& device,
-                                       V3Refusal* refusal) {
+std::optional<UsmUser> V3Principal(const SnmpPdu& notification, const NotificationTarget& target,
+                                   V3Refusal* refusal) {
   if (!IsValidContext(target.contextName)) {
     LOG_ERROR("The Context name is not valid !!!\n");
     *refusal = V3Refusal::kUnknownContext;
-    return {};
+    return std::nullopt;
   }
   std::optional<UsmUser> user = GetUsmEntry(EngineId(), target.userName);
   if (!user) {
     LOG_ERROR("User %s is not configured in USM Table.!!!\n", target.userName.c_str());
     *refusal = V3Refusal::kUnknownUser;
-    return {};
+    return std::nullopt;
   }
   if (!NotifyViewAllows(notification, target.contextName, user->securityName,
                         user->securityLevel)) {
     LOG_ERROR("User %s don't have the access to receive this trap !!!\n", target.userName.c_str());
     *refusal = V3Refusal::kNotInView;
-    return {};
+    return std::nullopt;
   }
+  return user;
+}
+
+std::vector<std::uint8_t> EncodeV3Trap(const SnmpPdu& notification,
+                                       const NotificationTarget& target, const AgentSession& device,
+                                       V3Refusal* refusal) {
+  std::optional<UsmUser> user = V3Principal(notification, target, refusal);
+  if (!user) return {};
   V3Envelope envelope;
   envelope.msgId = notification.requestId;
   envelope.msgMaxSize = static_cast<std::int32_t>(kMaxSnmpMessage);

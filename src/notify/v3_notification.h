@@ -5,12 +5,14 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
 #include "engine/agent.h"
 #include "notify/inform_list.h"
 #include "snmp/pdu.h"
+#include "snmpv3/usm_users.h"
 
 namespace tessel {
 
@@ -20,6 +22,11 @@ enum class V3Refusal { kNone, kUnknownUser, kUnknownContext, kNotInView, kNotEnc
 // every binding behind it.
 bool NotifyViewAllows(const SnmpPdu& notification, const std::string& contextName,
                       const std::string& securityName, int securityLevel);
+
+// The user of the engine's table that may receive the notification in the target's context;
+// nothing with *refusal set when the user or context is unknown or the notify view refuses.
+std::optional<UsmUser> V3Principal(const SnmpPdu& notification, const NotificationTarget& target,
+                                   V3Refusal* refusal);
 
 // The SNMPv2 notification as an SNMPv3 message from device to the target's user and context;
 // empty with *refusal set when it is not to be sent.

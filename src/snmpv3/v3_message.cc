@@ -618,12 +618,51 @@ bool EncodeV3Message(const V3Envelope& envelope, const std::uint8_t* pdu, std::s
   return true;
 }
 
+namespace {
+std::atomic<V3MessageReceiver> v3Receiver{nullptr};
+}  // namespace
+
+void InstallV3MessageReceiver(V3MessageReceiver receiver) { v3Receiver = receiver; }
+
+bool ParseV3Message(const std::uint8_t* message, std::size_t length, const UsmUser* user,
+                    V3Received* received) {
+  V3Request request;
+  request.message.assign(message, message + length);
+  if (!ParseRequest(request)) return false;
+  received->msgId = request.header.msgId;
+  received->level = request.level;
+  received->engineId = request.security.engineId;
+  received->boots = static_cast<std::uint32_t>(request.security.boots);
+  received->time = static_cast<std::uint32_t>(request.security.time);
+  received->userName = request.security.userName;
+  if (request.level != kNoAuthNoPriv) {
+    if (user == nullptr) return false;  // the header is read: the caller finds the user by it
+    request.user = *user;
+    request.agentEngineId = request.security.engineId;  // the keys of the sending engine
+    if (!Authentic(request)) {
+      LOG_ERROR("Authentication is failed. \n");
+      return false;
+    }
+  }
+  ScopedPdu scoped;
+  if (!ScopedPlaintext(request, &scoped.plaintext) || !ParseScopedPdu(&scoped, false)) return false;
+  received->contextEngineId = std::move(scoped.contextEngineId);
+  received->contextName = std::move(scoped.contextName);
+  received->pdu = std::move(scoped.pdu);
+  return true;
+}
+
 int ProcessSnmpV3Message(const std::uint8_t* message, std::size_t length, std::uint8_t* reply,
                          std::size_t* replyLength, const AgentSession& agent) {
   V3Request request;
   request.message.assign(message, message + length);
   if (!ParseRequest(request)) return kMessageDrop;
   request.agentEngineId = AgentEngineId(agent);
+  // A message of another authoritative engine may answer what the agent sent.
+  V3MessageReceiver receiver = v3Receiver.load();
+  if (receiver != nullptr && !request.security.engineId.empty() &&
+      request.security.engineId != request.agentEngineId && receiver(message, length, agent))
+    return kMessageConsumed;
   request.agentBoots = agent.agentInfo ? agent.agentInfo->engineBoots.load() : 0;
   request.agentTime = AgentEngineTime(agent);
   Check check = CheckSecurity(request);

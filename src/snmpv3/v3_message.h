@@ -10,7 +10,9 @@
 #include <string>
 
 #include "engine/agent.h"
+#include "snmp/pdu.h"
 #include "snmpv3/usm_crypto.h"
+#include "snmpv3/usm_users.h"
 
 namespace tessel {
 
@@ -54,6 +56,32 @@ struct V3Envelope {
 // False when it does not fit or a cryptographic step fails.
 bool EncodeV3Message(const V3Envelope& envelope, const std::uint8_t* pdu, std::size_t pduLength,
                      std::uint8_t* out, std::size_t* length);
+
+// An SNMPv3 message taken apart: its header, security parameters and scoped PDU.
+struct V3Received {
+  std::int32_t msgId = 0;
+  std::uint8_t level = kNoAuthNoPriv;
+  std::string engineId;  // msgAuthoritativeEngineID
+  std::uint32_t boots = 0;
+  std::uint32_t time = 0;
+  std::string userName;
+  std::string contextEngineId;
+  std::string contextName;
+  SnmpPdu pdu;
+};
+
+// Parses a message that another engine, authoritative for it, sent to one of the engine's own
+// requests. Above noAuthNoPriv the digest is checked and the scoped PDU decrypted with user's
+// keys localised to the message's engine ID. False when it is malformed or not authentic, or
+// when it is above noAuthNoPriv and no user is given (the header fields are then filled in).
+bool ParseV3Message(const std::uint8_t* message, std::size_t length, const UsmUser* user,
+                    V3Received* received);
+
+// Receives the SNMPv3 messages that reach an agent from another authoritative engine (Responses
+// to the agent's informs) and tells whether it took one; the others are processed as requests.
+using V3MessageReceiver = bool (*)(const std::uint8_t* message, std::size_t length,
+                                   const AgentSession& agent);
+void InstallV3MessageReceiver(V3MessageReceiver receiver);
 
 // Processes one SNMPv3 datagram for the agent, as ProcessSnmpMessage does for v1/v2c: 1 send the
 // reply (a Response or a Report) in reply/*replyLength, 0 drop, 99 memory exhausted.

@@ -44,6 +44,8 @@ def trapd():
     config.write_text("authCommunity log public\n"
                       f"createUser -e 0x{engine_id} shaaes SHA shapassword AES aespassword\n"
                       f"createUser -e 0x{engine_id} restricted SHA restrictedpw\n"
+                      # informs: snmptrapd is their authoritative engine
+                      "createUser shaaes SHA shapassword AES aespassword\n"
                       "authUser log shaaes\nauthUser log restricted auth\n")
     process = subprocess.Popen(
         ["snmptrapd", "-f", "-C", "-c", str(config), "-M", "/dev/null", "-m", "", "-n", "-On",
@@ -93,24 +95,31 @@ def test_traps_and_informs_arrive_from_the_device_with_their_fields(trapd):
                                          ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: 2"]
 
 
-def test_inform_nobody_answers_is_sent_once_then_reported_dropped():
-    silent = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
-    silent.bind(("127.0.0.1", SILENT_PORT))
-    try:
-        start = time.monotonic()
-        assert probe(SILENT_PORT, "v2inform", "1.3.6.1.4.1.99.0.1") == ["sent", "dropped"]
-        assert time.monotonic() - start >= 5, "an inform waits 5 s for its Response"
-        silent.settimeout(0.5)
-        sends = []
+@pytest.fixture
+def silent():
+    """A manager's port that receives and never answers: the senders of what it received."""
+    sock = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+    sock.bind(("127.0.0.1", SILENT_PORT))
+
+    def senders():
+        sock.settimeout(0.5)
+        found = []
         try:
-            while len(sends) < 5:
-                sends.append(silent.recvfrom(2048))
+            while len(found) < 5:
+                found.append(sock.recvfrom(2048)[1])
         except socket.timeout:
             pass
-        assert len(sends) == 1, "1 + 0 retries"
-        assert sends[0][1] == (DEVICE, DEVICE_PORT)
-    finally:
-        silent.close()
+        return found
+
+    yield senders
+    sock.close()
+
+
+def test_inform_nobody_answers_is_sent_once_then_reported_dropped(silent):
+    start = time.monotonic()
+    assert probe(SILENT_PORT, "v2inform", "1.3.6.1.4.1.99.0.1") == ["sent", "dropped"]
+    assert time.monotonic() - start >= 5, "an inform waits 5 s for its Response"
+    assert silent() == [(DEVICE, DEVICE_PORT)], "1 + 0 retries, from the device"
 
 
 def test_v3_traps_arrive_authenticated_and_encrypted_and_only_within_the_notify_view(trapd):
@@ -134,3 +143,24 @@ def test_v3_traps_arrive_authenticated_and_encrypted_and_only_within_the_notify_
                                           ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: 2"]
     assert authenticated[5].startswith("TRAP2, SNMP v3, user restricted, context")
     assert authenticated[6].split("\t")[1] == ".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.9"
+
+
+def test_v3_inform_discovers_the_manager_and_is_answered(trapd):
+    before = len(trapd(0, wait=0))
+    assert probe(TRAPD_PORT, "v3inform", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.1.5.0", "4", "core-7",
+                 community="shaaes") == ["sent", "answered"]
+    rows = trapd(before + 1)[before:]
+    assert len(rows) == 1
+    assert source(rows[0]) == f"{DEVICE}:{DEVICE_PORT}"
+    assert rows[0][5].startswith("INFORM, SNMP v3, user shaaes, context")
+    assert rows[0][6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.7",
+                                          '.1.3.6.1.2.1.1.5.0 = STRING: "core-7"']
+
+
+def test_v3_inform_whose_manager_does_not_answer_discovery_is_dropped_at_once(silent):
+    start = time.monotonic()
+    assert probe(SILENT_PORT, "v3inform", "1.3.6.1.4.1.99.0.1", community="shaaes") == ["sent", "dropped"]
+    assert time.monotonic() - start < 5, "not kept until a timeout"
+    senders = silent()
+    assert len(senders) == 1, "the discovery request alone"
+    assert senders[0][0] == DEVICE and senders[0][1] != DEVICE_PORT, "from an ephemeral port"

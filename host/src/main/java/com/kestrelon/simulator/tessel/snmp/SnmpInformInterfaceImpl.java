@@ -17,4 +17,14 @@ public class SnmpInformInterfaceImpl {
   public native void SendV2Inform(String managerHost, int managerPort, String community,
       String trapOid, String[] oids, int[] types, String[] values, int agentId, String agentText,
       int selector);
+
+  /**
+   * An SNMPv3 InformRequest to userName, at the user's level and in contextName (see
+   * {@link SnmpTrapService#SendV3Trap}). The device first discovers the manager's engine from an
+   * ephemeral port of its address; a manager that does not answer within 0.6 s gets nothing and
+   * the inform is reported dropped at once. The community is not used.
+   */
+  public native void SendV3Inform(String managerHost, int managerPort, String community,
+      String trapOid, String userName, String contextName, String[] oids, int[] types,
+      String[] values, int agentId, String agentText);
 }

@@ -13,10 +13,11 @@ import java.util.concurrent.TimeUnit;
  *
  * <pre>NotifyProbe DEVICE PORT MANAGER_HOST MANAGER_PORT KIND COMMUNITY TRAP [OID TYPE VALUE]...</pre>
  *
- * KIND is v1trap (TRAP is ENTERPRISE/GENERIC/SPECIFIC), v2trap, v2inform or v3trap (TRAP is the
- * snmpTrapOID; for v3trap COMMUNITY is USER/CONTEXT, users from the SNMPv3 configuration named by
+ * KIND is v1trap (TRAP is ENTERPRISE/GENERIC/SPECIFIC), v2trap, v2inform, v3trap or v3inform (TRAP is the
+ * snmpTrapOID; for v3 COMMUNITY is USER/CONTEXT, users from the SNMPv3 configuration named by
  * the system property tessel.snmpv3); TYPE is the BER type code. Prints "probe: sent" once the notification is on its way,
- * and for an inform then "probe: answered" or "probe: dropped" as the engine reports it (within 15 seconds).
+ * and for an inform then "probe: answered" or "probe: dropped" as the engine reports it (within 15
+ * seconds). The system properties tessel.log.level and tessel.log.file turn the engine's log on.
  */
 public final class NotifyProbe {
   private NotifyProbe() {}
@@ -55,7 +56,9 @@ public final class NotifyProbe {
         informs.add("dropped");
       }
     });
-    if (!simulator.nativeInitAgentParams(true, (byte) 0, "", 0, 1 << 20)
+    if (!simulator.nativeInitAgentParams(true,
+        (byte) Integer.getInteger("tessel.log.level", 0).intValue(),
+        System.getProperty("tessel.log.file", "tessel-probe.log"), 0, 1 << 24)
         || !handler.jniJVMparams()) {
       throw new IllegalStateException("the engine did not start");
     }
@@ -86,6 +89,11 @@ public final class NotifyProbe {
         String[] principal = (community + "/").split("/", -1);
         new SnmpTrapService().SendV3Trap(managerHost, managerPort, "", trap, principal[0],
             principal[1], oidArray, types, valueArray, 1, device);
+      }
+      case "v3inform" -> {
+        String[] principal = (community + "/").split("/", -1);
+        new SnmpInformInterfaceImpl().SendV3Inform(managerHost, managerPort, "", trap,
+            principal[0], principal[1], oidArray, types, valueArray, 1, device);
       }
       default -> throw new IllegalArgumentException("unknown kind " + kind);
     }
