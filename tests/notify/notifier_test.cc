@@ -9,10 +9,13 @@
 #include <thread>
 
 #include "engine/agent_registry.h"
+#include "notify/trap_pdu.h"
 #include "snmp/message.h"
 #include "snmp/service.h"
 #include "snmpv3/engine_id.h"
+#include "snmpv3/usm_users.h"
 #include "snmpv3/v3_config.h"
+#include "snmpv3/v3_message.h"
 #include "snmpv3/vacm.h"
 #include "support/snmp_agent_fixture.h"
 
@@ -53,8 +56,8 @@ class ManagerSocket {
     return std::make_pair(datagram,
                           std::string(text) + ":" + std::to_string(ntohs(source.sin_port)));
   }
-  void SendToDevice(const std::vector<std::uint8_t>& datagram) {
-    sockaddr_in to{AF_INET, htons(kDevicePort), {}, {}};
+  void SendToDevice(const std::vector<std::uint8_t>& datagram, std::uint16_t port = kDevicePort) {
+    sockaddr_in to{AF_INET, htons(port), {}, {}};
     inet_pton(AF_INET, kDevice.c_str(), &to.sin_addr);
     sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
            sizeof to);
@@ -224,6 +227,78 @@ TEST_F(NotifierTest, UnansweredInformIsResentThenReportedDropped) {
   EXPECT_EQ(host_.DroppedInforms()[0].managerPort, manager_.Port());
   EXPECT_EQ(host_.DroppedInforms()[0].community, "public");
   EXPECT_EQ(PendingInforms(), 0u);
+}
+
+// An SNMPv3 message of the manager's engine to the device.
+std::vector<std::uint8_t> ManagerMessage(std::uint8_t type, const V3Received& answered,
+                                         const UsmUser& user, std::uint8_t level) {
+  V3Envelope envelope;
+  envelope.msgId = answered.msgId;
+  envelope.msgMaxSize = 1500;
+  envelope.level = level;
+  envelope.engineId = envelope.contextEngineId = "manager-engine";
+  envelope.boots = 2;
+  envelope.time = 50;
+  envelope.userName = answered.userName;
+  envelope.auth = user.auth;
+  envelope.authKey = GetLocalKeyValue(user.authPassword, user.auth, envelope.engineId);
+  SnmpPdu pdu;
+  pdu.type = type;
+  pdu.requestId = answered.pdu.requestId;
+  pdu.requestVarBinds = answered.pdu.requestVarBinds;
+  std::vector<std::uint8_t> encoded = EncodeNotificationPdu(pdu);
+  std::vector<std::uint8_t> message(kMaxSnmpMessage);
+  std::size_t length = message.size();
+  EXPECT_TRUE(EncodeV3Message(envelope, encoded.data(), encoded.size(), message.data(), &length));
+  message.resize(length);
+  return message;
+}
+
+// An SNMPv3 inform first discovers the manager from an ephemeral port, then leaves from the
+// device keyed to the manager's engine; an unauthenticated Response naming its msgID and
+// request-id does not acknowledge it, the authentic one does.
+TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
+  ClearEngineId();
+  ASSERT_EQ(AddUsmUserFromHost("signer", "MD5_AUTH", "signerpass1", "NO_PRIV", "-", 1), 1);
+  CreateAndAddSnmpVacmContextTableEntry("");
+  CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, "signer", "signers", 3);
+  CreateAndAddNewSnmpVacmAccessTableEntry("signers", "", 3, 1, 1, "", "", "all", 3);
+  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("all", "1.3", "", 1, 3);
+  CreateLCDVacmAccessTable();
+  CreateLCDVacmViewTreeFamilyTable();
+  std::optional<UsmUser> user = GetUsmEntry(EngineId(), "signer");
+  ASSERT_TRUE(user);
+  NotificationRequest request = Request(kInformRequest, kSnmpV3);
+  request.userName = "signer";
+  ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
+
+  auto discovery = manager_.Receive();
+  ASSERT_TRUE(discovery);
+  EXPECT_NE(discovery->second, device_);
+  V3Received probe;
+  ASSERT_TRUE(ParseV3Message(discovery->first.data(), discovery->first.size(), nullptr, &probe));
+  EXPECT_TRUE(probe.engineId.empty());
+  std::uint16_t ephemeral = static_cast<std::uint16_t>(
+      std::stoi(discovery->second.substr(discovery->second.find(':') + 1)));
+  manager_.SendToDevice(ManagerMessage(kReport, probe, *user, kNoAuthNoPriv), ephemeral);
+
+  auto sent = manager_.Receive();
+  ASSERT_TRUE(sent);
+  EXPECT_EQ(sent->second, device_);
+  V3Received inform;
+  ASSERT_TRUE(ParseV3Message(sent->first.data(), sent->first.size(), &*user, &inform));
+  EXPECT_EQ(inform.engineId, "manager-engine");
+  EXPECT_EQ(inform.level, kAuthNoPriv);
+  EXPECT_EQ(inform.pdu.type, kInformRequest);
+
+  manager_.SendToDevice(ManagerMessage(kGetResponse, inform, *user, kNoAuthNoPriv));
+  std::this_thread::sleep_for(std::chrono::milliseconds(200));
+  EXPECT_TRUE(host_.AnsweredInforms().empty());
+  EXPECT_EQ(PendingInforms(), 1u);
+  manager_.SendToDevice(ManagerMessage(kGetResponse, inform, *user, kAuthNoPriv));
+  ASSERT_TRUE(WaitFor([&] { return !host_.AnsweredInforms().empty(); }));
+  EXPECT_EQ(PendingInforms(), 0u);
+  EXPECT_FALSE(manager_.Receive(100)) << "the device answers nothing to the manager";
 }
 
 // SNMPv3 traps go to users of the engine's table, in a known context, within the user's notify
