@@ -229,6 +229,21 @@ TEST_F(NotifierTest, UnansweredInformIsResentThenReportedDropped) {
   EXPECT_EQ(PendingInforms(), 0u);
 }
 
+// A user of the engine's table (at level, in context "") whose notify view is made of families
+// (subtree, included or excluded).
+void AddNotifiedUser(const std::string& name, const char* auth, const char* password, int level,
+                     const std::vector<std::pair<std::string, int>>& families) {
+  ClearEngineId();
+  ASSERT_EQ(AddUsmUserFromHost(name, auth, password, "NO_PRIV", "-", 1), 1);
+  CreateAndAddSnmpVacmContextTableEntry("");
+  CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, name, name + "s", 3);
+  CreateAndAddNewSnmpVacmAccessTableEntry(name + "s", "", 3, level, 1, "", "", "notify", 3);
+  for (const auto& [subtree, type] : families)
+    CreateAndAddSnmpVacmViewTreeFamilyTableEntry("notify", subtree, "", type, 3);
+  CreateLCDVacmAccessTable();
+  CreateLCDVacmViewTreeFamilyTable();
+}
+
 // An SNMPv3 message of the manager's engine to the device.
 std::vector<std::uint8_t> ManagerMessage(std::uint8_t type, const V3Received& answered,
                                          const UsmUser& user, std::uint8_t level) {
@@ -258,14 +273,7 @@ std::vector<std::uint8_t> ManagerMessage(std::uint8_t type, const V3Received& an
 // device keyed to the manager's engine; an unauthenticated Response naming its msgID and
 // request-id does not acknowledge it, the authentic one does.
 TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
-  ClearEngineId();
-  ASSERT_EQ(AddUsmUserFromHost("signer", "MD5_AUTH", "signerpass1", "NO_PRIV", "-", 1), 1);
-  CreateAndAddSnmpVacmContextTableEntry("");
-  CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, "signer", "signers", 3);
-  CreateAndAddNewSnmpVacmAccessTableEntry("signers", "", 3, 1, 1, "", "", "all", 3);
-  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("all", "1.3", "", 1, 3);
-  CreateLCDVacmAccessTable();
-  CreateLCDVacmViewTreeFamilyTable();
+  AddNotifiedUser("signer", "MD5_AUTH", "signerpass1", kAuthNoPriv, {{"1.3", kVacmViewIncluded}});
   std::optional<UsmUser> user = GetUsmEntry(EngineId(), "signer");
   ASSERT_TRUE(user);
   NotificationRequest request = Request(kInformRequest, kSnmpV3);
@@ -304,16 +312,10 @@ TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
 // SNMPv3 traps go to users of the engine's table, in a known context, within the user's notify
 // view; the device is the authoritative engine that the message names.
 TEST_F(NotifierTest, V3TrapsNameTheDeviceAndKeepToTheNotifyView) {
-  ClearEngineId();
-  ASSERT_EQ(AddUsmUserFromHost("watcher", "NO_AUTH", "-", "NO_PRIV", "-", 1), 1);
-  CreateAndAddSnmpVacmContextTableEntry("");
-  CreateAndAddSnmpVacmSecurityToGroupTableEntry(3, "watcher", "watchers", 3);
-  CreateAndAddNewSnmpVacmAccessTableEntry("watchers", "", 3, 0, 1, "", "", "traps", 3);
-  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("traps", "1.3.6.1.4.1.99", "", 1, 3);
-  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("traps", "1.3.6.1.4.1.99.0.8", "", 2, 3);
-  CreateAndAddSnmpVacmViewTreeFamilyTableEntry("traps", "1.3.6.1.2.1.2", "", 1, 3);
-  CreateLCDVacmAccessTable();
-  CreateLCDVacmViewTreeFamilyTable();
+  AddNotifiedUser("watcher", "NO_AUTH", "-", kNoAuthNoPriv,
+                  {{"1.3.6.1.4.1.99", kVacmViewIncluded},
+                   {"1.3.6.1.4.1.99.0.8", kVacmViewExcluded},
+                   {"1.3.6.1.2.1.2", kVacmViewIncluded}});
   NotificationRequest request = Request(kTrapV2, kSnmpV3);
   request.userName = "watcher";
   ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
