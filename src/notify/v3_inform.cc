@@ -137,28 +137,32 @@ V3InformSender::~V3InformSender() { Stop(); }
 
 void V3InformSender::Queue(V3InformJob job) {
   std::lock_guard<std::mutex> lock(mutex_);
+  if (threads_.empty()) stopping_ = false;
   jobs_.push_back(std::move(job));
-  if (!thread_.joinable()) {
-    stopping_ = false;
-    thread_ = std::thread([this] { Run(); });
-  }
+  if (idle_ < jobs_.size() && threads_.size() < kWorkers) threads_.emplace_back([this] { Run(); });
   queued_.notify_one();
 }
 
 void V3InformSender::Stop() {
+  std::vector<std::thread> threads;
   {
     std::lock_guard<std::mutex> lock(mutex_);
     stopping_ = true;
     jobs_.clear();
     queued_.notify_all();
+    threads.swap(threads_);
   }
-  if (thread_.joinable()) thread_.join();
+  for (std::thread& thread : threads) thread.join();
+  std::lock_guard<std::mutex> lock(mutex_);
+  idle_ = 0;
 }
 
 void V3InformSender::Run() {
   std::unique_lock<std::mutex> lock(mutex_);
   for (;;) {
+    ++idle_;
     queued_.wait(lock, [&] { return stopping_ || !jobs_.empty(); });
+    --idle_;
     if (stopping_) return;
     V3InformJob job = std::move(jobs_.front());
     jobs_.pop_front();

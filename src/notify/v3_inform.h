@@ -1,8 +1,9 @@
 // SNMPv3 informs: the manager is the authoritative engine of an inform, so before the first
 // InformRequest the device discovers the manager's engine ID and, above noAuthNoPriv, its boots
-// and time (RFC 3414). That exchange runs on a thread of its own, from an ephemeral port of the
-// device's address (the device's SNMP port is its agent's), and waits at most 0.6 s for each
-// answer, so it never holds up the host's call, the service threads or other notifications. The
+// and time (RFC 3414). That exchange runs on the sender's own threads (up to kWorkers informs at
+// once), from an ephemeral port of the device's address (the device's SNMP port is its agent's),
+// and waits at most 0.6 s for each answer, so it never holds up the host's call, the service
+// threads or the other notifications. The
 // InformRequest itself then leaves from the device's agent socket like every notification and is
 // kept by the inform list; an inform whose manager does not answer discovery is dropped at once.
 // Safe from any thread.
@@ -14,6 +15,7 @@
 #include <functional>
 #include <mutex>
 #include <thread>
+#include <vector>
 
 #include "notify/inform_list.h"
 #include "snmp/pdu.h"
@@ -39,9 +41,12 @@ class V3InformSender {
   V3InformSender(const V3InformSender&) = delete;
   V3InformSender& operator=(const V3InformSender&) = delete;
 
-  // Discovers the manager and sends the inform, on the sender's thread (started on first use).
+  static constexpr std::size_t kWorkers = 8;
+
+  // Discovers the manager and sends the inform, on one of the sender's threads (started as
+  // informs come).
   void Queue(V3InformJob job);
-  // Joins the thread; informs still queued are forgotten.
+  // Joins the threads; informs still queued are forgotten.
   void Stop();
 
  private:
@@ -55,7 +60,8 @@ class V3InformSender {
   std::condition_variable queued_;
   std::deque<V3InformJob> jobs_;
   bool stopping_ = false;
-  std::thread thread_;
+  std::size_t idle_ = 0;  // threads waiting for a job
+  std::vector<std::thread> threads_;
 };
 
 }  // namespace tessel

@@ -278,10 +278,17 @@ TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
   ASSERT_TRUE(user);
   NotificationRequest request = Request(kInformRequest, kSnmpV3);
   request.userName = "signer";
+  // A manager that never answers discovery holds up no other inform, and drops only its own.
+  ManagerSocket silent;
+  NotificationRequest unanswered = request;
+  unanswered.managerPort = silent.Port();
+  ASSERT_EQ(SendNotification(unanswered).result, NotifyResult::kSent);
+  auto start = std::chrono::steady_clock::now();
   ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
 
   auto discovery = manager_.Receive();
   ASSERT_TRUE(discovery);
+  EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(400));
   EXPECT_NE(discovery->second, device_);
   V3Received probe;
   ASSERT_TRUE(ParseV3Message(discovery->first.data(), discovery->first.size(), nullptr, &probe));
@@ -307,6 +314,10 @@ TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
   ASSERT_TRUE(WaitFor([&] { return !host_.AnsweredInforms().empty(); }));
   EXPECT_EQ(PendingInforms(), 0u);
   EXPECT_FALSE(manager_.Receive(100)) << "the device answers nothing to the manager";
+  ASSERT_TRUE(WaitFor([&] { return !host_.DroppedInforms().empty(); }));
+  EXPECT_EQ(host_.DroppedInforms()[0].managerPort, silent.Port());
+  EXPECT_TRUE(silent.Receive(0)) << "its discovery request";
+  EXPECT_FALSE(silent.Receive(0)) << "and nothing after it";
 }
 
 // SNMPv3 traps go to users of the engine's table, in a known context, within the user's notify
