@@ -79,7 +79,7 @@ def test_traps_and_informs_arrive_from_the_device_with_their_fields(trapd):
     assert probe(TRAPD_PORT, "v1trap", "1.3.6.1.4.1.99/6/7", "1.3.6.1.2.1.2.2.1.1.2", "2", "2") == ["sent"]
     assert probe(TRAPD_PORT, "v2trap", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.1.5.0", "4", "core-7") == ["sent"]
     assert probe(TRAPD_PORT, "v2inform", "1.3.6.1.6.3.1.1.5.3", "1.3.6.1.2.1.2.2.1.1.2", "2", "2") == \
-        ["sent", "answered"]
+        ["sent", f"answered {DEVICE} 127.0.0.1:{TRAPD_PORT}"]
     v1, v2, inform = trapd(3)
     for row in (v1, v2, inform):
         assert source(row) == f"{DEVICE}:{DEVICE_PORT}"
@@ -117,7 +117,7 @@ def silent():
 
 def test_inform_nobody_answers_is_sent_once_then_reported_dropped(silent):
     start = time.monotonic()
-    assert probe(SILENT_PORT, "v2inform", "1.3.6.1.4.1.99.0.1") == ["sent", "dropped"]
+    assert probe(SILENT_PORT, "v2inform", "1.3.6.1.4.1.99.0.1") == ["sent", f"dropped 127.0.0.1:{SILENT_PORT}"]
     assert time.monotonic() - start >= 5, "an inform waits 5 s for its Response"
     assert silent() == [(DEVICE, DEVICE_PORT)], "1 + 0 retries, from the device"
 
@@ -148,7 +148,7 @@ def test_v3_traps_arrive_authenticated_and_encrypted_and_only_within_the_notify_
 def test_v3_inform_discovers_the_manager_and_is_answered(trapd):
     before = len(trapd(0, wait=0))
     assert probe(TRAPD_PORT, "v3inform", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.1.5.0", "4", "core-7",
-                 community="shaaes") == ["sent", "answered"]
+                 community="shaaes") == ["sent", f"answered {DEVICE} 127.0.0.1:{TRAPD_PORT}"]
     rows = trapd(before + 1)[before:]
     assert len(rows) == 1
     assert source(rows[0]) == f"{DEVICE}:{DEVICE_PORT}"
@@ -159,7 +159,8 @@ def test_v3_inform_discovers_the_manager_and_is_answered(trapd):
 
 def test_v3_inform_whose_manager_does_not_answer_discovery_is_dropped_at_once(silent):
     start = time.monotonic()
-    assert probe(SILENT_PORT, "v3inform", "1.3.6.1.4.1.99.0.1", community="shaaes") == ["sent", "dropped"]
+    assert probe(SILENT_PORT, "v3inform", "1.3.6.1.4.1.99.0.1", community="shaaes") == \
+        ["sent", f"dropped 127.0.0.1:{SILENT_PORT}"]
     assert time.monotonic() - start < 5, "not kept until a timeout"
     senders = silent()
     assert len(senders) == 1, "the discovery request alone"

@@ -71,16 +71,6 @@ class ManagerSocket {
 // Where the PDU of a community message starts: behind 30 82 LL LL, the version and community.
 std::size_t PduOffset(const std::vector<std::uint8_t>& message) { return 4 + 3 + 2 + message[8]; }
 
-// Parses an SNMPv2-Trap or InformRequest (the codec refuses traps: read it as an inform).
-std::optional<SnmpPdu> ParseV2Notification(std::vector<std::uint8_t> message) {
-  std::uint8_t& type = message.at(PduOffset(message));
-  if (type != kTrapV2 && type != kInformRequest) return std::nullopt;
-  type = kInformRequest;
-  SnmpPdu pdu;
-  if (ParseSnmpMessage(message.data(), message.size(), &pdu) != 1) return std::nullopt;
-  return pdu;
-}
-
 bool Contains(const std::vector<std::uint8_t>& bytes, const std::vector<std::uint8_t>& part) {
   return std::search(bytes.begin(), bytes.end(), part.begin(), part.end()) != bytes.end();
 }
@@ -131,31 +121,6 @@ class NotifierTest : public SnmpAgentTest {
   ManagerSocket manager_;
   const std::string device_ = kDevice + ":" + std::to_string(kDevicePort);
 };
-
-// Traps leave from the device's own address and SNMP port, in the manager's version: a v2c
-// manager gets the SNMPv2-Trap with its bindings, a v1 manager the same trap as an SNMPv1 Trap
-// whose agent-addr is the device.
-TEST_F(NotifierTest, TrapsLeaveFromTheDeviceInTheManagersVersion) {
-  ASSERT_EQ(SendNotification(Request(kTrapV2, kSnmpV2c)).result, NotifyResult::kSent);
-  auto received = manager_.Receive();
-  ASSERT_TRUE(received);
-  EXPECT_EQ(received->second, device_);
-  std::optional<SnmpPdu> pdu = ParseV2Notification(received->first);
-  ASSERT_TRUE(pdu);
-  EXPECT_EQ(pdu->community, "public");
-  ASSERT_EQ(pdu->requestVarBinds.size(), 3u);
-  EXPECT_EQ(pdu->requestVarBinds[1].value.oid, O("1.3.6.1.4.1.99.0.7"));
-  EXPECT_EQ(pdu->requestVarBinds[2].value, VarValue::Integer(2));
-
-  ASSERT_EQ(SendNotification(Request(kTrapV2, kSnmpV1)).result, NotifyResult::kSent);
-  received = manager_.Receive();
-  ASSERT_TRUE(received);
-  EXPECT_EQ(received->second, device_);
-  EXPECT_EQ(received->first.at(PduOffset(received->first)), kTrapV1);
-  // enterprise 1.3.6.1.4.1.99, agent-addr 127.78.1.1, generic 6, specific 7
-  EXPECT_TRUE(Contains(received->first, {0x06, 0x06, 0x2b, 6, 1,    4, 1, 99,   0x40, 4,
-                                         127,  78,   1,    1, 0x02, 1, 6, 0x02, 1,    7}));
-}
 
 TEST_F(NotifierTest, RefusedNotificationsSendNothing) {
   NotificationRequest shortValues = Request(kTrapV2, kSnmpV2c);
@@ -210,23 +175,6 @@ TEST_F(NotifierTest, InformIsAcknowledgedOnlyByTheManagerItWasSentTo) {
   EXPECT_EQ(report.types[2], "Integer");
   EXPECT_EQ(report.values[2], "2");
   EXPECT_TRUE(host_.DroppedInforms().empty());
-}
-
-// Nobody answers: the inform is sent 1 + retries times, a timeout apart, then reported dropped.
-TEST_F(NotifierTest, UnansweredInformIsResentThenReportedDropped) {
-  NotificationRequest request = Request(kInformRequest, kSnmpV2c);
-  request.timeout = 1;
-  request.retries = 1;
-  auto start = std::chrono::steady_clock::now();
-  ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
-  ASSERT_TRUE(manager_.Receive());
-  ASSERT_TRUE(manager_.Receive(3000));
-  EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(900));
-  ASSERT_TRUE(WaitFor([&] { return !host_.DroppedInforms().empty(); }));
-  EXPECT_FALSE(manager_.Receive(100));
-  EXPECT_EQ(host_.DroppedInforms()[0].managerPort, manager_.Port());
-  EXPECT_EQ(host_.DroppedInforms()[0].community, "public");
-  EXPECT_EQ(PendingInforms(), 0u);
 }
 
 // A user of the engine's table (at level, in context "") whose notify view is made of families

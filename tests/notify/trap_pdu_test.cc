@@ -62,20 +62,6 @@ TEST(TrapPduTest, EncodesV2TrapAndV1TrapByteForByte) {
   EXPECT_EQ(encoded[10], kInformRequest);  // behind 30 82 LL LL, 02 01 01, 04 01 63
 }
 
-TEST(TrapPduTest, OversizedNotificationIsNotEncoded) {
-  SnmpPdu pdu =
-      V2Trap("1.3.6.1.4.1.99.0.7",
-             {Bind("1.3.6.1.4.1.99.1",
-                   VarValue::Octets(kAsnOctetString, std::string(kMaxSnmpMessage, 'x')))});
-  EXPECT_TRUE(EncodeNotification(pdu).empty());
-}
-
-TEST(TrapPduTest, V1BindingOfSysUpTimeGivesTheTimeStamp) {
-  SnmpPdu trap = BuildV1Trap(O("1.3.6.1.4.1.99"), kDevice, 6, 1, 100,
-                             {Bind("1.3.6.1.2.1.1.3.0", VarValue::Unsigned(kAsnTimeTicks, 4242))});
-  EXPECT_EQ(trap.timeStamp, 4242u);
-}
-
 TEST(TrapPduTest, V1ToV2NamesTheTrapInSecondBinding) {
   SnmpPdu enterprise = BuildV1Trap(O("1.3.6.1.4.1.99"), kDevice, 6, 7, 321, {IfIndex2()});
   SnmpPdu v2 = ConvertV1TrapToV2(enterprise);

@@ -16,7 +16,7 @@ import java.util.concurrent.TimeUnit;
  * KIND is v1trap (TRAP is ENTERPRISE/GENERIC/SPECIFIC), v2trap, v2inform, v3trap or v3inform (TRAP is the
  * snmpTrapOID; for v3 COMMUNITY is USER/CONTEXT, users from the SNMPv3 configuration named by
  * the system property tessel.snmpv3); TYPE is the BER type code. Prints "probe: sent" once the notification is on its way,
- * and for an inform then "probe: answered" or "probe: dropped" as the engine reports it (within 15
+ * and for an inform then "probe: answered DEVICE MANAGER:PORT" or "probe: dropped MANAGER:PORT" as the engine reports it (within 15
  * seconds). The system properties tessel.log.level and tessel.log.file turn the engine's log on.
  */
 public final class NotifyProbe {
@@ -46,14 +46,14 @@ public final class NotifyProbe {
       public void answered(int informId, int requestId, String deviceAddress,
           String managerAddress, int managerPort, int errorStatus, int errorIndex, String[] oids,
           String[] types, String[] values) {
-        informs.add("answered");
+        informs.add("answered " + deviceAddress + " " + managerAddress + ":" + managerPort);
       }
 
       @Override
       public void dropped(int informId, int version, String community, String userName,
           String contextName, String managerAddress, int managerPort, String[] oids,
           String[] types, String[] values) {
-        informs.add("dropped");
+        informs.add("dropped " + managerAddress + ":" + managerPort);
       }
     });
     if (!simulator.nativeInitAgentParams(true,
