@@ -308,6 +308,16 @@ std::optional<AgentSession> FindAgentSession(const std::string& address, std::in
   return CopyAgentSession(**found);
 }
 
+std::optional<AgentSession> FindStartedAgentById(std::int32_t agentId) {
+  Registry& registry = TheRegistry();
+  std::lock_guard<std::mutex> lock(registry.mutex);
+  for (const std::unique_ptr<AgentSession>& session : registry.sessions) {
+    if (session->agentInfo->agentId == agentId && session->socket != kNoSocket)
+      return CopyAgentSession(*session);
+  }
+  return std::nullopt;
+}
+
 std::int32_t RegisteredAgentCount() {
   Registry& registry = TheRegistry();
   std::lock_guard<std::mutex> lock(registry.mutex);

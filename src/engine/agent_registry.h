@@ -59,6 +59,8 @@ void SetCommunitiesValue(const std::string& address, const std::vector<std::stri
 std::optional<AgentSession> LookupAgentByAddress(const std::string& address);
 // The first registered agent with this address and configured port.
 std::optional<AgentSession> FindAgentSession(const std::string& address, std::int32_t port);
+// The first registered agent with this agentId that holds its socket.
+std::optional<AgentSession> FindStartedAgentById(std::int32_t agentId);
 std::int32_t RegisteredAgentCount();
 // Copies of every registered session, in registration order.
 std::vector<AgentSession> RegisteredAgents();

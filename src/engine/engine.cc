@@ -8,6 +8,7 @@
 #include "base/stop_signal.h"
 #include "engine/engine_state.h"
 #include "engine/log.h"
+#include "notify/notifier.h"
 #include "snmp/handlers.h"
 #include "snmp/mib_tree.h"
 #include "snmp/service.h"
@@ -36,6 +37,7 @@ bool StartServicesLocked(Lifecycle& lifecycle) {
   StoreTreeCellsRefInArray();
   if (!lifecycle.servicesRunning) {
     if (!InitSnmpGeneralServices()) return false;
+    InitNotifications();
     lifecycle.servicesRunning = true;
   }
   gv_snmpServiceStarted = 1;
@@ -45,6 +47,7 @@ bool StartServicesLocked(Lifecycle& lifecycle) {
 void StopSnmpLocked(Lifecycle& lifecycle) {
   if (lifecycle.servicesRunning) {
     StopSnmpGeneralServices();
+    StopNotifications();
     lifecycle.servicesRunning = false;
   }
   FreeSnmpV3Resources();

@@ -11,6 +11,7 @@
 #include "engine/exports_marshal.h"
 #include "engine/jni_host.h"
 #include "engine/log.h"
+#include "notify/notifier.h"
 #include "snmp/mib_tree.h"
 #include "snmp/service.h"
 #include "snmp/statistics.h"
@@ -97,6 +98,70 @@ std::optional<std::vector<std::string>> FirstTexts(JNIEnv* env, jobjectArray arr
   if (!texts || count < 0 || texts->size() < static_cast<std::size_t>(count)) return std::nullopt;
   texts->resize(static_cast<std::size_t>(count));
   return texts;
+}
+
+// The bindings of a notification as the host passed them; absent arrays stay absent.
+NotificationBindingTexts BindingTexts(JNIEnv* env, jobjectArray oids, jintArray types,
+                                      jobjectArray values) {
+  return {StringsFromJava(env, oids), IntsFromJava(env, types), StringsFromJava(env, values)};
+}
+
+// The manager, device and bindings every notification export passes.
+NotificationRequest Notification(JNIEnv* env, jstring host, jint port, jstring community,
+                                 jobjectArray oids, jintArray types, jobjectArray values,
+                                 jint agentId, jstring agentText) {
+  NotificationRequest request;
+  request.managerHost = Text(env, host);
+  request.managerPort = port;
+  request.community = Text(env, community);
+  request.bindings = BindingTexts(env, oids, types, values);
+  request.agentId = agentId;
+  request.agentText = Text(env, agentText);
+  return request;
+}
+
+void SendV1(JNIEnv* env, jstring host, jint port, jstring community, jstring enterprise,
+            jint generic, jint specific, jobjectArray oids, jintArray types, jobjectArray values,
+            jint agentId, jstring agentText) {
+  GuardedVoid([&] {
+    NotificationRequest request =
+        Notification(env, host, port, community, oids, types, values, agentId, agentText);
+    request.pduType = kTrapV1;
+    request.version = kSnmpV1;
+    request.enterprise = Text(env, enterprise);
+    request.genericTrap = generic;
+    request.specificTrap = specific;
+    SendNotification(request);
+  });
+}
+
+// selector 1 sends an SNMPv2-Trap, any other value an InformRequest.
+void SendV2(JNIEnv* env, jstring host, jint port, jstring community, jstring trapOid,
+            jobjectArray oids, jintArray types, jobjectArray values, jint agentId,
+            jstring agentText, jint selector) {
+  GuardedVoid([&] {
+    NotificationRequest request =
+        Notification(env, host, port, community, oids, types, values, agentId, agentText);
+    request.pduType = selector == 1 ? kTrapV2 : kInformRequest;
+    request.version = kSnmpV2c;
+    request.trapOid = Text(env, trapOid);
+    SendNotification(request);
+  });
+}
+
+void SendV3(std::uint8_t pduType, JNIEnv* env, jstring host, jint port, jstring community,
+            jstring trapOid, jstring userName, jstring contextName, jobjectArray oids,
+            jintArray types, jobjectArray values, jint agentId, jstring agentText) {
+  GuardedVoid([&] {
+    NotificationRequest request =
+        Notification(env, host, port, community, oids, types, values, agentId, agentText);
+    request.pduType = pduType;
+    request.version = kSnmpV3;
+    request.trapOid = Text(env, trapOid);
+    request.userName = Text(env, userName);
+    request.contextName = Text(env, contextName);
+    SendNotification(request);
+  });
 }
 
 }  // namespace
@@ -287,6 +352,65 @@ JNIEXPORT jstring JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_G
     JNIEnv* env, jobject, jstring oid) {
   return Guarded<jstring>(nullptr,
                           [&] { return OptionalText(env, GetNextGroupOid(Text(env, oid))); });
+}
+
+JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_SendV1TimerTrap(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring enterprise,
+    jint generic, jint specific, jobjectArray oids, jintArray types, jobjectArray values,
+    jint agentId, jstring agentText) {
+  SendV1(env, host, port, community, enterprise, generic, specific, oids, types, values, agentId,
+         agentText);
+}
+
+JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpHandler_SendV2TimerTrap(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jobjectArray oids, jintArray types, jobjectArray values, jint agentId, jstring agentText,
+    jint selector) {
+  SendV2(env, host, port, community, trapOid, oids, types, values, agentId, agentText, selector);
+}
+
+// ---- com.kestrelon.simulator.tessel.snmp.SnmpTrapService ----
+
+JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_SendV1Trap(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring enterprise,
+    jint generic, jint specific, jobjectArray oids, jintArray types, jobjectArray values,
+    jint agentId, jstring agentText) {
+  SendV1(env, host, port, community, enterprise, generic, specific, oids, types, values, agentId,
+         agentText);
+}
+
+JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_SendV2Trap(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jobjectArray oids, jintArray types, jobjectArray values, jint agentId, jstring agentText,
+    jint selector) {
+  SendV2(env, host, port, community, trapOid, oids, types, values, agentId, agentText, selector);
+}
+
+JNIEXPORT void JNICALL Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_SendV3Trap(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jstring userName, jstring contextName, jobjectArray oids, jintArray types, jobjectArray values,
+    jint agentId, jstring agentText) {
+  SendV3(kTrapV2, env, host, port, community, trapOid, userName, contextName, oids, types, values,
+         agentId, agentText);
+}
+
+// ---- com.kestrelon.simulator.tessel.snmp.SnmpInformInterfaceImpl ----
+
+JNIEXPORT void JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SnmpInformInterfaceImpl_SendV2Inform(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jobjectArray oids, jintArray types, jobjectArray values, jint agentId, jstring agentText,
+    jint selector) {
+  SendV2(env, host, port, community, trapOid, oids, types, values, agentId, agentText, selector);
+}
+
+JNIEXPORT void JNICALL
+Java_com_kestrelon_simulator_tessel_snmp_SnmpInformInterfaceImpl_SendV3Inform(
+    JNIEnv* env, jobject, jstring host, jint port, jstring community, jstring trapOid,
+    jstring userName, jstring contextName, jobjectArray oids, jintArray types, jobjectArray values,
+    jint agentId, jstring agentText) {
+  SendV3(kInformRequest, env, host, port, community, trapOid, userName, contextName, oids, types,
+         values, agentId, agentText);
 }
 
 // ---- com.kestrelon.simulator.tessel.snmp.SnmpRegister ----

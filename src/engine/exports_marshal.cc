@@ -44,22 +44,4 @@ jintArray IntsToJava(JNIEnv* env, std::span<const std::int32_t> values) {
   return array;
 }
 
-jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size) {
-  jclass stringClass = JavaStringClass(env);
-  if (stringClass == nullptr) return nullptr;
-  jobjectArray array = env->NewObjectArray(static_cast<jsize>(size), stringClass, nullptr);
-  if (array == nullptr) {
-    env->ExceptionClear();
-    LOG_ERROR("unable to alloc memory \n");
-    return nullptr;
-  }
-  for (std::size_t i = 0; i < texts.size() && i < size; ++i) {
-    jstring text = StringToJava(env, texts[i]);
-    if (text == nullptr) return nullptr;
-    env->SetObjectArrayElement(array, static_cast<jsize>(i), text);
-    env->DeleteLocalRef(text);
-  }
-  return array;
-}
-
 }  // namespace tessel

@@ -18,7 +18,5 @@ std::optional<std::vector<std::string>> StringsFromJava(JNIEnv* env, jobjectArra
 std::optional<std::vector<std::int32_t>> IntsFromJava(JNIEnv* env, jintArray array);
 // nullptr on failure.
 jintArray IntsToJava(JNIEnv* env, std::span<const std::int32_t> values);
-// A String[size] holding texts in order and null after them; nullptr on failure.
-jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size);
 
 }  // namespace tessel

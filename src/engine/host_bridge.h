@@ -33,6 +33,25 @@ struct HostValueQuery {
   std::optional<std::string> syntax;
 };
 
+// An inform as the host is told of it, answered or dropped. The bindings are given as three texts
+// each: the dotted OID, the name of its type and its value.
+struct InformReport {
+  std::uint32_t informId = 0;
+  std::int32_t requestId = 0;
+  std::int32_t version = 0;
+  std::string community;
+  std::string userName;
+  std::string contextName;
+  std::string managerAddress;
+  std::int32_t managerPort = 0;
+  std::string deviceAddress;
+  std::int32_t errorStatus = 0;  // of the Response
+  std::int32_t errorIndex = 0;
+  std::vector<std::string> oids;
+  std::vector<std::string> types;
+  std::vector<std::string> values;
+};
+
 // A host's answer: a String[] whose elements may be null, or null altogether.
 using HostAnswer = std::optional<std::vector<std::optional<std::string>>>;
 
@@ -50,6 +69,11 @@ class HostBridge {
   // [value, column-and-instance relative to the entry OID, error]
   virtual HostAnswer TableGetNextOidVal(const HostValueQuery& query) = 0;
   virtual HostAnswer TableSetOidVal(const HostValueQuery& query) = 0;
+
+  // An inform was acknowledged (with the Response's bindings), or dropped (with its own). A host
+  // that does not follow informs leaves them alone.
+  virtual void LogResponseMessage(const InformReport& /*report*/) {}
+  virtual void StoreDroppedInformMessage(const InformReport& /*report*/) {}
 };
 
 // The installed host, or nullptr. Installing is not synchronised with calls in flight: install

@@ -229,6 +229,18 @@ constexpr MethodName kValueMethods[kValueMethodCount] = {
      "String;"},
 };
 
+// The handler's methods that hear of informs, in the order of InformMethod.
+enum InformMethod : int { kLogResponse, kStoreDropped, kInformMethodCount };
+
+constexpr MethodName kInformMethods[kInformMethodCount] = {
+    {"LogResponseMessage",
+     "(ILjava/lang/String;ILjava/lang/String;III[Ljava/lang/String;[Ljava/lang/String;[Ljava/"
+     "lang/String;)V"},
+    {"StoreDroppedInformMessage",
+     "(IILjava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I[Ljava/lang/"
+     "String;[Ljava/lang/String;[Ljava/lang/String;)V"},
+};
+
 // Status methods the handler must have although the engine does not call them.
 constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"},
                                          {"setProgressValue", "(I)V"}};
@@ -249,6 +261,7 @@ struct HandlerBinding {
   JavaVM* vm;
   GlobalRef object;
   jmethodID methods[kValueMethodCount] = {};
+  jmethodID informMethods[kInformMethodCount] = {};
 };
 
 // The arguments of one value call, converted in the caller's local frame.
@@ -284,6 +297,13 @@ class JavaArguments {
   JavaArguments& Int(std::int32_t number) {
     jvalue value;
     value.i = number;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Texts(const std::vector<std::string>& texts) {
+    jvalue value;
+    value.l = StringsToJava(env_, texts, texts.size());
+    failed_ = failed_ || value.l == nullptr;
     values_.push_back(value);
     return *this;
   }
@@ -353,6 +373,24 @@ jclass JavaStringClass(JNIEnv* env) {
   return strings == nullptr ? nullptr : strings->stringClass;
 }
 
+jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size) {
+  jclass stringClass = JavaStringClass(env);
+  if (stringClass == nullptr) return nullptr;
+  jobjectArray array = env->NewObjectArray(static_cast<jsize>(size), stringClass, nullptr);
+  if (array == nullptr) {
+    env->ExceptionClear();
+    LOG_ERROR("unable to alloc memory \n");
+    return nullptr;
+  }
+  for (std::size_t i = 0; i < texts.size() && i < size; ++i) {
+    jstring text = StringToJava(env, texts[i]);
+    if (text == nullptr) return nullptr;
+    env->SetObjectArrayElement(array, static_cast<jsize>(i), text);
+    env->DeleteLocalRef(text);
+  }
+  return array;
+}
+
 JniHost& JniHost::Instance() {
   static NoDestructor<JniHost> instance;
   return instance.Get();
@@ -390,6 +428,11 @@ bool JniHost::BindSnmpHandler(JNIEnv* env, jobject handler) {
     binding->methods[i] =
         LookUpMethod(env, type, kValueMethods[i].name, kValueMethods[i].signature);
     if (binding->methods[i] == nullptr) return false;
+  }
+  for (int i = 0; i < kInformMethodCount; ++i) {
+    binding->informMethods[i] =
+        LookUpMethod(env, type, kInformMethods[i].name, kInformMethods[i].signature);
+    if (binding->informMethods[i] == nullptr) return false;
   }
   for (const MethodName& method : kStatusMethods) {
     if (LookUpMethod(env, type, method.name, method.signature) == nullptr) return false;
@@ -538,6 +581,43 @@ HostAnswer JniHost::TableSetOidVal(const HostValueQuery& query) {
     a.Constant(query.databaseName).Constant(query.tableName).Text(query.valueText);
     for (int i = 0; i < 6; ++i) a.Null();  // the host's row arrays, which the engine never fills
     a.Int(query.dataType).AgentTail(query);
+  });
+}
+
+template <typename Fill>
+void JniHost::CallInformMethod(int method, Fill fill) {
+  std::shared_ptr<const HandlerBinding> handler = Handler();
+  if (!handler) return;
+  JNIEnv* env = AttachedEnv(handler->vm);
+  if (env == nullptr) return;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return;
+  try {
+    JavaArguments arguments(env);
+    fill(arguments);
+    if (arguments.Failed()) return;
+    env->CallVoidMethodA(handler->object.Get(), handler->informMethods[method], arguments.Values());
+    ClearException(env, kInformMethods[method].name);
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("unable to alloc memory \n");
+  }
+}
+
+void JniHost::LogResponseMessage(const InformReport& report) {
+  CallInformMethod(kLogResponse, [&](JavaArguments& a) {
+    a.Int(report.requestId).Text(report.managerAddress);
+    a.Int(static_cast<std::int32_t>(report.informId)).Text(report.deviceAddress);
+    a.Int(report.managerPort).Int(report.errorStatus).Int(report.errorIndex);
+    a.Texts(report.oids).Texts(report.types).Texts(report.values);
+  });
+}
+
+void JniHost::StoreDroppedInformMessage(const InformReport& report) {
+  CallInformMethod(kStoreDropped, [&](JavaArguments& a) {
+    a.Int(report.version).Int(static_cast<std::int32_t>(report.informId));
+    a.Text(report.community).Text(report.userName).Text(report.contextName);
+    a.Text(report.managerAddress).Int(report.managerPort);
+    a.Texts(report.oids).Texts(report.types).Texts(report.values);
   });
 }
 

@@ -48,8 +48,13 @@ class JniHost final : public HostBridge {
   HostAnswer TableGetOidVal(const HostValueQuery& query) override;
   HostAnswer TableGetNextOidVal(const HostValueQuery& query) override;
   HostAnswer TableSetOidVal(const HostValueQuery& query) override;
+  void LogResponseMessage(const InformReport& report) override;
+  void StoreDroppedInformMessage(const InformReport& report) override;
 
  private:
+  // Calls the handler's inform method (kLogResponse or kStoreDropped) with what fill adds.
+  template <typename Fill>
+  void CallInformMethod(int method, Fill fill);
   std::shared_ptr<const SimulatorBinding> Simulator() const;
   std::shared_ptr<const HandlerBinding> Handler() const;
   // Calls value method number method with the arguments fill adds.
@@ -67,6 +72,8 @@ class JniHost final : public HostBridge {
 jstring StringToJava(JNIEnv* env, const std::string& text);
 // java.lang.String's class, held for the life of the process; nullptr when it cannot be had.
 jclass JavaStringClass(JNIEnv* env);
+// A String[size] holding texts in order and null after them; nullptr on failure.
+jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size);
 
 // The engine's array counts are 16-bit: longer host arrays are read up to this many elements.
 inline constexpr jsize kMaxJavaArrayElements = 65535;

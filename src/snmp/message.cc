@@ -1,5 +1,6 @@
 #include "snmp/message.h"
 
+#include <atomic>
 #include <cstring>
 #include <new>
 
@@ -102,9 +103,15 @@ int AnswerInform(const std::uint8_t* message, std::size_t length, const PduLayou
   return kMessageReply;
 }
 
+std::atomic<ResponseReceiver> responseReceiver{nullptr};
+
 int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const PduLayout& layout,
                          SnmpPdu* pdu, std::uint8_t* reply, std::size_t* replyLength,
                          const AgentSession& agent) {
+  if (pdu->type == kGetResponse) {
+    ResponseReceiver receiver = responseReceiver.load();
+    return receiver != nullptr && receiver(*pdu, agent) ? kMessageConsumed : kMessageDrop;
+  }
   if (!IsValidAuthentication(*pdu, *agent.agentInfo)) return kMessageDrop;
   switch (ProcessRequestPdu(pdu, agent, nullptr)) {
     case RequestOutcome::kEchoInform:
@@ -123,6 +130,8 @@ int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const 
 }
 
 }  // namespace
+
+void InstallResponseReceiver(ResponseReceiver receiver) { responseReceiver = receiver; }
 
 std::int32_t MapErrorStatusToV1(std::int32_t status) {
   switch (status) {
@@ -241,6 +250,8 @@ int ProcessDatagram(const std::uint8_t* message, std::size_t length, std::uint8_
   if (result == kMessageDrop) {
     LOG_ERROR("PACKET DROPPED !!! \n");
     CountSnmp(SnmpCounter::kDroppedRequests);
+    *replyLength = 0;
+  } else if (result == kMessageConsumed) {
     *replyLength = 0;
   } else if (result == kMessageReply) {
     CountSnmp(SnmpCounter::kOutMessages);

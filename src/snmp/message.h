@@ -14,6 +14,15 @@ namespace tessel {
 // Result of ProcessSnmpMessage.
 inline constexpr int kMessageDrop = 0;
 inline constexpr int kMessageReply = 1;
+// Taken by the engine's notification side (a Response to an inform); nothing to send.
+inline constexpr int kMessageConsumed = 2;
+
+// Receives every SNMPv1/SNMPv2c Response that reaches an agent (whatever its community: it is
+// matched with what the agent sent, not authorised as a request) and tells whether it answered
+// something the agent sent. Installed once, before agents serve; a Response that answers nothing
+// is dropped.
+using ResponseReceiver = bool (*)(const SnmpPdu& pdu, const AgentSession& agent);
+void InstallResponseReceiver(ResponseReceiver receiver);
 
 // Processes one request datagram for the agent. *replyLength is the reply capacity in and the
 // reply's length out. 1: send the reply; 0: drop; 99: resource failure.

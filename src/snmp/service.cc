@@ -17,9 +17,9 @@
 #include "engine/agent_registry.h"
 #include "engine/engine_state.h"
 #include "engine/log.h"
+#include "snmp/agent_sockets.h"
 #include "snmp/message.h"
 #include "snmp/statistics.h"
-#include "snmp/agent_sockets.h"
 #include "transport/socket_batch.h"
 #include "transport/udp.h"
 #include "transport/udp_batch.h"
@@ -89,9 +89,9 @@ bool Answer(const sockaddr_storage& peer, std::span<const std::uint8_t> datagram
   SetPeer(peer, &request.transport);
   LOG_TRACE("Received Packet from %s : at %d", request.transport.peerAddress.c_str(),
             request.transport.peerPort);
-  if (ProcessSnmpMessage(datagram.data(), datagram.size(), reply, length, request) !=
-      kMessageReply) {
-    LOG_ERROR("ProcessSnmpPDU() is failed. ");
+  int result = ProcessSnmpMessage(datagram.data(), datagram.size(), reply, length, request);
+  if (result != kMessageReply) {
+    if (result != kMessageConsumed) LOG_ERROR("ProcessSnmpPDU() is failed. ");
     return false;
   }
   if (*length == 0) return false;
@@ -146,8 +146,9 @@ void ServeAgentSockets(std::span<const int> descriptors, ThreadState& state) {
 void ReplyViaWildcard(const AgentSession& agent, const std::uint8_t* data, std::size_t length) {
   thread_local std::vector<std::uint8_t> reply(kMaxSnmpMessage);
   std::size_t replyLength = reply.size();
-  if (ProcessSnmpMessage(data, length, reply.data(), &replyLength, agent) != kMessageReply) {
-    LOG_ERROR("ProcessSnmpPDU() is failed. ");
+  int result = ProcessSnmpMessage(data, length, reply.data(), &replyLength, agent);
+  if (result != kMessageReply) {
+    if (result != kMessageConsumed) LOG_ERROR("ProcessSnmpPDU() is failed. ");
     return;
   }
   if (replyLength == 0) return;

@@ -280,58 +280,6 @@ std::string PrivKey(const V3Request& request) {
   return GetLocalKeyValue(request.user->privPassword, request.user->auth, request.agentEngineId);
 }
 
-struct OutgoingSecurity {
-  std::uint8_t level = kNoAuthNoPriv;
-  std::uint32_t boots = 0;
-  std::uint32_t time = 0;
-  std::string salt;
-};
-
-// The whole message around an already encoded scoped PDU field (plaintext SEQUENCE or the
-// encrypted OCTET STRING); authenticated when the level asks for it.
-bool WrapMessage(const V3Request& request, const OutgoingSecurity& out,
-                 const std::vector<std::uint8_t>& scopedField, std::uint8_t* reply,
-                 std::size_t* replyLength) {
-  Builder message(*replyLength);
-  std::size_t outer = message.Open(kAsnSequence);
-  message.Integer(3);
-  std::size_t global = message.Open(kAsnSequence);
-  message.Integer(request.header.msgId);
-  message.Integer(request.header.msgMaxSize);
-  message.Octets(std::string(1, static_cast<char>(out.level)));
-  message.Integer(kUsmSecurityModel);
-  message.Close(global);
-  std::size_t wrapper = message.Open(kAsnOctetString);
-  std::size_t parameters = message.Open(kAsnSequence);
-  message.Octets(request.agentEngineId);
-  message.Integer(static_cast<std::int32_t>(out.boots));
-  message.Integer(static_cast<std::int32_t>(out.time));
-  message.Octets(request.security.userName);
-  std::size_t digestAt =
-      message.Octets(out.level == kNoAuthNoPriv ? std::string() : std::string(kDigestLength, '\0'));
-  message.Octets(out.salt);
-  message.Close(parameters);
-  message.Close(wrapper);
-  message.Raw(scopedField.data(), scopedField.size());
-  message.Close(outer);
-  if (!message.ok()) {
-    LOG_ERROR("Unable to encode message header.\n");
-    return false;
-  }
-  if (out.level != kNoAuthNoPriv) {
-    std::uint8_t digest[kDigestLength];
-    if (!CalculateDigest(request.user->auth, AuthKey(request), message.Data(), message.Offset(),
-                         digest)) {
-      LOG_ERROR("Digest failed, when creating respons message.\n");
-      return false;
-    }
-    std::copy(digest, digest + kDigestLength, message.Data() + digestAt);
-  }
-  std::copy(message.Data(), message.Data() + message.Offset(), reply);
-  *replyLength = message.Offset();
-  return true;
-}
-
 std::vector<std::uint8_t> EncodeScoped(std::string_view contextEngineId,
                                        std::string_view contextName, const std::uint8_t* pdu,
                                        std::size_t pduLength) {
@@ -343,6 +291,46 @@ std::vector<std::uint8_t> EncodeScoped(std::string_view contextEngineId,
   scoped.Close(header);
   if (!scoped.ok()) return {};
   return {scoped.Data(), scoped.Data() + scoped.Offset()};
+}
+
+// The scoped PDU as msgData carries it: the plaintext SEQUENCE, or at authPriv its encryption
+// as an OCTET STRING (with the salt to send). Empty when encryption fails.
+std::vector<std::uint8_t> ScopedField(const V3Envelope& envelope,
+                                      const std::vector<std::uint8_t>& scoped, std::string* salt) {
+  if (envelope.level != kAuthPriv) return scoped;
+  std::vector<std::uint8_t> cipher;
+  std::uint8_t saltOctets[kSaltLength];
+  if (!EncryptScopedPdu(envelope.priv, envelope.privKey, envelope.boots, envelope.time,
+                        scoped.data(), scoped.size(), &cipher, saltOctets)) {
+    LOG_ERROR("Encryption Failed  !!!\n");
+    return {};
+  }
+  salt->assign(reinterpret_cast<const char*>(saltOctets), kSaltLength);
+  Builder encrypted(cipher.size() + 8);
+  encrypted.Append([&](std::uint8_t* cursor, std::int32_t* room) {
+    return AsnBuildString(cursor, room, kAsnOctetString, cipher.data(), cipher.size());
+  });
+  return {encrypted.Data(), encrypted.Data() + encrypted.Offset()};
+}
+
+// The envelope of a reply at level to request: the agent is the authoritative engine, and the
+// request's user signs and encrypts.
+V3Envelope ReplyEnvelope(const V3Request& request, std::uint8_t level) {
+  V3Envelope envelope;
+  envelope.msgId = request.header.msgId;
+  envelope.msgMaxSize = request.header.msgMaxSize;
+  envelope.level = level;
+  envelope.engineId = request.agentEngineId;
+  envelope.userName = request.security.userName;
+  if (request.user && level != kNoAuthNoPriv) {
+    envelope.auth = request.user->auth;
+    envelope.authKey = AuthKey(request);
+  }
+  if (request.user && level == kAuthPriv) {
+    envelope.priv = request.user->priv;
+    envelope.privKey = PrivKey(request);
+  }
+  return envelope;
 }
 
 // A Report PDU with one usmStats counter: identifier 0xA8 and a one-octet length.
@@ -374,19 +362,19 @@ int SendReport(V3Request& request, const UsmError& error, std::uint8_t* reply,
       request.message.end());
   std::int32_t requestId = ParseScopedPdu(&scoped, false) ? scoped.pdu.requestId : 0;
   std::vector<std::uint8_t> pdu = EncodeReportPdu(requestId, error);
-  OutgoingSecurity out;
-  out.level = request.user && error.reportLevel == kAuthNoPriv ? kAuthNoPriv : kNoAuthNoPriv;
-  if (out.level != kNoAuthNoPriv || gv_discoveryTimeFlag.load()) {
-    out.boots = request.agentBoots;
-    out.time = request.agentTime;
+  V3Envelope envelope = ReplyEnvelope(
+      request, request.user && error.reportLevel == kAuthNoPriv ? kAuthNoPriv : kNoAuthNoPriv);
+  if (envelope.level != kNoAuthNoPriv || gv_discoveryTimeFlag.load()) {
+    envelope.boots = request.agentBoots;
+    envelope.time = request.agentTime;
   }
-  std::vector<std::uint8_t> field =
-      EncodeScoped(request.agentEngineId, scoped.contextName, pdu.data(), pdu.size());
+  envelope.contextEngineId = request.agentEngineId;
+  envelope.contextName = scoped.contextName;
   CountSnmp(SnmpCounter::kV3SecurityErrors);
   LOG_TRACE("Returning Snmpv3 error like unknown engine Id, etc.\n");
-  if (pdu.empty() || field.empty() || !WrapMessage(request, out, field, reply, replyLength))
-    return kMessageDrop;
-  return kMessageReply;
+  if (pdu.empty()) return kMessageDrop;
+  return EncodeV3Message(envelope, pdu.data(), pdu.size(), reply, replyLength) ? kMessageReply
+                                                                               : kMessageDrop;
 }
 
 // ---- Checking ----
@@ -494,30 +482,15 @@ int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::siz
   std::int32_t remaining = static_cast<std::int32_t>(pdu.size());
   std::uint8_t* end = BuildResponsePdu(pdu.data(), &remaining, &scoped.pdu, scoped.layout);
   if (end == nullptr) return kMessageDrop;
-  std::vector<std::uint8_t> field =
-      EncodeScoped(scoped.contextEngineId, scoped.contextName, pdu.data(),
-                   static_cast<std::size_t>(end - pdu.data()));
-  OutgoingSecurity out;
-  out.level = request.level;
-  out.boots = request.agentBoots;
-  out.time = request.agentTime;
-  if (request.level == kAuthPriv) {
-    std::vector<std::uint8_t> cipher;
-    std::uint8_t salt[kSaltLength];
-    if (!EncryptScopedPdu(request.user->priv, PrivKey(request), out.boots, out.time, field.data(),
-                          field.size(), &cipher, salt)) {
-      LOG_ERROR("Encryption Failed  !!!\n");
-      return kMessageDrop;
-    }
-    out.salt.assign(reinterpret_cast<const char*>(salt), kSaltLength);
-    Builder encrypted(cipher.size() + 8);
-    encrypted.Append([&](std::uint8_t* cursor, std::int32_t* room) {
-      return AsnBuildString(cursor, room, kAsnOctetString, cipher.data(), cipher.size());
-    });
-    field.assign(encrypted.Data(), encrypted.Data() + encrypted.Offset());
-  }
+  V3Envelope envelope = ReplyEnvelope(request, request.level);
+  envelope.boots = request.agentBoots;
+  envelope.time = request.agentTime;
+  envelope.contextEngineId = scoped.contextEngineId;
+  envelope.contextName = scoped.contextName;
   *replyLength = limit;
-  if (!WrapMessage(request, out, field, reply, replyLength)) return kMessageDrop;
+  if (!EncodeV3Message(envelope, pdu.data(), static_cast<std::size_t>(end - pdu.data()), reply,
+                       replyLength))
+    return kMessageDrop;
   CountErrorStatus(scoped.pdu.errorStatus);
   return kMessageReply;
 }
@@ -596,12 +569,100 @@ void ResetV3Statistics() {
   for (auto& counter : v3Counters) counter.store(0);
 }
 
+bool EncodeV3Message(const V3Envelope& envelope, const std::uint8_t* pdu, std::size_t pduLength,
+                     std::uint8_t* out, std::size_t* length) {
+  std::vector<std::uint8_t> scoped =
+      EncodeScoped(envelope.contextEngineId, envelope.contextName, pdu, pduLength);
+  std::string salt;
+  std::vector<std::uint8_t> field = scoped.empty() ? scoped : ScopedField(envelope, scoped, &salt);
+  if (field.empty()) return false;
+  Builder message(*length);
+  std::size_t outer = message.Open(kAsnSequence);
+  message.Integer(3);
+  std::size_t global = message.Open(kAsnSequence);
+  message.Integer(envelope.msgId);
+  message.Integer(envelope.msgMaxSize);
+  auto flags = static_cast<std::uint8_t>(envelope.level | (envelope.reportable ? 0x04 : 0));
+  message.Octets(std::string(1, static_cast<char>(flags)));
+  message.Integer(kUsmSecurityModel);
+  message.Close(global);
+  std::size_t wrapper = message.Open(kAsnOctetString);
+  std::size_t parameters = message.Open(kAsnSequence);
+  message.Octets(envelope.engineId);
+  message.Integer(static_cast<std::int32_t>(envelope.boots));
+  message.Integer(static_cast<std::int32_t>(envelope.time));
+  message.Octets(envelope.userName);
+  bool authenticated = envelope.level != kNoAuthNoPriv;
+  std::size_t digestAt =
+      message.Octets(authenticated ? std::string(kDigestLength, '\0') : std::string());
+  message.Octets(salt);
+  message.Close(parameters);
+  message.Close(wrapper);
+  message.Raw(field.data(), field.size());
+  message.Close(outer);
+  if (!message.ok()) {
+    LOG_ERROR("Unable to encode message header.\n");
+    return false;
+  }
+  if (authenticated) {
+    std::uint8_t digest[kDigestLength];
+    if (!CalculateDigest(envelope.auth, envelope.authKey, message.Data(), message.Offset(),
+                         digest)) {
+      LOG_ERROR("Digest failed, when creating respons message.\n");
+      return false;
+    }
+    std::copy(digest, digest + kDigestLength, message.Data() + digestAt);
+  }
+  std::copy(message.Data(), message.Data() + message.Offset(), out);
+  *length = message.Offset();
+  return true;
+}
+
+namespace {
+std::atomic<V3MessageReceiver> v3Receiver{nullptr};
+}  // namespace
+
+void InstallV3MessageReceiver(V3MessageReceiver receiver) { v3Receiver = receiver; }
+
+bool ParseV3Message(const std::uint8_t* message, std::size_t length, const UsmUser* user,
+                    V3Received* received) {
+  V3Request request;
+  request.message.assign(message, message + length);
+  if (!ParseRequest(request)) return false;
+  received->msgId = request.header.msgId;
+  received->level = request.level;
+  received->engineId = request.security.engineId;
+  received->boots = static_cast<std::uint32_t>(request.security.boots);
+  received->time = static_cast<std::uint32_t>(request.security.time);
+  received->userName = request.security.userName;
+  if (request.level != kNoAuthNoPriv) {
+    if (user == nullptr) return false;  // the header is read: the caller finds the user by it
+    request.user = *user;
+    request.agentEngineId = request.security.engineId;  // the keys of the sending engine
+    if (!Authentic(request)) {
+      LOG_ERROR("Authentication is failed. \n");
+      return false;
+    }
+  }
+  ScopedPdu scoped;
+  if (!ScopedPlaintext(request, &scoped.plaintext) || !ParseScopedPdu(&scoped, false)) return false;
+  received->contextEngineId = std::move(scoped.contextEngineId);
+  received->contextName = std::move(scoped.contextName);
+  received->pdu = std::move(scoped.pdu);
+  return true;
+}
+
 int ProcessSnmpV3Message(const std::uint8_t* message, std::size_t length, std::uint8_t* reply,
                          std::size_t* replyLength, const AgentSession& agent) {
   V3Request request;
   request.message.assign(message, message + length);
   if (!ParseRequest(request)) return kMessageDrop;
   request.agentEngineId = AgentEngineId(agent);
+  // A message of another authoritative engine may answer what the agent sent.
+  V3MessageReceiver receiver = v3Receiver.load();
+  if (receiver != nullptr && !request.security.engineId.empty() &&
+      request.security.engineId != request.agentEngineId && receiver(message, length, agent))
+    return kMessageConsumed;
   request.agentBoots = agent.agentInfo ? agent.agentInfo->engineBoots.load() : 0;
   request.agentTime = AgentEngineTime(agent);
   Check check = CheckSecurity(request);

@@ -120,4 +120,24 @@ AgentSession LocalAgent(std::int32_t agentId) {
   return agent;
 }
 
+std::vector<InformReport> MemoryHost::AnsweredInforms() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return answered_;
+}
+
+std::vector<InformReport> MemoryHost::DroppedInforms() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return dropped_;
+}
+
+void MemoryHost::LogResponseMessage(const InformReport& report) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  answered_.push_back(report);
+}
+
+void MemoryHost::StoreDroppedInformMessage(const InformReport& report) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  dropped_.push_back(report);
+}
+
 }  // namespace tessel

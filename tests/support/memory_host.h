@@ -29,6 +29,9 @@ class MemoryHost : public HostBridge {
   // serve from this host and should not pay for the copy).
   void RecordReads() { recordReads_ = true; }
   HostValueQuery LastRead() const;  // the query of the last Get or GetNext
+  // The informs the engine reported answered and dropped, in order.
+  std::vector<InformReport> AnsweredInforms() const;
+  std::vector<InformReport> DroppedInforms() const;
 
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
@@ -37,6 +40,8 @@ class MemoryHost : public HostBridge {
   HostAnswer TableGetOidVal(const HostValueQuery& query) override;
   HostAnswer TableGetNextOidVal(const HostValueQuery& query) override;
   HostAnswer TableSetOidVal(const HostValueQuery& query) override;
+  void LogResponseMessage(const InformReport& report) override;
+  void StoreDroppedInformMessage(const InformReport& report) override;
 
  private:
   struct Entry {
@@ -55,6 +60,8 @@ class MemoryHost : public HostBridge {
   std::vector<std::string> statusLines_;
   std::vector<HostValueQuery> setCalls_;
   HostValueQuery lastRead_;
+  std::vector<InformReport> answered_;
+  std::vector<InformReport> dropped_;
   bool recordReads_ = false;
 };
 

@@ -108,6 +108,60 @@ public class SnmpHandler {
 
   public native String GetNextGroupOid(String oid);
 
+  /** A trap the host fires from its timers, as {@link SnmpTrapService#SendV1Trap}. */
+  public native void SendV1TimerTrap(String managerHost, int managerPort, String community,
+      String enterprise, int genericTrap, int specificTrap, String[] oids, int[] types,
+      String[] values, int agentId, String agentText);
+
+  /** A notification the host fires from its timers, as {@link SnmpTrapService#SendV2Trap}. */
+  public native void SendV2TimerTrap(String managerHost, int managerPort, String community,
+      String trapOid, String[] oids, int[] types, String[] values, int agentId, String agentText,
+      int selector);
+
+  /** What the engine tells of the informs its devices send, from its own threads. */
+  public interface InformListener {
+    /**
+     * A Response from the manager acknowledged inform informId of the device at deviceAddress;
+     * the bindings are the Response's, as OIDs, type names and value texts.
+     */
+    void answered(int informId, int requestId, String deviceAddress, String managerAddress,
+        int managerPort, int errorStatus, int errorIndex, String[] oids, String[] types,
+        String[] values);
+
+    /** No Response came before the last timeout: the inform's own bindings. */
+    void dropped(int informId, int version, String community, String userName,
+        String contextName, String managerAddress, int managerPort, String[] oids,
+        String[] types, String[] values);
+  }
+
+  private volatile InformListener informListener;
+
+  public void setInformListener(InformListener listener) {
+    informListener = listener;
+  }
+
+  /** Called by the engine for an acknowledged inform. */
+  public void LogResponseMessage(int requestId, String managerAddress, int informId,
+      String deviceAddress, int managerPort, int errorStatus, int errorIndex, String[] oids,
+      String[] types, String[] values) {
+    InformListener listener = informListener;
+    if (listener != null) {
+      listener.answered(informId, requestId, deviceAddress, managerAddress, managerPort,
+          errorStatus, errorIndex, oids, types, values);
+    }
+  }
+
+  /** Called by the engine for a dropped inform. */
+  public void StoreDroppedInformMessage(int version, int informId, String community,
+      String userName, String contextName, String managerAddress, int managerPort, String[] oids,
+      String[] types, String[] values) {
+    InformListener listener = informListener;
+    if (listener != null) {
+      listener.dropped(informId, version, community, userName, contextName, managerAddress,
+          managerPort, oids, types, values);
+    }
+  }
+
   private static String[] answer(String value) {
     return value == null ? null : new String[] {value, NO_ERROR};
   }

@@ -1,0 +1,36 @@
+package com.kestrelon.simulator.tessel.snmp;
+
+import com.kestrelon.simulator.tessel.NativeLibrary;
+
+/**
+ * Traps that a device sends to one manager, from its own address and SNMP port. The device is
+ * named by its agent id ({@link GetModeInfoImpl#GetAgentID}); agentText only names it in the
+ * engine's log. The extra bindings are three arrays of one length: OIDs, BER type codes (153 for
+ * OCTET STRING) and value texts as the device data keeps them; null arrays add no bindings, and
+ * arrays of different lengths send nothing. Each manager receives the trap in its own version.
+ */
+public class SnmpTrapService {
+  static {
+    NativeLibrary.load();
+  }
+
+  /** An SNMPv1 Trap; a binding of sysUpTime.0 also gives its time-stamp. */
+  public native void SendV1Trap(String managerHost, int managerPort, String community,
+      String enterprise, int genericTrap, int specificTrap, String[] oids, int[] types,
+      String[] values, int agentId, String agentText);
+
+  /** An SNMPv2c notification: an SNMPv2-Trap when selector is 1, else an InformRequest. */
+  public native void SendV2Trap(String managerHost, int managerPort, String community,
+      String trapOid, String[] oids, int[] types, String[] values, int agentId, String agentText,
+      int selector);
+
+  /**
+   * An SNMPv2-Trap over SNMPv3 to userName, a user of the engine's SNMPv3 configuration, at the
+   * user's level and in contextName; the device is the authoritative engine. Not sent when the
+   * user or context is unknown, or when the user's notify view leaves out the trap or a binding.
+   * The community is not used.
+   */
+  public native void SendV3Trap(String managerHost, int managerPort, String community,
+      String trapOid, String userName, String contextName, String[] oids, int[] types,
+      String[] values, int agentId, String agentText);
+}

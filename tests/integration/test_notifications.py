@@ -1,0 +1,167 @@
+"""Notifications from a device, driven through the engine's exports by a small Java entry point
+(NotifyProbe), received by net-snmp's snmptrapd started here on a loopback port with its own
+configuration."""
+
+import os
+import socket
+import subprocess
+import tempfile
+import time
+from pathlib import Path
+
+import pytest
+
+from conftest import BASE_PORT, BUILD, JAVA, ROOT
+
+DEVICE = "127.0.3.60"
+DEVICE_PORT = BASE_PORT + 5
+TRAPD_PORT = BASE_PORT + 7
+SILENT_PORT = BASE_PORT + 8
+FIELDS = "%b|%a|%N|%w|%q|%P|%v\n"
+
+
+def probe(manager_port, kind, trap, *bindings, community="public"):
+    """Runs NotifyProbe, with the default SNMPv3 users; what it reports (the engine's status lines
+    left out)."""
+    jars = sorted(BUILD.glob("host/tessel-host*.jar"))
+    assert len(jars) == 2, f"host jars not found under {BUILD}/host"
+    command = [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
+               f"-Dtessel.snmpv3={ROOT / 'profiles' / 'snmpv3.conf'}",
+               "-cp", ":".join(str(j) for j in jars) + ":/usr/share/java/gson.jar",
+               "com.kestrelon.simulator.tessel.snmp.NotifyProbe", DEVICE, str(DEVICE_PORT), "127.0.0.1",
+               str(manager_port), kind, community, trap, *bindings]
+    result = subprocess.run(command, capture_output=True, text=True, timeout=60)
+    assert result.returncode == 0, result.stderr
+    return [line[len("probe: "):] for line in result.stdout.splitlines() if line.startswith("probe: ")]
+
+
+@pytest.fixture(scope="module")
+def trapd():
+    """snmptrapd logging every notification with community public, one line each."""
+    workdir = tempfile.mkdtemp(prefix="tessel-trapd-")
+    config, log = Path(workdir) / "snmptrapd.conf", Path(workdir) / "traps.log"
+    engine_id = f"{DEVICE}#{DEVICE_PORT}".encode().hex()
+    config.write_text("authCommunity log public\n"
+                      f"createUser -e 0x{engine_id} shaaes SHA shapassword AES aespassword\n"
+                      f"createUser -e 0x{engine_id} restricted SHA restrictedpw\n"
+                      # informs: snmptrapd is their authoritative engine
+                      "createUser shaaes SHA shapassword AES aespassword\n"
+                      "authUser log shaaes\nauthUser log restricted auth\n")
+    process = subprocess.Popen(
+        ["snmptrapd", "-f", "-C", "-c", str(config), "-M", "/dev/null", "-m", "", "-n", "-On",
+         "-Lf", str(log), "-F", FIELDS, f"udp:127.0.0.1:{TRAPD_PORT}"],
+        stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+    deadline = time.monotonic() + 10
+    while time.monotonic() < deadline and not (log.exists() and "NET-SNMP" in log.read_text()):
+        time.sleep(0.1)
+
+    def received(count, wait=10):
+        """The notification lines logged so far, once there are count of them."""
+        deadline = time.monotonic() + wait
+        while True:
+            rows = [line.split("|") for line in log.read_text().splitlines() if line.startswith("UDP:")]
+            if len(rows) >= count or time.monotonic() > deadline:
+                return rows
+            time.sleep(0.1)
+
+    yield received
+    process.terminate()
+    process.wait(timeout=15)
+    subprocess.run(["rm", "-rf", workdir], check=False)
+
+
+def source(row):
+    """"UDP: [a]:p->[b]:q" -> "a:p" """
+    return row[0].split("->")[0].replace("UDP: [", "").replace("]", "")
+
+
+def test_traps_and_informs_arrive_from_the_device_with_their_fields(trapd):
+    assert probe(TRAPD_PORT, "v1trap", "1.3.6.1.4.1.99/6/7", "1.3.6.1.2.1.2.2.1.1.2", "2", "2") == ["sent"]
+    assert probe(TRAPD_PORT, "v2trap", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.1.5.0", "4", "core-7") == ["sent"]
+    assert probe(TRAPD_PORT, "v2inform", "1.3.6.1.6.3.1.1.5.3", "1.3.6.1.2.1.2.2.1.1.2", "2", "2") == \
+        ["sent", f"answered {DEVICE} 127.0.0.1:{TRAPD_PORT}"]
+    v1, v2, inform = trapd(3)
+    for row in (v1, v2, inform):
+        assert source(row) == f"{DEVICE}:{DEVICE_PORT}"
+    assert v1[1:6] == [DEVICE, ".1.3.6.1.4.1.99", "6", ".7", "TRAP, SNMP v1, community public"]
+    assert v1[6] == ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: 2"
+    assert v2[5] == "TRAP2, SNMP v2c, community public"
+    bindings = v2[6].split("\t")
+    assert bindings[0].startswith(".1.3.6.1.2.1.1.3.0 = Timeticks:")
+    assert bindings[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.7",
+                            '.1.3.6.1.2.1.1.5.0 = STRING: "core-7"']
+    assert inform[5] == "INFORM, SNMP v2c, community public"
+    assert inform[6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.6.3.1.1.5.3",
+                                         ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: 2"]
+
+
+@pytest.fixture
+def silent():
+    """A manager's port that receives and never answers: the senders of what it received."""
+    sock = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+    sock.bind(("127.0.0.1", SILENT_PORT))
+
+    def senders():
+        sock.settimeout(0.5)
+        found = []
+        try:
+            while len(found) < 5:
+                found.append(sock.recvfrom(2048)[1])
+        except socket.timeout:
+            pass
+        return found
+
+    yield senders
+    sock.close()
+
+
+def test_inform_nobody_answers_is_sent_once_then_reported_dropped(silent):
+    start = time.monotonic()
+    assert probe(SILENT_PORT, "v2inform", "1.3.6.1.4.1.99.0.1") == ["sent", f"dropped 127.0.0.1:{SILENT_PORT}"]
+    assert time.monotonic() - start >= 5, "an inform waits 5 s for its Response"
+    assert silent() == [(DEVICE, DEVICE_PORT)], "1 + 0 retries, from the device"
+
+
+def test_v3_traps_arrive_authenticated_and_encrypted_and_only_within_the_notify_view(trapd):
+    before = len(trapd(0, wait=0))
+    assert probe(TRAPD_PORT, "v3trap", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.2.2.1.1.2", "2", "2",
+                 community="shaaes") == ["sent"]
+    # restricted's notify view leaves out the interfaces group: this one is not sent ...
+    assert probe(TRAPD_PORT, "v3trap", "1.3.6.1.4.1.99.0.8", "1.3.6.1.2.1.2.2.1.1.2", "2", "2",
+                 community="restricted") == ["sent"]
+    # ... and this one is.
+    assert probe(TRAPD_PORT, "v3trap", "1.3.6.1.4.1.99.0.9", "1.3.6.1.2.1.1.5.0", "4", "core-7",
+                 community="restricted") == ["sent"]
+    rows = trapd(before + 2)[before:]
+    time.sleep(0.5)
+    assert len(trapd(0, wait=0)) == before + 2, "the trap outside the notify view is not sent"
+    private, authenticated = rows
+    for row in rows:
+        assert source(row) == f"{DEVICE}:{DEVICE_PORT}"
+    assert private[5].startswith("TRAP2, SNMP v3, user shaaes, context")
+    assert private[6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.7",
+                                          ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: 2"]
+    assert authenticated[5].startswith("TRAP2, SNMP v3, user restricted, context")
+    assert authenticated[6].split("\t")[1] == ".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.9"
+
+
+def test_v3_inform_discovers_the_manager_and_is_answered(trapd):
+    before = len(trapd(0, wait=0))
+    assert probe(TRAPD_PORT, "v3inform", "1.3.6.1.4.1.99.0.7", "1.3.6.1.2.1.1.5.0", "4", "core-7",
+                 community="shaaes") == ["sent", f"answered {DEVICE} 127.0.0.1:{TRAPD_PORT}"]
+    rows = trapd(before + 1)[before:]
+    assert len(rows) == 1
+    assert source(rows[0]) == f"{DEVICE}:{DEVICE_PORT}"
+    assert rows[0][5].startswith("INFORM, SNMP v3, user shaaes, context")
+    assert rows[0][6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.7",
+                                          '.1.3.6.1.2.1.1.5.0 = STRING: "core-7"']
+
+
+def test_v3_inform_whose_manager_does_not_answer_discovery_is_dropped_at_once(silent):
+    start = time.monotonic()
+    assert probe(SILENT_PORT, "v3inform", "1.3.6.1.4.1.99.0.1", community="shaaes") == \
+        ["sent", f"dropped 127.0.0.1:{SILENT_PORT}"]
+    assert time.monotonic() - start < 5, "not kept until a timeout"
+    senders = silent()
+    assert len(senders) == 1, "the discovery request alone"
+    assert senders[0][0] == DEVICE and senders[0][1] != DEVICE_PORT, "from an ephemeral port"
