@@ -3,12 +3,18 @@ a real JVM) and, for comparison, snmpsim serving the same data. Every process is
 fixture; all traffic stays on 127.0.0.0/8."""
 
 import ipaddress
+import json
 import os
+import queue
+import re
 import shutil
 import signal
 import subprocess
 import tempfile
+import textwrap
+import threading
 import time
+import urllib.request
 from pathlib import Path
 
 import pytest
@@ -21,6 +27,14 @@ PROFILE = ROOT / "profiles" / "router.snmprec"
 BASE_PORT = 30000 + (os.getpid() % 2000) * 10
 
 
+def launcher(*args):
+    """The command line that runs the launcher from the build folder with `args`."""
+    jars = [j for j in sorted(BUILD.glob("host/tessel-host*.jar")) if "tests" not in j.name]
+    assert jars, f"host jar not found under {BUILD}/host"
+    return [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}", f"-Dtessel.profiles.dir={ROOT / 'profiles'}",
+            "-cp", str(jars[0]), "com.kestrelon.simulator.tessel.Launcher", *args]
+
+
 class Network:
     """A Tessel network started with the launcher's options, `extra` appended to them (such as
     ("--snmpv3", path)); devices at address + i. The launcher finds the default SNMPv3
@@ -29,12 +43,8 @@ class Network:
     def __init__(self, data, devices, address, port, extra=()):
         self.address, self.port, self.devices = address, port, devices
         self.workdir = tempfile.mkdtemp(prefix="tessel-it-")
-        jars = [j for j in sorted(BUILD.glob("host/tessel-host*.jar")) if "tests" not in j.name]
-        assert jars, f"host jar not found under {BUILD}/host"
-        command = [str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
-                   f"-Dtessel.profiles.dir={ROOT / 'profiles'}", "-cp", str(jars[0]),
-                   "com.kestrelon.simulator.tessel.Launcher", "--snmp-data", str(data), "--devices", str(devices),
-                   "--address", address, "--snmp-port", str(port), "--admin", "off", *extra]
+        command = launcher("--snmp-data", str(data), "--devices", str(devices), "--address", address,
+                           "--snmp-port", str(port), "--admin", "off", *extra)
         self.process = subprocess.Popen(command, cwd=self.workdir, stdout=subprocess.PIPE, stderr=subprocess.PIPE,
                                         text=True)
         lines, deadline = [], time.monotonic() + 60
@@ -50,6 +60,65 @@ class Network:
         return f"{ipaddress.IPv4Address(self.address) + i}:{self.port}"
 
     def stop(self):
+        return stop(self.process, self.workdir)
+
+
+class FileNetwork:
+    """A network that a network file describes, started by the launcher with its control interface on
+    127.0.0.1:admin_port, which needs `token` when one is given. `groups` is the YAML text of the file's group
+    list; its log, state and token file stay in a folder of its own. Ready once the launcher's summary line is
+    on standard error."""
+
+    SUMMARY = re.compile(r"^\d+ devices running: ")
+
+    def __init__(self, groups, admin_port, token=None):
+        self.workdir = Path(tempfile.mkdtemp(prefix="tessel-net-"))
+        self.admin = f"http://127.0.0.1:{admin_port}"
+        path = self.workdir / "network.yaml"
+        path.write_text(f"log: {{level: 0, file: tessel.log}}\nstate-dir: {self.workdir / 'state'}\n"
+                        f"groups:\n{textwrap.indent(textwrap.dedent(groups).strip(), '  ')}\n")
+        self.token, self.token_file = token, self.workdir / "token"
+        access = ("--admin", f"127.0.0.1:{admin_port}")
+        if token:
+            self.token_file.write_text(f"{token}\n")
+            access += ("--admin-token-file", str(self.token_file))
+        self.output = open(self.workdir / "status.txt", "w")  # the engine's status lines
+        self.process = subprocess.Popen(launcher("--network", str(path), *access), cwd=self.workdir,
+                                        stdout=self.output, stderr=subprocess.PIPE, text=True)
+        self.errors = queue.Queue()
+        threading.Thread(target=self._read_errors, daemon=True).start()
+        self.summary = self._wait_for_summary(time.monotonic() + 60)
+
+    def _read_errors(self):
+        for line in self.process.stderr:
+            self.errors.put(line.rstrip("\n"))
+        self.errors.put(None)
+
+    def _wait_for_summary(self, deadline):
+        seen = []
+        while time.monotonic() < deadline:
+            try:
+                line = self.errors.get(timeout=max(0.1, deadline - time.monotonic()))
+            except queue.Empty:
+                break
+            if line is None:
+                break
+            seen.append(line)
+            if self.SUMMARY.match(line):
+                return line
+        self.stop()
+        raise AssertionError(f"network did not start: {seen}")
+
+    def api(self, path, method="GET"):
+        """The control interface's JSON answer to one request."""
+        request = urllib.request.Request(self.admin + path, method=method)
+        if self.token:
+            request.add_header("Authorization", f"Bearer {self.token}")
+        with urllib.request.urlopen(request, timeout=10) as answer:
+            return json.load(answer)
+
+    def stop(self):
+        self.output.close()
         return stop(self.process, self.workdir)
 
 

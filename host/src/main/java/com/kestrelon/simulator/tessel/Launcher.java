@@ -1,10 +1,14 @@
 package com.kestrelon.simulator.tessel;
 
 import com.kestrelon.simulator.tessel.LaunchOptions.UsageException;
+import com.kestrelon.simulator.tessel.control.AdminConfigException;
+import com.kestrelon.simulator.tessel.control.AdminServer;
 import com.kestrelon.simulator.tessel.control.AgentState;
 import com.kestrelon.simulator.tessel.control.DeviceTable;
+import com.kestrelon.simulator.tessel.control.NativeReports;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.network.Network;
+import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.NetworkFileException;
 import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
@@ -12,6 +16,8 @@ import com.kestrelon.simulator.tessel.snmp.SnmpNetwork;
 import com.kestrelon.simulator.tessel.snmp.SnmpV3ConfigException;
 import java.io.IOException;
 import java.io.PrintStream;
+import java.net.Inet6Address;
+import java.net.InetSocketAddress;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.Map;
@@ -57,6 +63,7 @@ public final class Launcher {
   private final Object lifecycle = new Object();
   private boolean stopRequested; // guarded by lifecycle
   private NetworkSimulator engine; // guarded by lifecycle: set once the engine is initialised
+  private AdminServer admin; // guarded by lifecycle: set once the control interface listens
   private volatile DeviceTable devices;
   private final Supplier<Optional<DescriptorBudget>> descriptorBudget;
   private final Function<PrintStream, NetworkSimulator> engines;
@@ -127,6 +134,13 @@ public final class Launcher {
       err.println(e.getMessage());
       return 2;
     }
+    Optional<Control> control;
+    try {
+      control = control(network, options);
+    } catch (UsageException | AdminConfigException e) {
+      err.println("tessel: " + e.getMessage());
+      return 2;
+    }
     SnmpNetwork snmp;
     try {
       snmp = SnmpNetwork.load(network);
@@ -137,7 +151,29 @@ public final class Launcher {
       err.println(e.getMessage());
       return 2;
     }
-    return serve(network, snmp, out, err);
+    return serve(network, snmp, control, out, err);
+  }
+
+  /** Where the control interface listens, and its token. */
+  private record Control(InetSocketAddress listen, Optional<String> token) {}
+
+  /** The control interface the network asks for, checked before anything starts; empty when off. */
+  private static Optional<Control> control(Network network, LaunchOptions options)
+      throws UsageException, AdminConfigException {
+    if (network.admin().isEmpty()) {
+      return Optional.empty();
+    }
+    Admin admin = network.admin().get();
+    InetSocketAddress listen = new InetSocketAddress(admin.host(), admin.port());
+    if (listen.isUnresolved()) {
+      throw new UsageException("the control interface's address " + admin.host() + " does not resolve");
+    }
+    Optional<String> token = Optional.empty();
+    if (options.adminTokenFile().isPresent()) {
+      token = AdminServer.readToken(options.adminTokenFile().get());
+    }
+    AdminServer.checkListen(listen, token);
+    return Optional.of(new Control(listen, token));
   }
   /**
    * Stops the network, or the start-up in progress; later calls do nothing. Any thread. The stop
@@ -146,12 +182,18 @@ public final class Launcher {
    */
   public void requestStop() {
     NetworkSimulator running;
+    AdminServer control;
     synchronized (lifecycle) {
       if (stopRequested) {
         return;
       }
       stopRequested = true;
       running = engine;
+      control = admin;
+    }
+    // The control interface goes first: nothing may start a device while the engine stops.
+    if (control != null) {
+      control.close();
     }
     if (running != null) {
       running.AdapterJniStopNetwork();
@@ -165,11 +207,16 @@ public final class Launcher {
     sun.misc.Signal.handle(new sun.misc.Signal("TERM"), handler);
   }
 
-  private int serve(Network network, SnmpNetwork snmp, PrintStream out, PrintStream err) {
+  private int serve(Network network, SnmpNetwork snmp, Optional<Control> control, PrintStream out,
+      PrintStream err) {
     // Status lines go to the output stream only: the launcher never reads them back.
     NetworkSimulator simulator = engines.apply(out);
     int status = start(simulator, network, snmp, err);
+    if (status == SERVING && control.isPresent()) {
+      status = listen(network, control.get(), err);
+    }
     if (status == SERVING) {
+      err.println(StartReport.summary(devices)); // last: once it shows, everything serves
       simulator.jniBaseLoop();
       return 0;
     }
@@ -226,7 +273,6 @@ public final class Launcher {
         return fail(err, "the engine's SNMP service did not start");
       }
     }
-    err.println(StartReport.summary(devices));
     return SERVING;
   }
 
@@ -262,6 +308,25 @@ public final class Launcher {
       return true;
     } finally {
       report.done();
+    }
+  }
+
+  /** Opens the control interface on the running network; returns SERVING or the exit status. */
+  private int listen(Network network, Control control, PrintStream err) {
+    synchronized (lifecycle) {
+      if (stopRequested) {
+        return 0;
+      }
+      try {
+        admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports());
+      } catch (IOException e) {
+        return fail(err, "the control interface cannot listen on " + control.listen() + ": " + e.getMessage());
+      }
+      InetSocketAddress address = admin.address();
+      String host = address.getAddress().getHostAddress();
+      host = address.getAddress() instanceof Inet6Address ? "[" + host + "]" : host;
+      err.println("control interface: http://" + host + ":" + address.getPort() + "/");
+      return SERVING;
     }
   }
 

@@ -3,6 +3,7 @@ package com.kestrelon.simulator.tessel;
 import static java.nio.charset.StandardCharsets.UTF_8;
 import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertFalse;
+import static org.junit.jupiter.api.Assertions.assertThrows;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 import static org.junit.jupiter.api.Assertions.fail;
 
@@ -14,6 +15,10 @@ import java.io.IOException;
 import java.io.PrintStream;
 import java.net.DatagramSocket;
 import java.net.InetSocketAddress;
+import java.net.URI;
+import java.net.http.HttpClient;
+import java.net.http.HttpRequest;
+import java.net.http.HttpResponse;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.List;
@@ -61,20 +66,12 @@ class LauncherTest {
     }
   }
 
-  private int started() {
-    return out().split("Snmp Agent Started").length - 1;
-  }
-
   private String out() {
     return out.toString(UTF_8);
   }
 
   private String err() {
     return err.toString(UTF_8);
-  }
-
-  private static boolean bindable(String address) {
-    return bindable(address, 0);
   }
 
   private static boolean bindable(String address, int port) {
@@ -107,6 +104,7 @@ class LauncherTest {
       "--address 127.0.1.256;      --address takes an IPv4 address such as 127.0.1.1, not '127.0.1.256'",
       "--read-community a,b;       --read-community takes a non-empty community without ','",
       "--admin 127.0.0.1;          --admin takes HOST:PORT",
+      "--admin 0.0.0.0:28160;      the control interface listens on 0.0.0.0, which is not a loopback address",
       "--network n.yaml --devices=2; --network cannot be mixed with --devices",
       "--address 255.255.255.254 --devices 3; 3 devices from 255.255.255.254 run past 255.255.255.255"})
   void usageErrorsExitWithStatusTwo(String args, String message) throws Exception {
@@ -119,7 +117,6 @@ class LauncherTest {
   void helpGoesToStandardOutput() throws Exception {
     assertEquals(0, runToEnd("--devices", "5", "--help"));
     assertEquals(LaunchOptions.usage(), out());
-    assertTrue(out().contains("--network=FILE"), out());
     assertEquals("", err());
   }
 
@@ -145,7 +142,7 @@ class LauncherTest {
   @Test
   void noDeviceStartedExitsWithStatusOne() throws Exception {
     String nowhere = "203.0.113.1"; // a documentation address, on no interface of a test machine
-    assertFalse(bindable(nowhere), "this machine has " + nowhere);
+    assertFalse(bindable(nowhere, 0), "this machine has " + nowhere);
     assertEquals(1, runToEnd("--address", nowhere, "--devices", "1", "--snmp-port", "28161", "--admin", "off"));
     assertTrue(out().contains("Unable to start SNMP Agent at Port : 28161 and at IpAddress : " + nowhere), out());
     assertTrue(out().contains("Network resources cleared Successfully"));
@@ -183,7 +180,7 @@ class LauncherTest {
     }
     assertFalse(network.isAlive());
     assertEquals(0, status.get());
-    assertEquals(fit, started(), out());
+    assertEquals(fit, out().split("Snmp Agent Started").length - 1, out());
     assertTrue(out().contains("Snmp Agent Started at port : 28162 and at IPAddress : 127.0.4.1\n"));
     assertTrue(out().endsWith("Network resources cleared Successfully\n"));
     assertEquals(budget.shortfall(fit + 2) + "\n" + fit + " devices running: router " + fit + "/" + (fit + 2)
@@ -204,10 +201,14 @@ class LauncherTest {
         "  - {name: hosts, count: 1, address: 127.0.3.9, snmp: {port: 28165, data: " + hosts + "}}", ""));
     Launcher launcher = new Launcher();
     AtomicInteger status = new AtomicInteger(-1);
-    Thread running = startNetwork(launcher, status, "--network", network.toString());
+    Thread running = startNetwork(launcher, status, "--network", network.toString(), "--admin", "127.0.0.1:0");
+    String api;
     try {
       awaitServing(running);
-      assertEquals("3 devices running: routers 2/2, hosts 1/1", err().strip());
+      String[] lines = err().strip().split("\n");
+      assertEquals("3 devices running: routers 2/2, hosts 1/1", lines[1]);
+      api = lines[0].replaceFirst("^control interface: ", "") + "api/";
+      assertTrue(fetch(api + "network").contains("\"devices\":3,\"running\":3"), fetch(api + "network"));
       assertTrue(Files.isDirectory(dir.resolve("logs")), "the log's folder is made, relative to the file");
       DeviceTable devices = launcher.devices();
       assertEquals("R2 routers {snmp=RUNNING}", describe(devices.find("127.0.3.2").orElseThrow()));
@@ -233,6 +234,12 @@ class LauncherTest {
       running.join(5000);
     }
     assertEquals(0, status.get());
+    assertThrows(IOException.class, () -> fetch(api + "network"), "the control interface stops with the network");
+  }
+
+  private static String fetch(String url) throws IOException, InterruptedException {
+    return HttpClient.newHttpClient().send(HttpRequest.newBuilder(URI.create(url)).build(),
+        HttpResponse.BodyHandlers.ofString()).body();
   }
 
   private static String describe(Device device) {

@@ -1,6 +1,7 @@
 package com.kestrelon.simulator.tessel.control;
 
 import com.kestrelon.simulator.tessel.data.ValueText;
+import com.kestrelon.simulator.tessel.network.Network;
 import java.nio.ByteBuffer;
 import java.util.ArrayList;
 import java.util.Arrays;
@@ -164,7 +165,7 @@ public final class DeviceTable {
       return List.copyOf(entry.states.keySet());
     }
     if (!entry.states.containsKey(protocol.get())) {
-      throw new IllegalArgumentException("device " + dotted(entry.address) + " has no " + protocol.get()
+      throw new IllegalArgumentException("device " + Network.dotted(entry.address) + " has no " + protocol.get()
           + " agent (it has " + String.join(", ", entry.states.keySet()) + ")");
     }
     return List.of(protocol.get());
@@ -182,7 +183,7 @@ public final class DeviceTable {
   }
 
   private static Device snapshot(Entry entry) {
-    return new Device(dotted(entry.address), entry.address, entry.agentId, entry.name, entry.group, entry.states);
+    return new Device(Network.dotted(entry.address), entry.address, entry.agentId, entry.name, entry.group, entry.states);
   }
 
   private static EnumMap<AgentState, Integer> zeroCounts() {
@@ -191,9 +192,5 @@ public final class DeviceTable {
       counts.put(state, 0);
     }
     return counts;
-  }
-
-  private static String dotted(long address) {
-    return ValueText.ipText(ByteBuffer.allocate(4).putInt((int) address).array());
   }
 }

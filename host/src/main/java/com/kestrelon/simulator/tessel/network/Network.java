@@ -35,13 +35,16 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
   public record Admin(String host, int port) {
     private static final Pattern LISTEN = Pattern.compile("(?:\\[([^\\]]+)\\]|([^:\\[\\]]+)):([0-9]{1,5})");
 
-    /** {@code HOST:PORT} or {@code [IPv6]:PORT}; empty for {@code off}; null when it is neither. */
+    /**
+     * {@code HOST:PORT} or {@code [IPv6]:PORT} (port 0: one the system picks); empty for
+     * {@code off}; null when it is neither.
+     */
     public static Optional<Admin> parse(String text) {
       if (text.equals("off")) {
         return Optional.empty();
       }
       Matcher address = LISTEN.matcher(text);
-      if (!address.matches() || Integer.parseInt(address.group(3)) < 1 || Integer.parseInt(address.group(3)) > 65535) {
+      if (!address.matches() || Integer.parseInt(address.group(3)) > 65535) {
         return null;
       }
       return Optional.of(new Admin(address.group(1) != null ? address.group(1) : address.group(2),

@@ -1,0 +1,450 @@
+package com.kestrelon.simulator.tessel.control;
+
+import com.google.gson.Gson;
+import com.google.gson.GsonBuilder;
+import com.google.gson.stream.JsonReader;
+import com.google.gson.stream.JsonToken;
+import com.kestrelon.simulator.tessel.network.Network;
+import com.sun.net.httpserver.HttpExchange;
+import com.sun.net.httpserver.HttpServer;
+import java.io.IOException;
+import java.io.InputStream;
+import java.io.OutputStream;
+import java.io.StringReader;
+import java.net.InetSocketAddress;
+import java.net.URLDecoder;
+import java.nio.ByteBuffer;
+import java.nio.charset.CharacterCodingException;
+import java.nio.charset.StandardCharsets;
+import java.nio.file.Path;
+import java.util.ArrayList;
+import java.util.HashSet;
+import java.util.LinkedHashMap;
+import java.util.List;
+import java.util.Map;
+import java.util.Objects;
+import java.util.Optional;
+import java.util.Set;
+import java.util.concurrent.ExecutorService;
+import java.util.concurrent.Executors;
+import java.util.concurrent.atomic.AtomicInteger;
+import java.util.regex.Matcher;
+import java.util.regex.Pattern;
+
+/**
+ * The control interface: the network's devices, their agents' states and the engine's statistics
+ * over HTTP and JSON, the same in the Prometheus text format, and the dashboard page. Every answer
+ * to a bad request is a JSON {@code {"error": reason}}; nothing a client sends stops the server.
+ */
+public final class AdminServer implements AutoCloseable {
+  /** The largest request body read; a longer one is refused without reading the rest. */
+  static final int MAX_BODY = 1 << 20;
+  static final int DEFAULT_LIMIT = 100;
+  static final int MAX_LIMIT = 1000;
+  private static final String JSON = "application/json; charset=utf-8";
+  private static final Set<String> DEVICE_QUERY = Set.of("group", "state", "offset", "limit");
+  private static final Gson GSON = new GsonBuilder().disableHtmlEscaping().create();
+
+  private final HttpServer server;
+  private final ExecutorService executor;
+  private final Network network;
+  private final DeviceTable devices;
+  private final EngineReports reports;
+  private final AdminAccess access;
+  private final Optional<byte[]> dashboard;
+  private final RequestRate rate = new RequestRate();
+  private final List<Route> routes = List.of(
+      new Route("/", "GET", (exchange, path) -> dashboard()),
+      new Route("/api/network", "GET", (exchange, path) -> json(200, networkJson())),
+      new Route("/api/devices", "GET", (exchange, path) -> deviceList(exchange)),
+      new Route("/api/devices/([^/]+)", "GET", (exchange, path) -> device(path.group(1))),
+      new Route("/api/devices/([^/]+)/(stop|start|restart)", "POST",
+          (exchange, path) -> change(exchange, path.group(1), path.group(2))),
+      new Route("/api/stats", "GET", (exchange, path) -> json(200, statsJson())),
+      new Route("/metrics", "GET", (exchange, path) -> metrics()));
+
+  /** An answer: its status, content type, body and extra headers. */
+  private record Response(int status, String contentType, byte[] body, Map<String, String> headers) {}
+
+  /** A request refused with a status and a reason. */
+  private static final class Refusal extends Exception {
+    private static final long serialVersionUID = 1L;
+    final transient Response response;
+
+    Refusal(int status, String reason) {
+      this(status, reason, Map.of());
+    }
+
+    Refusal(int status, String reason, Map<String, String> headers) {
+      super(reason, null, false, false);
+      Map<String, Object> body = new LinkedHashMap<>();
+      body.put("error", reason);
+      response = new Response(status, JSON, GSON.toJson(body).getBytes(StandardCharsets.UTF_8), headers);
+    }
+  }
+
+  @FunctionalInterface
+  private interface Handler {
+    Response handle(HttpExchange exchange, Matcher path) throws Refusal, IOException;
+  }
+
+  private record Route(Pattern path, String method, Handler handler) {
+    Route(String path, String method, Handler handler) {
+      this(Pattern.compile(path), method, handler);
+    }
+  }
+
+  private AdminServer(HttpServer server, ExecutorService executor, Network network, DeviceTable devices,
+      EngineReports reports, AdminAccess access, Optional<byte[]> dashboard) {
+    this.server = server;
+    this.executor = executor;
+    this.network = network;
+    this.devices = devices;
+    this.reports = reports;
+    this.access = access;
+    this.dashboard = dashboard;
+  }
+
+  /**
+   * Listens on {@code listen} and serves until closed. With a token, every request but the
+   * dashboard page itself needs it.
+   */
+  public static AdminServer start(InetSocketAddress listen, Optional<String> token, Network network,
+      DeviceTable devices, EngineReports reports) throws IOException {
+    HttpServer server = HttpServer.create(listen, 0);
+    // Two request threads: one slow client does not hold the others.
+    AtomicInteger threads = new AtomicInteger();
+    ExecutorService executor = Executors.newFixedThreadPool(2, runnable -> {
+      Thread thread = new Thread(runnable, "tessel-admin-" + threads.incrementAndGet());
+      thread.setDaemon(true);
+      return thread;
+    });
+    AdminServer admin = new AdminServer(server, executor, network, devices, reports,
+        new AdminAccess(listen.getAddress(), token), readDashboard());
+    server.setExecutor(executor);
+    server.createContext("/", admin::serve);
+    server.start();
+    return admin;
+  }
+
+  /** The token an admin token file holds, surrounding whitespace removed; at least 16 characters. */
+  public static Optional<String> readToken(Path file) throws AdminConfigException {
+    return Optional.of(AdminAccess.readToken(file));
+  }
+
+  /** Refuses a listening address other than loopback when there is no token. */
+  public static void checkListen(InetSocketAddress listen, Optional<String> token) throws AdminConfigException {
+    AdminAccess.checkListen(listen.getAddress(), token);
+  }
+
+  /** The address and port the server listens on (the port chosen when it was 0). */
+  public InetSocketAddress address() {
+    return server.getAddress();
+  }
+
+  @Override
+  public void close() {
+    server.stop(0);
+    executor.shutdownNow();
+  }
+
+  private void serve(HttpExchange exchange) {
+    try (exchange) {
+      Response response;
+      try {
+        response = route(exchange);
+      } catch (Refusal refusal) {
+        response = refusal.response;
+      } catch (RuntimeException e) {
+        System.err.println("control interface: " + exchange.getRequestMethod() + " "
+            + exchange.getRequestURI().getRawPath() + " failed: " + e);
+        response = new Refusal(500, "internal error: " + e.getClass().getSimpleName()).response;
+      }
+      send(exchange, response);
+    } catch (IOException e) {
+      // The client went away; its connection is closed and nothing else is affected.
+    }
+  }
+
+  private Response route(HttpExchange exchange) throws Refusal, IOException {
+    String host = exchange.getRequestHeaders().getFirst("Host");
+    if (!access.hostAllowed(host, exchange.getLocalAddress().getAddress())) {
+      throw new Refusal(403, "the Host header must name this server: localhost or an IP address");
+    }
+    String method = exchange.getRequestMethod();
+    // An opaque request target (such as mailto:x) has no path; it matches no route.
+    String path = Objects.requireNonNullElse(exchange.getRequestURI().getRawPath(), "");
+    boolean page = path.equals("/") && method.equals("GET");
+    if (!page && !access.authorized(exchange.getRequestHeaders().getFirst("Authorization"))) {
+      throw new Refusal(401, "this request needs the header Authorization: Bearer TOKEN",
+          Map.of("WWW-Authenticate", "Bearer"));
+    }
+    for (Route route : routes) {
+      Matcher matcher = route.path.matcher(path);
+      if (matcher.matches()) {
+        if (!route.method.equals(method)) {
+          throw new Refusal(405, path + " takes " + route.method + ", not " + method,
+              Map.of("Allow", route.method));
+        }
+        return route.handler.handle(exchange, matcher);
+      }
+    }
+    throw new Refusal(404, "no such path: " + path);
+  }
+
+  private Response dashboard() throws Refusal {
+    byte[] page = dashboard.orElseThrow(() -> new Refusal(404, "this build has no dashboard page"));
+    return new Response(200, "text/html; charset=utf-8", page, Map.of());
+  }
+
+  private Map<String, Object> networkJson() {
+    List<Map<String, Object>> groups = new ArrayList<>();
+    for (Network.Group group : network.groups()) {
+      Map<String, Object> protocols = new LinkedHashMap<>();
+      group.snmp().ifPresent(snmp -> protocols.put("snmp", Map.of("port", snmp.port())));
+      Map<String, Object> json = new LinkedHashMap<>();
+      json.put("name", group.name());
+      json.put("count", group.count());
+      json.put("first", group.address(0));
+      json.put("last", group.address(group.count() - 1));
+      json.put("protocols", protocols);
+      groups.add(json);
+    }
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("groups", groups);
+    json.put("devices", devices.size());
+    json.put("running", devices.running());
+    return json;
+  }
+
+  private Response deviceList(HttpExchange exchange) throws Refusal {
+    Map<String, String> query = query(exchange.getRequestURI().getRawQuery());
+    String group = query.get("group");
+    AgentState state = null;
+    if (query.containsKey("state")) {
+      state = AgentState.ofText(query.get("state"));
+      if (state == null) {
+        throw new Refusal(400, "state is running, stopped or failed, not '" + query.get("state") + "'");
+      }
+    }
+    int offset = number(query, "offset", 0, 0, Integer.MAX_VALUE);
+    int limit = number(query, "limit", DEFAULT_LIMIT, 1, MAX_LIMIT);
+    DeviceTable.Page page = devices.query(group, state, offset, limit);
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("total", page.total());
+    json.put("devices", page.devices().stream().map(AdminServer::deviceJson).toList());
+    return json(200, json);
+  }
+
+  /** The query's parameters; an empty value counts as absent. */
+  private static Map<String, String> query(String raw) throws Refusal {
+    Map<String, String> parameters = new LinkedHashMap<>();
+    if (raw == null || raw.isEmpty()) {
+      return parameters;
+    }
+    Set<String> seen = new HashSet<>();
+    for (String pair : raw.split("&")) {
+      int equals = pair.indexOf('=');
+      String name = decode(equals < 0 ? pair : pair.substring(0, equals));
+      String value = equals < 0 ? "" : decode(pair.substring(equals + 1));
+      if (!DEVICE_QUERY.contains(name)) {
+        throw new Refusal(400, "unknown query parameter '" + name + "'; known: group, state, offset, limit");
+      }
+      if (!seen.add(name)) {
+        throw new Refusal(400, "query parameter '" + name + "' given twice");
+      }
+      if (!value.isEmpty()) {
+        parameters.put(name, value);
+      }
+    }
+    return parameters;
+  }
+
+  private static String decode(String text) throws Refusal {
+    try {
+      return URLDecoder.decode(text, StandardCharsets.UTF_8);
+    } catch (IllegalArgumentException e) {
+      throw new Refusal(400, "malformed query: " + e.getMessage());
+    }
+  }
+
+  private static int number(Map<String, String> query, String name, int absent, int min, int max) throws Refusal {
+    String text = query.get(name);
+    if (text == null) {
+      return absent;
+    }
+    long value = text.matches("[0-9]{1,10}") ? Long.parseLong(text) : -1;
+    if (value >= min && value <= max) {
+      return (int) value;
+    }
+    throw new Refusal(400, name + " takes a whole number from " + min + " to " + max + ", not '" + text + "'");
+  }
+
+  private Response device(String address) throws Refusal {
+    Device device = devices.find(address).orElseThrow(() -> noDevice(address));
+    return json(200, deviceJson(device));
+  }
+
+  private Response change(HttpExchange exchange, String address, String action) throws Refusal, IOException {
+    String headerHost = exchange.getRequestHeaders().getFirst("Host");
+    if (!AdminAccess.originAllowed(exchange.getRequestHeaders().getFirst("Origin"), headerHost)) {
+      throw new Refusal(403, "a page from another origin may not change devices");
+    }
+    Optional<String> protocol = protocol(exchange);
+    Optional<DeviceTable.Change> change;
+    try {
+      change = switch (action) {
+        case "stop" -> devices.stop(address, protocol);
+        case "start" -> devices.start(address, protocol);
+        default -> devices.restart(address, protocol);
+      };
+    } catch (IllegalArgumentException e) {
+      throw new Refusal(400, e.getMessage());
+    }
+    DeviceTable.Change done = change.orElseThrow(() -> noDevice(address));
+    if (done.failure().isPresent()) {
+      Map<String, Object> json = new LinkedHashMap<>();
+      json.put("error", done.failure().get());
+      json.put("device", deviceJson(done.device()));
+      return json(409, json);
+    }
+    return json(200, deviceJson(done.device()));
+  }
+
+  /**
+   * The protocol a state-changing request names: no body, or a JSON object with at most a
+   * "protocol" string. A body needs the JSON content type, so that a plain form post from another
+   * site cannot change anything.
+   */
+  private static Optional<String> protocol(HttpExchange exchange) throws Refusal, IOException {
+    String type = exchange.getRequestHeaders().getFirst("Content-Type");
+    if (type != null && !type.split(";", 2)[0].strip().equalsIgnoreCase("application/json")) {
+      throw new Refusal(415, "a request body must be application/json, not " + type);
+    }
+    byte[] body = body(exchange);
+    if (body.length == 0) {
+      return Optional.empty();
+    }
+    if (type == null) {
+      throw new Refusal(415, "a request body needs Content-Type: application/json");
+    }
+    return protocolField(body);
+  }
+
+  private static byte[] body(HttpExchange exchange) throws Refusal, IOException {
+    // A declared length over the limit is refused before any of the body is read.
+    String length = exchange.getRequestHeaders().getFirst("Content-Length");
+    if (length != null && length.strip().matches("[0-9]+")
+        && (length.strip().length() > 9 || Long.parseLong(length.strip()) > MAX_BODY)) {
+      throw new Refusal(413, "a request body may have at most " + MAX_BODY + " bytes");
+    }
+    try (InputStream in = exchange.getRequestBody()) {
+      byte[] body = in.readNBytes(MAX_BODY + 1);
+      if (body.length > MAX_BODY) {
+        throw new Refusal(413, "a request body may have at most " + MAX_BODY + " bytes");
+      }
+      return body;
+    }
+  }
+
+  private static Optional<String> protocolField(byte[] body) throws Refusal {
+    try (JsonReader reader = new JsonReader(new StringReader(utf8(body)))) {
+      reader.setLenient(false);
+      reader.beginObject();
+      Optional<String> protocol = Optional.empty();
+      while (reader.hasNext()) {
+        String name = reader.nextName();
+        if (!name.equals("protocol") || protocol.isPresent()) {
+          throw new Refusal(400, "unknown or repeated field '" + name + "'; the body may hold \"protocol\"");
+        }
+        if (reader.peek() != JsonToken.STRING) {
+          throw new Refusal(400, "protocol takes a string such as \"snmp\"");
+        }
+        protocol = Optional.of(reader.nextString());
+      }
+      reader.endObject();
+      if (reader.peek() != JsonToken.END_DOCUMENT) {
+        throw new Refusal(400, "malformed JSON: more after the object");
+      }
+      return protocol;
+    } catch (IOException | IllegalStateException e) {
+      throw new Refusal(400, "malformed JSON: " + e.getMessage());
+    }
+  }
+
+  private static String utf8(byte[] body) throws Refusal {
+    try {
+      return StandardCharsets.UTF_8.newDecoder().decode(ByteBuffer.wrap(body)).toString();
+    } catch (CharacterCodingException e) {
+      throw new Refusal(400, "malformed JSON: the body is not UTF-8");
+    }
+  }
+
+  private Map<String, Object> statsJson() {
+    long[] counters = reports.counters();
+    Map<String, Object> named = new LinkedHashMap<>();
+    for (int i = 0; i < EngineReports.COUNTER_NAMES.size(); i++) {
+      named.put(EngineReports.COUNTER_NAMES.get(i), counters[i]);
+    }
+    Map<String, Object> snmp = new LinkedHashMap<>();
+    snmp.put("counters", named);
+    snmp.put("requestsPerSecond", Math.round(rate.sample(counters[0]) * 1000) / 1000.0);
+    List<Map<String, Object>> errors = new ArrayList<>();
+    for (EngineReports.RequestError error : reports.errors()) {
+      Map<String, Object> json = new LinkedHashMap<>();
+      json.put("manager", error.manager());
+      json.put("requestId", error.requestId());
+      json.put("version", error.version());
+      json.put("pdu", error.pdu());
+      json.put("errorStatus", error.errorStatus());
+      errors.add(json);
+    }
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("snmp", snmp);
+    json.put("errors", errors);
+    return json;
+  }
+
+  private Response metrics() {
+    long[] counters = reports.counters();
+    String text = MetricsText.render(counters, rate.sample(counters[0]), devices.counts());
+    return new Response(200, MetricsText.CONTENT_TYPE, text.getBytes(StandardCharsets.UTF_8), Map.of());
+  }
+
+  private static Map<String, Object> deviceJson(Device device) {
+    Map<String, String> protocols = new LinkedHashMap<>();
+    device.protocols().forEach((protocol, state) -> protocols.put(protocol, state.text()));
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("address", device.address());
+    json.put("name", device.name());
+    json.put("group", device.group());
+    json.put("protocols", protocols);
+    return json;
+  }
+
+  private static Refusal noDevice(String address) {
+    return new Refusal(404, "no device at " + address);
+  }
+
+  private static Response json(int status, Object body) {
+    return new Response(status, JSON, GSON.toJson(body).getBytes(StandardCharsets.UTF_8), Map.of());
+  }
+
+  private static void send(HttpExchange exchange, Response response) throws IOException {
+    var headers = exchange.getResponseHeaders();
+    headers.set("Content-Type", response.contentType());
+    headers.set("Cache-Control", "no-store");
+    headers.set("X-Content-Type-Options", "nosniff");
+    response.headers().forEach(headers::set);
+    exchange.sendResponseHeaders(response.status(), response.body().length == 0 ? -1 : response.body().length);
+    try (OutputStream out = exchange.getResponseBody()) {
+      out.write(response.body());
+    }
+  }
+
+  private static Optional<byte[]> readDashboard() throws IOException {
+    try (InputStream page = AdminServer.class.getResourceAsStream("dashboard.html")) {
+      return page == null ? Optional.empty() : Optional.of(page.readAllBytes());
+    }
+  }
+}

@@ -1,0 +1,66 @@
+package com.kestrelon.simulator.tessel.control;
+
+import java.util.EnumMap;
+import java.util.List;
+import java.util.Locale;
+import java.util.Map;
+
+/** The network's state in the Prometheus text exposition format, version 0.0.4. */
+final class MetricsText {
+  static final String CONTENT_TYPE = "text/plain; version=0.0.4; charset=utf-8";
+
+  /** The metric name of each engine counter, in {@link EngineReports#COUNTER_NAMES} order. */
+  static final List<String> COUNTER_METRICS =
+      EngineReports.COUNTER_NAMES.stream().map(MetricsText::counterMetric).toList();
+
+  private MetricsText() {}
+
+  static String render(long[] counters, double requestsPerSecond,
+      Map<String, Map<String, EnumMap<AgentState, Integer>>> devices) {
+    StringBuilder text = new StringBuilder();
+    for (int i = 0; i < COUNTER_METRICS.size(); i++) {
+      String metric = COUNTER_METRICS.get(i);
+      text.append("# HELP ").append(metric).append(" The engine's ")
+          .append(EngineReports.COUNTER_NAMES.get(i)).append(" counter.\n");
+      text.append("# TYPE ").append(metric).append(" counter\n");
+      text.append(metric).append(' ').append(counters[i]).append('\n');
+    }
+    text.append("# HELP tessel_snmp_requests_per_second SNMP messages received per second over the last 10 s.\n");
+    text.append("# TYPE tessel_snmp_requests_per_second gauge\n");
+    text.append("tessel_snmp_requests_per_second ").append(String.format(Locale.ROOT, "%.3f", requestsPerSecond))
+        .append('\n');
+    text.append("# HELP tessel_devices Devices per group and protocol whose agent is in the state.\n");
+    text.append("# TYPE tessel_devices gauge\n");
+    devices.forEach((group, protocols) -> protocols.forEach((protocol, states) -> states.forEach(
+        (state, count) -> text.append("tessel_devices{group=\"").append(labelValue(group))
+            .append("\",protocol=\"").append(labelValue(protocol))
+            .append("\",state=\"").append(state.text()).append("\"} ").append(count).append('\n'))));
+    return text.toString();
+  }
+
+  /**
+   * snmpInPkts becomes tessel_snmp_in_pkts_total: the counter's own "snmp" prefix is dropped (the
+   * metric carries it already) and each capitalised word, or run of capitals such as ASN, becomes
+   * a lower-case word.
+   */
+  static String counterMetric(String counter) {
+    String name = counter.startsWith("snmp") ? counter.substring("snmp".length()) : counter;
+    StringBuilder snake = new StringBuilder();
+    for (int i = 0; i < name.length(); i++) {
+      char c = name.charAt(i);
+      boolean wordStart = Character.isUpperCase(c) && i > 0
+          && (!Character.isUpperCase(name.charAt(i - 1))
+              || (i + 1 < name.length() && Character.isLowerCase(name.charAt(i + 1))));
+      if (wordStart) {
+        snake.append('_');
+      }
+      snake.append(Character.toLowerCase(c));
+    }
+    return "tessel_snmp_" + snake + "_total";
+  }
+
+  /** A label value with backslash, double quote and line feed escaped. */
+  static String labelValue(String value) {
+    return value.replace("\\", "\\\\").replace("\"", "\\\"").replace("\n", "\\n");
+  }
+}

@@ -1,0 +1,345 @@
+package com.kestrelon.simulator.tessel.control;
+
+import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertThrows;
+import static org.junit.jupiter.api.Assertions.assertTrue;
+
+import com.google.gson.JsonObject;
+import com.google.gson.JsonParser;
+import com.kestrelon.simulator.tessel.network.Network;
+import com.kestrelon.simulator.tessel.network.Network.Group;
+import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import java.io.ByteArrayInputStream;
+import java.io.IOException;
+import java.io.InputStream;
+import java.net.InetSocketAddress;
+import java.net.Socket;
+import java.net.URI;
+import java.net.http.HttpClient;
+import java.net.http.HttpRequest;
+import java.net.http.HttpRequest.BodyPublishers;
+import java.net.http.HttpResponse;
+import java.net.http.HttpResponse.BodyHandlers;
+import java.nio.charset.StandardCharsets;
+import java.nio.file.Files;
+import java.nio.file.Path;
+import java.time.Duration;
+import java.util.ArrayList;
+import java.util.Collections;
+import java.util.List;
+import java.util.Map;
+import java.util.Optional;
+import java.util.concurrent.TimeUnit;
+import java.util.concurrent.atomic.AtomicLong;
+import org.junit.jupiter.api.AfterEach;
+import org.junit.jupiter.api.BeforeEach;
+import org.junit.jupiter.api.Test;
+import org.junit.jupiter.api.io.TempDir;
+import org.junit.jupiter.params.ParameterizedTest;
+import org.junit.jupiter.params.provider.CsvSource;
+
+/**
+ * The control interface over real HTTP on loopback: a network of two groups (routers 127.0.1.1-3,
+ * a second group 127.0.2.1-2 whose second device cannot open its agent) with fake agents and
+ * engine reports.
+ */
+class AdminServerTest {
+  private static final String TOKEN = "correct-horse-battery";
+  private static final String REFUSING = "127.0.2.2";
+  private static final String OPTICAL = "optical \"B\"";
+
+  private final List<String> agentCalls = Collections.synchronizedList(new ArrayList<>());
+  private final FakeReports reports = new FakeReports();
+  private final HttpClient client = HttpClient.newBuilder().connectTimeout(Duration.ofSeconds(5)).build();
+  private AdminServer server;
+
+  @TempDir
+  Path dir;
+
+  private static final class FakeReports implements EngineReports {
+    final long[] counters = new long[COUNTER_NAMES.size()];
+    volatile boolean broken;
+
+    @Override
+    public long[] counters() {
+      return broken ? null : counters.clone();
+    }
+
+    @Override
+    public List<RequestError> errors() {
+      return List.of(new RequestError("127.0.0.9", 77, "v2c", "get", 2));
+    }
+  }
+
+  private record Answer(int status, String body, HttpResponse<String> response) {
+    JsonObject json() {
+      return JsonParser.parseString(body).getAsJsonObject();
+    }
+
+    String header(String name) {
+      return response.headers().firstValue(name).orElse("");
+    }
+  }
+
+  @BeforeEach
+  void start() throws IOException {
+    server = start(Optional.empty());
+  }
+
+  @AfterEach
+  void stop() {
+    server.close();
+  }
+
+  private AdminServer start(Optional<String> token) throws IOException {
+    Snmp snmp = new Snmp(1161, dir.resolve("d.snmprec"), Optional.empty(), "public", "private");
+    Group routers = new Group("routers", 3, 0x7F000101L, "R{n}", Optional.of(snmp));
+    Group optical = new Group(OPTICAL, 2, 0x7F000201L, "O{n}", Optional.of(snmp));
+    Network network = new Network(new Network.Log(0, dir.resolve("log")), Optional.empty(), dir,
+        List.of(routers, optical));
+    DeviceTable.Builder table = new DeviceTable.Builder();
+    for (Group group : network.groups()) {
+      for (int i = 0; i < group.count(); i++) {
+        AgentState state = group.address(i).equals(REFUSING) ? AgentState.FAILED : AgentState.RUNNING;
+        table.add(group.firstAddress() + i, i, group.deviceName(i), group.name(), Map.of("snmp", state));
+      }
+    }
+    ProtocolAgents agents = new ProtocolAgents() {
+      @Override
+      public Optional<String> start(Device device) {
+        agentCalls.add("start " + device.address());
+        return device.address().equals(REFUSING) ? Optional.of("address in use") : Optional.empty();
+      }
+
+      @Override
+      public void stop(Device device) {
+        agentCalls.add("stop " + device.address());
+      }
+    };
+    return AdminServer.start(new InetSocketAddress("127.0.0.1", 0), token, network,
+        table.build(Map.of("snmp", agents)), reports);
+  }
+
+  private Answer send(String method, String path, String contentType, String body, String... headers)
+      throws IOException, InterruptedException {
+    HttpRequest.Builder request = HttpRequest.newBuilder(URI.create(
+        "http://127.0.0.1:" + server.address().getPort() + path)).timeout(Duration.ofSeconds(10));
+    request.method(method, body == null ? BodyPublishers.noBody() : BodyPublishers.ofString(body));
+    if (contentType != null) {
+      request.header("Content-Type", contentType);
+    }
+    if (headers.length > 0) {
+      request.headers(headers);
+    }
+    HttpResponse<String> response = client.send(request.build(), BodyHandlers.ofString());
+    return new Answer(response.statusCode(), response.body(), response);
+  }
+
+  private Answer get(String path, String... headers) throws IOException, InterruptedException {
+    return send("GET", path, null, null, headers);
+  }
+
+  /** The status line of a request written by hand, for headers the HTTP client will not send. */
+  private String raw(String request) throws IOException {
+    try (Socket socket = new Socket("127.0.0.1", server.address().getPort())) {
+      socket.setSoTimeout(5000);
+      socket.getOutputStream().write(request.getBytes(StandardCharsets.ISO_8859_1));
+      InputStream in = socket.getInputStream();
+      StringBuilder line = new StringBuilder();
+      for (int c = in.read(); c != -1 && c != '\r'; c = in.read()) {
+        line.append((char) c);
+      }
+      return line.toString();
+    }
+  }
+
+  @Test
+  void networkAndDeviceQueries() throws Exception {
+    JsonObject network = get("/api/network").json();
+    JsonObject routers = network.getAsJsonArray("groups").get(0).getAsJsonObject();
+    assertEquals("127.0.1.1", routers.get("first").getAsString());
+    assertEquals("127.0.1.3", routers.get("last").getAsString());
+    assertEquals(1161, routers.getAsJsonObject("protocols").getAsJsonObject("snmp").get("port").getAsInt());
+    assertEquals(5, network.get("devices").getAsInt());
+    assertEquals(4, network.get("running").getAsInt());
+
+    JsonObject page = get("/api/devices?group=routers&offset=1&limit=1").json();
+    assertEquals(3, page.get("total").getAsInt());
+    assertEquals(1, page.getAsJsonArray("devices").size());
+    JsonObject second = page.getAsJsonArray("devices").get(0).getAsJsonObject();
+    assertEquals("127.0.1.2", second.get("address").getAsString());
+    assertEquals("R2", second.get("name").getAsString());
+
+    JsonObject failed = get("/api/devices?state=failed&group=").json();
+    assertEquals(1, failed.get("total").getAsInt());
+    assertEquals(REFUSING, failed.getAsJsonArray("devices").get(0).getAsJsonObject().get("address").getAsString());
+    assertEquals(5, get("/api/devices").json().getAsJsonArray("devices").size());
+    JsonObject device = get("/api/devices/127.0.1.3").json();
+    assertEquals("R3", device.get("name").getAsString());
+    assertEquals("running", device.getAsJsonObject("protocols").get("snmp").getAsString());
+  }
+
+  @ParameterizedTest(name = "{0} {1} {2} {3} -> {4}")
+  @CsvSource(delimiter = '|', nullValues = "-", textBlock = """
+      GET    | /api/devices?limit=1001           | -                | -                         | 400 | -
+      GET    | /api/devices?limit=ten            | -                | -                         | 400 | -
+      GET    | /api/devices?state=sleeping       | -                | -                         | 400 | -
+      GET    | /api/devices?colour=red           | -                | -                         | 400 | -
+      GET    | /api/devices?limit=5&limit=6      | -                | -                         | 400 | -
+      GET    | /api/devices/10.0.0.1             | -                | -                         | 404 | -
+      GET    | /nothing                          | -                | -                         | 404 | -
+      DELETE | /api/network                      | -                | -                         | 405 | GET
+      GET    | /api/devices/127.0.1.1/stop       | -                | -                         | 405 | POST
+      POST   | /api/devices/127.0.1.1/stop       | application/json | '{"protocol": "tl1"}'     | 400 | -
+      POST   | /api/devices/127.0.1.1/stop       | application/json | '{"protocl": "snmp"}'     | 400 | -
+      POST   | /api/devices/127.0.1.1/stop       | application/json | '{"protocol": snmp}'      | 400 | -
+      POST   | /api/devices/127.0.1.1/stop       | application/json | '{} {}'                   | 400 | -
+      POST   | /api/devices/127.0.1.1/stop       | text/plain       | ''                        | 415 | -
+      POST   | /api/devices/127.0.1.1/stop       | -                | '{"protocol": "snmp"}'    | 415 | -
+      POST   | /api/devices/10.0.0.1/stop        | -                | -                         | 404 | -
+      """)
+  void refusalsAnswerJsonAndChangeNothing(String method, String path, String type, String body, int status,
+      String allow) throws Exception {
+    Answer answer = send(method, path, type, body);
+    assertEquals(status, answer.status(), answer.body());
+    assertTrue(answer.header("Content-Type").startsWith("application/json"));
+    assertTrue(answer.json().get("error").getAsString().length() > 5, answer.body());
+    if (allow != null) {
+      assertEquals(allow, answer.header("Allow"));
+    }
+    assertEquals(List.of(), agentCalls);
+  }
+
+  @Test
+  void stopStartAndRestartChangeTheAgents() throws Exception {
+    String stop = "/api/devices/127.0.1.1/stop";
+    Answer stopped = send("POST", stop, null, null);
+    assertEquals(200, stopped.status());
+    assertEquals("stopped", stopped.json().getAsJsonObject("protocols").get("snmp").getAsString());
+    assertEquals(200, send("POST", stop, null, null).status());
+    assertEquals(List.of("stop 127.0.1.1"), agentCalls);
+    assertEquals(1, get("/api/devices?state=stopped").json().get("total").getAsInt());
+
+    Answer started = send("POST", "/api/devices/127.0.1.1/start", "application/json", "{\"protocol\": \"snmp\"}");
+    assertEquals("running", started.json().getAsJsonObject("protocols").get("snmp").getAsString());
+    assertEquals(200, send("POST", "/api/devices/127.0.1.1/restart", "application/json; charset=utf-8", "{}").status());
+    assertEquals(List.of("stop 127.0.1.1", "start 127.0.1.1", "stop 127.0.1.1", "start 127.0.1.1"), agentCalls);
+
+    Answer refused = send("POST", "/api/devices/" + REFUSING + "/start", null, null);
+    assertEquals(409, refused.status());
+    assertTrue(refused.json().get("error").getAsString().contains("address in use"), refused.body());
+    assertEquals("failed", refused.json().getAsJsonObject("device").getAsJsonObject("protocols")
+        .get("snmp").getAsString());
+
+    // A page of another site cannot post here, even without a body.
+    assertEquals(403, send("POST", stop, null, null, "Origin", "http://evil.example").status());
+    assertEquals(5, agentCalls.size());
+  }
+
+  @Test
+  void oversizedBodiesAreRefusedUnread() throws Exception {
+    HttpRequest chunked = HttpRequest.newBuilder(URI.create(
+        "http://127.0.0.1:" + server.address().getPort() + "/api/devices/127.0.1.1/stop"))
+        .header("Content-Type", "application/json")
+        .POST(BodyPublishers.ofInputStream(() -> new ByteArrayInputStream(new byte[AdminServer.MAX_BODY + 1])))
+        .build();
+    assertEquals(413, client.send(chunked, BodyHandlers.ofString()).statusCode());
+    // A declared length over the limit is answered at once, with none of the body sent.
+    assertEquals("HTTP/1.1 413 Request Entity Too Large", raw("POST /api/devices/127.0.1.1/stop HTTP/1.1\r\n"
+        + "Host: localhost\r\nContent-Type: application/json\r\nContent-Length: 5000000000\r\n\r\n"));
+    assertEquals(List.of(), agentCalls);
+  }
+
+  @Test
+  void statsAndMetricsShowTheEngineAndTheDevices() throws Exception {
+    reports.counters[0] = 12;
+    reports.counters[22] = 4_294_967_295L;
+    JsonObject stats = get("/api/stats").json();
+    JsonObject counters = stats.getAsJsonObject("snmp").getAsJsonObject("counters");
+    assertEquals(28, counters.entrySet().size());
+    assertEquals(12, counters.get("snmpInPkts").getAsLong());
+    assertEquals(4_294_967_295L, counters.get("snmpInASNParseErrs").getAsLong());
+    JsonObject error = stats.getAsJsonArray("errors").get(0).getAsJsonObject();
+    assertEquals("127.0.0.9", error.get("manager").getAsString());
+    assertEquals("get", error.get("pdu").getAsString());
+
+    Answer metrics = get("/metrics");
+    assertEquals("text/plain; version=0.0.4; charset=utf-8", metrics.header("Content-Type"));
+    String text = metrics.body();
+    assertTrue(text.contains("# TYPE tessel_snmp_in_pkts_total counter\ntessel_snmp_in_pkts_total 12\n"), text);
+    assertTrue(text.contains("\ntessel_snmp_in_asn_parse_errs_total 4294967295\n"), text);
+    assertTrue(text.contains("\ntessel_snmp_v2c_get_bulks_total 0\n"), text);
+    assertEquals(28, text.lines().filter(line -> line.matches("# TYPE tessel_snmp_\\w+_total counter")).distinct()
+        .count());
+    assertTrue(text.contains("\ntessel_devices{group=\"optical \\\"B\\\"\",protocol=\"snmp\",state=\"failed\"} 1\n"),
+        text);
+    assertTrue(text.contains("\ntessel_devices{group=\"routers\",protocol=\"snmp\",state=\"failed\"} 0\n"), text);
+
+    // An unexpected fault answers 500, and the server goes on.
+    reports.broken = true;
+    assertEquals(500, get("/metrics").status());
+    reports.broken = false;
+    assertEquals(200, get("/api/stats").status());
+  }
+
+  @Test
+  void theRequestRateSpansTheLastTenSecondsAcrossACounterWrap() {
+    AtomicLong now = new AtomicLong(TimeUnit.HOURS.toNanos(5));
+    RequestRate rate = new RequestRate(now::get);
+    assertEquals(0.0, rate.sample(4_294_967_290L));
+    now.addAndGet(TimeUnit.SECONDS.toNanos(5));
+    assertEquals(16 / 5.0, rate.sample(10), 1e-9, "16 requests, the counter wrapping through zero");
+    now.addAndGet(TimeUnit.SECONDS.toNanos(15));
+    assertEquals(0.0, rate.sample(10), 1e-9, "nothing arrived since the newest sample 10 s old");
+    now.addAndGet(TimeUnit.SECONDS.toNanos(2));
+    assertEquals(6 / 17.0, rate.sample(16), 1e-9);
+  }
+
+  @ParameterizedTest(name = "Host: {0} -> {1}")
+  @CsvSource(delimiter = '|', textBlock = """
+      localhost              | 200
+      LocalHost:9000         | 200
+      127.9.9.9:80           | 200
+      [::1]:8161             | 200
+      evil.example           | 403
+      127.0.0.1.evil.example | 403
+      [::1                   | 403
+      localhost:http         | 403
+      """)
+  void theHostHeaderMustNameThisServer(String host, int status) throws IOException {
+    String line = raw("GET /api/network HTTP/1.1\r\nHost: " + host + "\r\nConnection: close\r\n\r\n");
+    assertTrue(line.startsWith("HTTP/1.1 " + status + " "), line);
+  }
+
+  @Test
+  void aTokenGuardsEveryRequestButThePage() throws Exception {
+    server.close();
+    server = start(Optional.of(TOKEN));
+    Answer without = get("/api/network");
+    assertEquals(401, without.status());
+    assertEquals("Bearer", without.header("WWW-Authenticate"));
+    assertEquals(401, get("/api/network", "Authorization", "Bearer " + TOKEN + "x").status());
+    assertEquals(200, get("/api/network", "Authorization", "Bearer " + TOKEN).status());
+    assertEquals(401, send("POST", "/api/devices/127.0.1.1/stop", null, null).status());
+    assertEquals(List.of(), agentCalls);
+
+    Answer page = get("/");
+    assertEquals(200, page.status());
+    assertEquals("text/html; charset=utf-8", page.header("Content-Type"));
+  }
+
+  @Test
+  void tokensAndListeningAddressesAreChecked() throws Exception {
+    Path file = dir.resolve("token");
+    Files.writeString(file, "  " + TOKEN + "\n");
+    assertEquals(Optional.of(TOKEN), AdminServer.readToken(file));
+    Files.writeString(file, "short-secret\n");
+    assertTrue(assertThrows(AdminConfigException.class, () -> AdminServer.readToken(file)).getMessage()
+        .contains("at least 16"));
+    AdminServer.checkListen(new InetSocketAddress("127.3.0.1", 8161), Optional.empty());
+    AdminServer.checkListen(new InetSocketAddress("0.0.0.0", 8161), Optional.of(TOKEN));
+    AdminConfigException open = assertThrows(AdminConfigException.class,
+        () -> AdminServer.checkListen(new InetSocketAddress("0.0.0.0", 8161), Optional.empty()));
+    assertTrue(open.getMessage().contains("--admin-token-file"), open.getMessage());
+  }
+}

@@ -1,0 +1,167 @@
+package com.kestrelon.simulator.tessel.ctl;
+
+import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertTrue;
+
+import com.google.gson.JsonArray;
+import com.google.gson.JsonObject;
+import com.google.gson.JsonParser;
+import com.sun.net.httpserver.HttpExchange;
+import com.sun.net.httpserver.HttpServer;
+import java.io.ByteArrayOutputStream;
+import java.io.IOException;
+import java.io.PrintStream;
+import java.net.InetSocketAddress;
+import java.net.ServerSocket;
+import java.net.URI;
+import java.nio.charset.StandardCharsets;
+import java.nio.file.Files;
+import java.nio.file.Path;
+import java.util.List;
+import java.util.Map;
+import java.util.concurrent.CopyOnWriteArrayList;
+import java.util.stream.Collectors;
+import java.util.stream.Stream;
+import org.junit.jupiter.api.AfterEach;
+import org.junit.jupiter.api.BeforeEach;
+import org.junit.jupiter.api.Test;
+import org.junit.jupiter.api.io.TempDir;
+
+/** The client against a small stand-in of the control interface on loopback. */
+class CtlTest {
+  private static final int DEVICES = 2500;
+  private static final String TOKEN = "s3cret-token-0123456789";
+
+  private HttpServer server;
+  private String url;
+  private final List<String> requests = new CopyOnWriteArrayList<>(); // "METHOD URI BEARER BODY"
+  private String out;
+  private String err;
+
+  @BeforeEach
+  void startStandIn() throws IOException {
+    server = HttpServer.create(new InetSocketAddress("127.0.0.1", 0), 0);
+    server.createContext("/", this::answer);
+    server.start();
+    url = "http://127.0.0.1:" + server.getAddress().getPort();
+  }
+
+  @AfterEach
+  void stopStandIn() {
+    server.stop(0);
+  }
+
+  /** Devices 10.0.0.0 + i; the token is needed for stop only; 10.9.9.9 does not exist. */
+  private void answer(HttpExchange exchange) throws IOException {
+    String body = new String(exchange.getRequestBody().readAllBytes(), StandardCharsets.UTF_8);
+    String bearer = String.valueOf(exchange.getRequestHeaders().getFirst("Authorization"));
+    URI uri = exchange.getRequestURI();
+    requests.add(exchange.getRequestMethod() + " " + uri + " " + bearer + " " + body);
+    if (uri.getPath().equals("/api/devices")) {
+      Map<String, String> query = Stream.of(uri.getQuery().split("&")).map(p -> p.split("=", 2))
+          .collect(Collectors.toMap(p -> p[0], p -> p[1]));
+      int offset = Integer.parseInt(query.get("offset"));
+      int limit = Integer.parseInt(query.get("limit"));
+      if (limit > 1000) {
+        reply(exchange, 400, "{\"error\": \"limit above 1000\"}");
+        return;
+      }
+      JsonArray page = new JsonArray();
+      for (int i = offset; i < Math.min(DEVICES, offset + limit); i++) {
+        page.add(JsonParser.parseString(device("10.0." + (i / 256) + "." + (i % 256), "running")));
+      }
+      JsonObject answer = new JsonObject();
+      answer.addProperty("total", DEVICES);
+      answer.add("devices", page);
+      reply(exchange, 200, answer.toString());
+    } else if (uri.getPath().equals("/api/devices/10.0.0.5/stop")) {
+      boolean allowed = bearer.equals("Bearer " + TOKEN);
+      reply(exchange, allowed ? 200 : 401,
+          allowed ? device("10.0.0.5", "stopped") : "{\"error\": \"a valid token is needed\"}");
+    } else if (uri.getPath().equals("/api/stats")) {
+      reply(exchange, 200, "{\"snmp\": {\"counters\": {\"snmpInPkts\": 12, \"snmpInBadVersions\": 0},"
+          + " \"requestsPerSecond\": 3.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
+    } else {
+      reply(exchange, 404, "{\"error\": \"no device at 10.9.9.9\"}");
+    }
+  }
+
+  private static String device(String address, String state) {
+    return "{\"address\": \"" + address + "\", \"name\": \"R-" + address
+        + "\", \"group\": \"routers\", \"protocols\": {\"snmp\": \"" + state + "\"}}";
+  }
+
+  private static void reply(HttpExchange exchange, int status, String json) throws IOException {
+    byte[] bytes = json.getBytes(StandardCharsets.UTF_8);
+    exchange.getResponseHeaders().set("Content-Type", "application/json");
+    exchange.sendResponseHeaders(status, bytes.length);
+    exchange.getResponseBody().write(bytes);
+    exchange.close();
+  }
+
+  private int ctl(String... args) {
+    ByteArrayOutputStream stdout = new ByteArrayOutputStream();
+    ByteArrayOutputStream stderr = new ByteArrayOutputStream();
+    int status = Ctl.run(args, new PrintStream(stdout, true, StandardCharsets.UTF_8),
+        new PrintStream(stderr, true, StandardCharsets.UTF_8));
+    out = stdout.toString(StandardCharsets.UTF_8);
+    err = stderr.toString(StandardCharsets.UTF_8);
+    return status;
+  }
+
+  @Test
+  void devicesReadsEveryPageWithOptionsBeforeOrAfterTheCommand() {
+    assertEquals(0, ctl("--json", "devices", "--admin", url));
+    JsonObject all = JsonParser.parseString(out).getAsJsonObject();
+    assertEquals(DEVICES, all.get("total").getAsInt());
+    assertEquals(DEVICES, all.getAsJsonArray("devices").size());
+    assertEquals("10.0.9.195", all.getAsJsonArray("devices").get(DEVICES - 1).getAsJsonObject().get("address").getAsString());
+    assertEquals(3, requests.size(), "three pages of at most 1000");
+
+    assertEquals(0, ctl("--admin", url, "devices", "--group", "routers"));
+    List<String> lines = out.lines().toList();
+    assertEquals(DEVICES + 1, lines.size());
+    assertTrue(lines.get(0).matches("ADDRESS +NAME +GROUP +SNMP"), lines.get(0));
+    assertTrue(lines.get(1).matches("10\\.0\\.0\\.0 +R-10\\.0\\.0\\.0 +routers +running"), lines.get(1));
+    assertTrue(requests.get(3).contains("group=routers"), requests.get(3));
+  }
+
+  @Test
+  void actionsSendTheTokenAndReportTheNetworksErrors(@TempDir Path directory) throws IOException {
+    Path tokenFile = Files.writeString(directory.resolve("token"), "  " + TOKEN + "\n");
+    assertEquals(0, ctl("stop", "10.0.0.5", "--protocol", "snmp", "--json", "--token-file", tokenFile.toString(),
+        "--admin", url));
+    assertEquals("stopped", JsonParser.parseString(out).getAsJsonObject().getAsJsonObject("protocols")
+        .get("snmp").getAsString());
+    assertEquals("POST /api/devices/10.0.0.5/stop Bearer " + TOKEN + " {\"protocol\":\"snmp\"}", requests.get(0));
+
+    assertEquals(1, ctl("--admin", url, "stop", "10.0.0.5"));
+    assertTrue(err.contains("a valid token is needed"), err);
+    assertEquals(1, ctl("--admin", url, "device", "10.9.9.9"));
+    assertTrue(err.contains("no device at 10.9.9.9"), err);
+  }
+
+  @Test
+  void statsShowsNonZeroCountersRateAndErrors() {
+    assertEquals(0, ctl("stats", "--admin", url));
+    assertTrue(out.contains("snmp requests per second: 3.5"), out);
+    assertTrue(out.lines().anyMatch(line -> line.matches("snmpInPkts +12")), out);
+    assertTrue(!out.contains("snmpInBadVersions"), out);
+    assertTrue(out.lines().anyMatch(line -> line.matches("127\\.0\\.0\\.9 +2")), out);
+  }
+
+  @Test
+  void usageErrorsAndAnAbsentNetworkHaveTheirOwnStatus() throws IOException {
+    assertEquals(2, ctl("--admin", url));
+    assertEquals(2, ctl("--admin", url, "frobnicate"));
+    assertEquals(2, ctl("--admin", url, "stop"));
+    assertEquals(2, ctl("--admin", "ftp://x", "stats"));
+    assertTrue(requests.isEmpty(), "a usage error sends nothing");
+    int closedPort;
+    try (ServerSocket socket = new ServerSocket(0, 1, java.net.InetAddress.getLoopbackAddress())) {
+      closedPort = socket.getLocalPort();
+    }
+    assertEquals(3, ctl("stats", "--admin", "127.0.0.1:" + closedPort));
+    assertTrue(err.contains("http://127.0.0.1:" + closedPort), err);
+  }
+}
