@@ -50,9 +50,14 @@ std::uint32_t InformList::NextInformId() {
   return lastInformId_;
 }
 
+std::uint32_t InformList::ReserveInformId() {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return NextInformId();
+}
+
 InformList::Added InformList::Add(PendingInform inform, std::uint64_t now) {
   std::unique_lock<std::mutex> lock(mutex_);
-  inform.informId = NextInformId();
+  if (inform.informId == 0) inform.informId = NextInformId();
   inform.retriesLeft = inform.target.retries;
   inform.sends = 1;
   inform.deadline = DeadlineAfter(now, inform.target.timeout);

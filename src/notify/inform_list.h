@@ -83,8 +83,10 @@ class InformList {
   InformList(const InformList&) = delete;
   InformList& operator=(const InformList&) = delete;
 
-  // Gives the inform its ID, sends it and keeps it until now + timeout. An inform whose first
-  // send fails is reported dropped at once and not kept.
+  // An inform ID for an inform that is added later (one without an ID gets its own in Add).
+  std::uint32_t ReserveInformId();
+  // Sends the inform and keeps it until now + timeout. An inform whose first send fails is
+  // reported dropped at once and not kept.
   struct Added {
     std::uint32_t informId = 0;
     bool sent = false;

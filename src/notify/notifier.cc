@@ -109,8 +109,10 @@ NotifyOutcome QueueV3Inform(const SnmpPdu& pdu, const NotificationTarget& target
   job.device = {device.transport.localAddress, ConfiguredPort(device.transport)};
   job.ipv6 = device.transport.isIPv6 != 0;
   job.user = std::move(*user);
+  job.informId = Informs().ReserveInformId();
+  std::uint32_t informId = job.informId;
   V3Informs().Queue(std::move(job));
-  return {NotifyResult::kSent};
+  return {NotifyResult::kSent, informId};
 }
 
 // A message of another engine that reaches a device: the Response to one of its SNMPv3 informs

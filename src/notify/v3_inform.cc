@@ -174,6 +174,7 @@ void V3InformSender::Run() {
 
 void V3InformSender::Process(const V3InformJob& job) {
   PendingInform inform;
+  inform.informId = job.informId;
   inform.requestId = job.pdu.requestId;
   inform.device = job.device;
   inform.target = job.target;

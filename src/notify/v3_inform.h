@@ -24,7 +24,8 @@
 namespace tessel {
 
 struct V3InformJob {
-  SnmpPdu pdu;  // the InformRequest, request-id given
+  std::uint32_t informId = 0;  // reserved in the inform list
+  SnmpPdu pdu;                 // the InformRequest, request-id given
   NotificationTarget target;
   DeviceEndpoint device;
   bool ipv6 = false;

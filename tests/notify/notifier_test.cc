@@ -230,7 +230,9 @@ TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
   ManagerSocket silent;
   NotificationRequest unanswered = request;
   unanswered.managerPort = silent.Port();
-  ASSERT_EQ(SendNotification(unanswered).result, NotifyResult::kSent);
+  NotifyOutcome dropped = SendNotification(unanswered);
+  ASSERT_EQ(dropped.result, NotifyResult::kSent);
+  EXPECT_NE(dropped.informId, 0u);
   auto start = std::chrono::steady_clock::now();
   ASSERT_EQ(SendNotification(request).result, NotifyResult::kSent);
 
@@ -264,6 +266,7 @@ TEST_F(NotifierTest, V3InformIsAcknowledgedOnlyByAnAuthenticResponse) {
   EXPECT_FALSE(manager_.Receive(100)) << "the device answers nothing to the manager";
   ASSERT_TRUE(WaitFor([&] { return !host_.DroppedInforms().empty(); }));
   EXPECT_EQ(host_.DroppedInforms()[0].managerPort, silent.Port());
+  EXPECT_EQ(host_.DroppedInforms()[0].informId, dropped.informId);
   EXPECT_TRUE(silent.Receive(0)) << "its discovery request";
   EXPECT_FALSE(silent.Receive(0)) << "and nothing after it";
 }
