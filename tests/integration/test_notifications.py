@@ -175,7 +175,7 @@ def network():
         - name: notifiers
           count: 1
           address: {NETWORK_DEVICE}
-          snmp: {{port: {NETWORK_PORT}, data: {PROFILE}}}
+          snmp: {{port: {NETWORK_PORT}, data: {PROFILE}, v3: {ROOT / "profiles" / "snmpv3.conf"}}}
         """, ADMIN_PORT)
     yield net
     assert net.stop() == 0
@@ -194,8 +194,14 @@ def test_ctl_trap_and_inform_arrive_from_the_device_with_the_trap_oid_and_bindin
                "1.3.6.1.2.1.2.2.1.1.2", "i", "-2") == (0, "sent\n", "")
     assert ctl(network, "inform", NETWORK_DEVICE, "--to", to, "--wait", "1.3.6.1.4.1.99.0.4",
                "1.3.6.1.2.1.1.5.0", "s", "core 7") == (0, "acknowledged\n", "")
-    trap, inform = trapd(before + 2)[before:]
-    for row in (trap, inform):
+    assert ctl(network, "inform", NETWORK_DEVICE, "--to", to, "--version", "v3", "--user", "shaaes", "--wait",
+               "1.3.6.1.4.1.99.0.6") == (0, "acknowledged\n", "")
+    assert ctl(network, "trap", NETWORK_DEVICE, "--to", to, "--version", "v1", "--enterprise", "1.3.6.1.4.1.99",
+               "--generic", "6", "--specific", "7") == (0, "sent\n", "")
+    trap, inform, v3_inform, v1_trap = trapd(before + 4)[before:]
+    assert v3_inform[5].startswith("INFORM, SNMP v3, user shaaes")
+    assert v1_trap[1:6] == [NETWORK_DEVICE, ".1.3.6.1.4.1.99", "6", ".7", "TRAP, SNMP v1, community public"]
+    for row in (trap, inform, v3_inform, v1_trap):
         assert source(row) == f"{NETWORK_DEVICE}:{NETWORK_PORT}"
     assert trap[5] == "TRAP2, SNMP v2c, community public"
     assert trap[6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.6.3.1.1.5.3",
@@ -208,7 +214,7 @@ def test_ctl_trap_and_inform_arrive_from_the_device_with_the_trap_oid_and_bindin
                            "1.3.6.1.2.1.1.5.0", "q", "x")
     assert status == 1 and "unknown type 'q'" in error, error
     time.sleep(0.5)
-    assert len(trapd(0, wait=0)) == before + 2
+    assert len(trapd(0, wait=0)) == before + 4
 
 
 def test_ctl_inform_nobody_answers_ends_dropped_after_each_send(network, silent):
