@@ -95,28 +95,35 @@ public record Notification(boolean inform, Version version, String managerHost, 
     }
     String kind = text(json, "kind", null);
     require(kind.equals("trap") || kind.equals("inform"), "kind is trap or inform, not '" + kind + "'");
-    Version version = version(text(json, "version", "v2c"));
     boolean inform = kind.equals("inform");
-    require(!(inform && version == Version.V1), "SNMPv1 has no inform; send it as v2c or v3");
+    Version version = version(text(json, "version", "v2c"));
+    requireFieldsOfForm(json, version, inform);
     String[] manager = manager(text(json, "manager", null));
+    boolean v1 = version == Version.V1;
     boolean v3 = version == Version.V3;
-    require(v3 || !json.has("user") && !json.has("context"), "user and context are for v3; " + version.text + " takes a community");
-    require(!v3 || !json.has("community"), "v3 takes a user (and a context), not a community");
     String user = v3 ? text(json, "user", null) : "";
     require(!v3 || !user.isEmpty(), "user must not be empty");
+    return new Notification(inform, version, manager[0], Integer.parseInt(manager[1]),
+        v3 ? "" : text(json, "community", "public"), user, v3 ? text(json, "context", "") : "",
+        v1 ? "" : oid(text(json, "oid", null), "oid"),
+        v1 ? oid(text(json, "enterprise", null), "enterprise") : "",
+        v1 ? number(json, "generic", 6, 0, 6) : 0, v1 ? number(json, "specific", 0, 0, Integer.MAX_VALUE) : 0,
+        bindings(json.get("varbinds")),
+        number(json, "timeout", 5, 1, MAX_TIMEOUT), number(json, "retries", 0, 0, MAX_RETRIES));
+  }
+
+  /** Refuses the fields that belong to another version's form or to the other kind. */
+  private static void requireFieldsOfForm(JsonObject json, Version version, boolean inform) {
     boolean v1 = version == Version.V1;
+    boolean v3 = version == Version.V3;
+    require(!(inform && v1), "SNMPv1 has no inform; send it as v2c or v3");
+    require(v3 || !json.has("user") && !json.has("context"),
+        "user and context are for v3; " + version.text + " takes a community");
+    require(!v3 || !json.has("community"), "v3 takes a user (and a context), not a community");
     require(v1 || !json.has("enterprise") && !json.has("generic") && !json.has("specific"),
         "enterprise, generic and specific make an SNMPv1 trap; " + version.text + " takes an oid");
     require(!v1 || !json.has("oid"), "an SNMPv1 trap takes enterprise, generic and specific, not an oid");
-    String oid = v1 ? "" : oid(text(json, "oid", null), "oid");
-    String enterprise = v1 ? oid(text(json, "enterprise", null), "enterprise") : "";
-    int generic = v1 ? number(json, "generic", 6, 0, 6) : 0;
-    int specific = v1 ? number(json, "specific", 0, 0, Integer.MAX_VALUE) : 0;
     require(inform || !json.has("timeout") && !json.has("retries"), "timeout and retries are for informs");
-    return new Notification(inform, version, manager[0], Integer.parseInt(manager[1]),
-        v3 ? "" : text(json, "community", "public"), user, v3 ? text(json, "context", "") : "",
-        oid, enterprise, generic, specific, bindings(json.get("varbinds")),
-        number(json, "timeout", 5, 1, MAX_TIMEOUT), number(json, "retries", 0, 0, MAX_RETRIES));
   }
 
   private static Version version(String text) {
