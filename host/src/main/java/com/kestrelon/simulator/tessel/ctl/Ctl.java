@@ -42,7 +42,8 @@ import picocli.CommandLine.Spec;
  */
 @Command(name = "./tessel ctl",
     description = "Shows and drives a running network through its control interface.",
-    subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class, Ctl.Trap.class, Ctl.Inform.class})
+    subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class, Ctl.Trap.class, Ctl.Inform.class,
+        Ctl.Informs.class})
 public final class Ctl implements Runnable {
   static final int API_ERROR = 1;
   static final int UNREACHABLE = 3;
@@ -88,7 +89,7 @@ public final class Ctl implements Runnable {
   @Override
   public void run() {
     throw new ParameterException(spec.commandLine(),
-        "Missing command: devices, device, stop, start, restart, stats, trap or inform");
+        "Missing command: devices, device, stop, start, restart, stats, trap, inform or informs");
   }
 
   /**
@@ -453,6 +454,26 @@ public final class Ctl implements Runnable {
           throw new UnreachableException("interrupted while waiting for inform " + id);
         }
       }
+    }
+  }
+
+  @Command(name = "informs", description = "Lists the informs sent through the control interface, or one of them.")
+  static final class Informs extends ApiCommand {
+    @Parameters(arity = "0..1", paramLabel = "ID", description = "only the inform with this ID")
+    String id;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = client.get(id == null ? "/api/informs" : "/api/informs/" + AdminClient.encode(id));
+      if (json) {
+        printJson(out, answer);
+        return;
+      }
+      JsonArray informs = id == null ? answer.getAsJsonObject().getAsJsonArray("informs") : new JsonArray();
+      if (id != null) {
+        informs.add(answer);
+      }
+      printObjects(out, informs);
     }
   }
 

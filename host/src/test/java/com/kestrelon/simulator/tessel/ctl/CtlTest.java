@@ -85,6 +85,8 @@ class CtlTest {
     } else if (uri.getPath().equals("/api/informs/9")) {
       String state = informPolls.incrementAndGet() < 3 ? "pending" : "dropped";
       reply(exchange, 200, "{\"id\": 9, \"state\": \"" + state + "\", \"sends\": 1}");
+    } else if (uri.getPath().equals("/api/informs")) {
+      reply(exchange, 200, "{\"informs\": [{\"id\": 8, \"state\": \"acknowledged\", \"sends\": 2}]}");
     } else if (uri.getPath().equals("/api/stats")) {
       reply(exchange, 200, "{\"snmp\": {\"counters\": {\"snmpInPkts\": 12, \"snmpInBadVersions\": 0},"
           + " \"requestsPerSecond\": 3.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
@@ -170,6 +172,8 @@ class CtlTest {
     assertEquals(6, requests.size(), "polled until the inform was no longer pending");
     assertEquals(0, ctl("--admin", url, "inform", "10.0.0.5", "--to", "127.0.0.1:162", "1.3.6.1.4.1.99.0.1"));
     assertEquals("9\n", out);
+    assertEquals(0, ctl("--admin", url, "informs"));
+    assertEquals(List.of("ID  STATE         SENDS", "8   acknowledged  2"), out.lines().toList());
   }
 
   @Test
