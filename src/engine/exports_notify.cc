@@ -17,6 +17,12 @@ namespace {
 // The outcome when the request could not even be read (no memory, a failed conversion).
 constexpr std::int32_t kNotRead = -1;
 
+// The host numbers the outcomes as they are declared; a new one goes at the end.
+static_assert(static_cast<int>(NotifyResult::kSent) == 0 &&
+              static_cast<int>(NotifyResult::kUnresolved) == 3 &&
+              static_cast<int>(NotifyResult::kRefused) == 6 &&
+              static_cast<int>(NotifyResult::kNotSent) == 7);
+
 std::string Text(JNIEnv* env, jstring text) {
   return JniHost::Instance().ToCpp(env, text).value_or("");
 }

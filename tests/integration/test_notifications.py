@@ -213,6 +213,10 @@ def test_ctl_trap_and_inform_arrive_from_the_device_with_the_trap_oid_and_bindin
     status, _, error = ctl(network, "trap", NETWORK_DEVICE, "--to", to, "1.3.6.1.4.1.99.0.5",
                            "1.3.6.1.2.1.1.5.0", "q", "x")
     assert status == 1 and "unknown type 'q'" in error, error
+    # restricted's notify view leaves out the interfaces group.
+    status, _, error = ctl(network, "trap", NETWORK_DEVICE, "--to", to, "--version", "v3", "--user", "restricted",
+                           "1.3.6.1.4.1.99.0.8", "1.3.6.1.2.1.2.2.1.1.2", "i", "2")
+    assert status == 1 and "notify view" in error, error
     time.sleep(0.5)
     assert len(trapd(0, wait=0)) == before + 4
 
