@@ -38,8 +38,7 @@ using namespace tessel;
 extern "C" {
 
 // {result, informId}: result is the NotifyResult in its declaration order (0 is sent), or -1
-// when the request could not be read; informId is the inform's ID, 0 for a trap or an inform
-// whose ID is given only once its manager has been discovered.
+// when the request could not be read; informId is the inform's ID, 0 for a trap.
 JNIEXPORT jintArray JNICALL
 Java_com_kestrelon_simulator_tessel_snmp_SnmpTrapService_sendNotification(
     JNIEnv* env, jobject, jint pduType, jint version, jstring host, jint port, jstring community,

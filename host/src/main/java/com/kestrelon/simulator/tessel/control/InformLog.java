@@ -1,24 +1,20 @@
 package com.kestrelon.simulator.tessel.control;
 
 import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
-import java.net.InetAddress;
-import java.net.UnknownHostException;
 import java.util.ArrayList;
 import java.util.HashMap;
 import java.util.LinkedHashMap;
 import java.util.List;
+import java.util.Locale;
 import java.util.Map;
 import java.util.Optional;
 import java.util.function.LongSupplier;
-import java.util.function.Predicate;
 
 /**
  * The informs sent through the control interface, the latest {@link #KEPT} of them, each pending
- * until the engine reports it answered or dropped. The engine reports an inform by its own ID;
- * an SNMPv3 inform gets that ID only once its manager is discovered, so a report with an ID not
- * yet known goes to the oldest SNMPv3 inform still waiting for one from the same device (or
- * user) to the same manager. A report may also arrive before the send that caused it has
- * returned; it is kept until the inform is added. Thread-safe.
+ * until the engine reports it answered or dropped under the inform ID it gave when it took the
+ * inform. A report may arrive before the send that caused it has returned; it is kept until the
+ * inform is added. Thread-safe.
  */
 public final class InformLog implements SnmpHandler.InformListener {
   static final int KEPT = 1000;
@@ -29,7 +25,7 @@ public final class InformLog implements SnmpHandler.InformListener {
     PENDING, ACKNOWLEDGED, DROPPED;
 
     public String text() {
-      return name().toLowerCase(java.util.Locale.ROOT);
+      return name().toLowerCase(Locale.ROOT);
     }
   }
 
@@ -38,32 +34,23 @@ public final class InformLog implements SnmpHandler.InformListener {
 
   private static final class Inform {
     final int id;
+    final int engineId;
     final String device;
     final String manager;
-    final InetAddress managerAddress; // numeric, as the engine reports it; null when unknown
-    final int managerPort;
-    final String user;
     final long timeoutMillis;
     final int retries;
     final long started;
-    int engineId;
     State state = State.PENDING;
     long finished;
 
-    Inform(int id, Device device, Notification n, InetAddress managerAddress, long started) {
+    Inform(int id, int engineId, Device device, Notification n, long started) {
       this.id = id;
+      this.engineId = engineId;
       this.device = device.address();
       this.manager = n.manager();
-      this.managerAddress = managerAddress;
-      this.managerPort = n.managerPort();
-      this.user = n.user();
       this.timeoutMillis = n.timeout() * 1000L;
       this.retries = n.retries();
       this.started = started;
-    }
-
-    boolean sentTo(String address, int port) {
-      return managerAddress != null && port == managerPort && managerAddress.equals(numeric(address));
     }
   }
 
@@ -84,29 +71,19 @@ public final class InformLog implements SnmpHandler.InformListener {
     this(() -> System.nanoTime() / 1_000_000);
   }
 
-  /** Keeps an inform that the engine sent with engineId (0 when it gives one later); its ID here. */
-  public int add(Device device, Notification notification, int engineId) {
-    InetAddress managerAddress = numeric(notification.managerHost()); // may resolve: outside the lock
-    synchronized (this) {
-      return add(device, notification, managerAddress, engineId);
-    }
-  }
-
-  private int add(Device device, Notification notification, InetAddress managerAddress, int engineId) {
-    Inform inform = new Inform(++lastId, device, notification, managerAddress, clock.getAsLong());
+  /** Keeps an inform that the engine took as engineId; its ID here. */
+  public synchronized int add(Device device, Notification notification, int engineId) {
+    Inform inform = new Inform(++lastId, engineId, device, notification, clock.getAsLong());
     informs.put(inform.id, inform);
     if (informs.size() > KEPT) {
       Inform oldest = informs.values().iterator().next();
       informs.remove(oldest.id);
-      byEngineId.remove(oldest.engineId);
+      byEngineId.remove(oldest.engineId, oldest);
     }
-    if (engineId != 0) {
-      inform.engineId = engineId;
-      byEngineId.put(engineId, inform);
-      Report report = early.remove(engineId);
-      if (report != null) {
-        finish(inform, report);
-      }
+    byEngineId.put(engineId, inform);
+    Report report = early.remove(engineId);
+    if (report != null) {
+      finish(inform, report);
     }
     return inform.id;
   }
@@ -123,30 +100,20 @@ public final class InformLog implements SnmpHandler.InformListener {
   }
 
   @Override
-  public synchronized void answered(int informId, int requestId, String deviceAddress,
-      String managerAddress, int managerPort, int errorStatus, int errorIndex, String[] oids,
-      String[] types, String[] values) {
-    report(informId, new Report(State.ACKNOWLEDGED, clock.getAsLong()),
-        inform -> inform.device.equals(deviceAddress) && inform.sentTo(managerAddress, managerPort));
+  public void answered(int informId, int requestId, String deviceAddress, String managerAddress,
+      int managerPort, int errorStatus, int errorIndex, String[] oids, String[] types, String[] values) {
+    report(informId, State.ACKNOWLEDGED);
   }
 
   @Override
-  public synchronized void dropped(int informId, int version, String community, String userName,
-      String contextName, String managerAddress, int managerPort, String[] oids, String[] types,
-      String[] values) {
-    report(informId, new Report(State.DROPPED, clock.getAsLong()),
-        inform -> inform.user.equals(userName) && inform.sentTo(managerAddress, managerPort));
+  public void dropped(int informId, int version, String community, String userName, String contextName,
+      String managerAddress, int managerPort, String[] oids, String[] types, String[] values) {
+    report(informId, State.DROPPED);
   }
 
-  private void report(int engineId, Report report, Predicate<Inform> sameSend) {
+  private synchronized void report(int engineId, State state) {
+    Report report = new Report(state, clock.getAsLong());
     Inform inform = byEngineId.get(engineId);
-    if (inform == null) {
-      inform = awaitingEngineId(sameSend);
-      if (inform != null) {
-        inform.engineId = engineId;
-        byEngineId.put(engineId, inform);
-      }
-    }
     if (inform != null) {
       finish(inform, report);
       return;
@@ -155,15 +122,6 @@ public final class InformLog implements SnmpHandler.InformListener {
     if (early.size() > EARLY_KEPT) {
       early.remove(early.keySet().iterator().next());
     }
-  }
-
-  private Inform awaitingEngineId(Predicate<Inform> sameSend) {
-    for (Inform inform : informs.values()) {
-      if (inform.engineId == 0 && inform.state == State.PENDING && sameSend.test(inform)) {
-        return inform;
-      }
-    }
-    return null;
   }
 
   private static void finish(Inform inform, Report report) {
@@ -176,42 +134,13 @@ public final class InformLog implements SnmpHandler.InformListener {
   /**
    * The InformRequests sent so far, from the inform's timing: one at once and one more at each
    * timeout while retries are left. A dropped inform's last send was one timeout before the drop,
-   * so an inform dropped at once (its manager never discovered) sent none.
+   * so an inform dropped at once (an SNMPv3 manager that never answered discovery) sent none.
    */
   private Entry entry(Inform inform) {
-    long elapsed = (inform.state == State.PENDING ? clock.getAsLong() : inform.finished) - inform.started;
-    long timeouts = Math.max(0, elapsed) / Math.max(1, inform.timeoutMillis);
-    long sends = switch (inform.state) {
-      case DROPPED -> Math.round((double) Math.max(0, elapsed) / Math.max(1, inform.timeoutMillis));
-      default -> timeouts + 1;
-    };
+    long elapsed = Math.max(0, (inform.state == State.PENDING ? clock.getAsLong() : inform.finished) - inform.started);
+    long timeout = Math.max(1, inform.timeoutMillis);
+    long sends = inform.state == State.DROPPED ? Math.round((double) elapsed / timeout) : elapsed / timeout + 1;
     int capped = (int) Math.min(sends, 1L + inform.retries);
     return new Entry(inform.id, inform.state, capped, inform.device, inform.manager);
-  }
-
-  /** The numeric address of a host text that is already numeric; null for a name. */
-  private static InetAddress numeric(String host) {
-    if (!host.matches("[0-9.]+|[0-9a-fA-F:.]*:[0-9a-fA-F:.]*")) {
-      return resolved(host);
-    }
-    try {
-      return InetAddress.getByName(host);
-    } catch (UnknownHostException e) {
-      return null;
-    }
-  }
-
-  /** A name as the engine resolves it: to an IPv4 address. */
-  private static InetAddress resolved(String host) {
-    try {
-      for (InetAddress address : InetAddress.getAllByName(host)) {
-        if (address instanceof java.net.Inet4Address) {
-          return address;
-        }
-      }
-    } catch (UnknownHostException e) {
-      // No address to match a report by; the inform is matched by the engine's ID alone.
-    }
-    return null;
   }
 }

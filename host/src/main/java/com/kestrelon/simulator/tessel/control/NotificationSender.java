@@ -30,10 +30,7 @@ public interface NotificationSender {
     }
   }
 
-  /**
-   * @param engineInformId the engine's ID of a sent inform; 0 for a trap, and for an inform whose
-   *     ID the engine gives only once it has discovered the manager (SNMPv3)
-   */
+  /** @param engineInformId the engine's ID of a sent inform, as its reports name it; 0 for a trap */
   record Outcome(Result result, int engineInformId) {}
 
   Outcome send(Device device, Notification notification);

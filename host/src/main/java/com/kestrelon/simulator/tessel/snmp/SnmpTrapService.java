@@ -40,8 +40,8 @@ public class SnmpTrapService {
    * 3 SNMPv3); enterprise, genericTrap and specificTrap make the SNMPv1 form, trapOid the SNMPv2
    * one; an inform waits timeout seconds for its Response and is sent again retries times.
    * Returns {result, informId}: result 0 when sent, else the reason it was not (see
-   * {@code NotificationSender.Result}); informId names the inform in the handler's reports, 0
-   * for a trap and for an SNMPv3 inform, whose ID is given once its manager is discovered.
+   * {@code NotificationSender.Result}); informId names the inform in the handler's reports (an
+   * SNMPv3 inform's too, though it leaves only once its manager is discovered), 0 for a trap.
    */
   public native int[] sendNotification(int pduType, int version, String managerHost,
       int managerPort, String community, String userName, String contextName, String enterprise,
