@@ -1,6 +1,6 @@
 """Notifications from a device, driven through the engine's exports by a small Java entry point
-(NotifyProbe), received by net-snmp's snmptrapd started here on a loopback port with its own
-configuration."""
+(NotifyProbe) and through a running network's control interface with ./tessel ctl, received by
+net-snmp's snmptrapd started here on a loopback port with its own configuration."""
 
 import os
 import socket
@@ -11,12 +11,13 @@ from pathlib import Path
 
 import pytest
 
-from conftest import BASE_PORT, BUILD, JAVA, ROOT
+from conftest import BASE_PORT, BUILD, JAVA, PROFILE, ROOT, FileNetwork
 
 DEVICE = "127.0.3.60"
 DEVICE_PORT = BASE_PORT + 5
 TRAPD_PORT = BASE_PORT + 7
 SILENT_PORT = BASE_PORT + 8
+NETWORK_DEVICE, NETWORK_PORT, ADMIN_PORT = "127.0.3.70", BASE_PORT + 2, BASE_PORT + 9
 FIELDS = "%b|%a|%N|%w|%q|%P|%v\n"
 
 
@@ -165,3 +166,67 @@ def test_v3_inform_whose_manager_does_not_answer_discovery_is_dropped_at_once(si
     senders = silent()
     assert len(senders) == 1, "the discovery request alone"
     assert senders[0][0] == DEVICE and senders[0][1] != DEVICE_PORT, "from an ephemeral port"
+
+
+@pytest.fixture(scope="module")
+def network():
+    """One device with its control interface, for ./tessel ctl."""
+    net = FileNetwork(f"""
+        - name: notifiers
+          count: 1
+          address: {NETWORK_DEVICE}
+          snmp: {{port: {NETWORK_PORT}, data: {PROFILE}, v3: {ROOT / "profiles" / "snmpv3.conf"}}}
+        """, ADMIN_PORT)
+    yield net
+    assert net.stop() == 0
+
+
+def ctl(network, *args):
+    result = subprocess.run([str(ROOT / "tessel"), "ctl", "--admin", network.admin, *args],
+                            capture_output=True, text=True, timeout=120)
+    return result.returncode, result.stdout, result.stderr
+
+
+def test_ctl_trap_and_inform_arrive_from_the_device_with_the_trap_oid_and_binding(network, trapd):
+    before = len(trapd(0, wait=0))
+    to = f"127.0.0.1:{TRAPD_PORT}"
+    assert ctl(network, "trap", NETWORK_DEVICE, "--to", to, "1.3.6.1.6.3.1.1.5.3",
+               "1.3.6.1.2.1.2.2.1.1.2", "i", "-2") == (0, "sent\n", "")
+    assert ctl(network, "inform", NETWORK_DEVICE, "--to", to, "--wait", "1.3.6.1.4.1.99.0.4",
+               "1.3.6.1.2.1.1.5.0", "s", "core 7") == (0, "acknowledged\n", "")
+    assert ctl(network, "inform", NETWORK_DEVICE, "--to", to, "--version", "v3", "--user", "shaaes", "--wait",
+               "1.3.6.1.4.1.99.0.6") == (0, "acknowledged\n", "")
+    assert ctl(network, "trap", NETWORK_DEVICE, "--to", to, "--version", "v1", "--enterprise", "1.3.6.1.4.1.99",
+               "--generic", "6", "--specific", "7") == (0, "sent\n", "")
+    trap, inform, v3_inform, v1_trap = trapd(before + 4)[before:]
+    assert v3_inform[5].startswith("INFORM, SNMP v3, user shaaes")
+    assert v1_trap[1:6] == [NETWORK_DEVICE, ".1.3.6.1.4.1.99", "6", ".7", "TRAP, SNMP v1, community public"]
+    for row in (trap, inform, v3_inform, v1_trap):
+        assert source(row) == f"{NETWORK_DEVICE}:{NETWORK_PORT}"
+    assert trap[5] == "TRAP2, SNMP v2c, community public"
+    assert trap[6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.6.3.1.1.5.3",
+                                       ".1.3.6.1.2.1.2.2.1.1.2 = INTEGER: -2"]
+    assert inform[5] == "INFORM, SNMP v2c, community public"
+    assert inform[6].split("\t")[1:] == [".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.4.1.99.0.4",
+                                        '.1.3.6.1.2.1.1.5.0 = STRING: "core 7"']
+    # The control interface refuses what it cannot send, and sends nothing.
+    status, _, error = ctl(network, "trap", NETWORK_DEVICE, "--to", to, "1.3.6.1.4.1.99.0.5",
+                           "1.3.6.1.2.1.1.5.0", "q", "x")
+    assert status == 1 and "unknown type 'q'" in error, error
+    # restricted's notify view leaves out the interfaces group.
+    status, _, error = ctl(network, "trap", NETWORK_DEVICE, "--to", to, "--version", "v3", "--user", "restricted",
+                           "1.3.6.1.4.1.99.0.8", "1.3.6.1.2.1.2.2.1.1.2", "i", "2")
+    assert status == 1 and "notify view" in error, error
+    time.sleep(0.5)
+    assert len(trapd(0, wait=0)) == before + 4
+
+
+def test_ctl_inform_nobody_answers_ends_dropped_after_each_send(network, silent):
+    start = time.monotonic()
+    assert ctl(network, "inform", NETWORK_DEVICE, "--to", f"127.0.0.1:{SILENT_PORT}", "--timeout", "1",
+               "--retries", "1", "--wait", "1.3.6.1.4.1.99.0.1") == (1, "dropped\n", "")
+    assert time.monotonic() - start >= 2, "two sends a timeout apart"
+    assert silent() == [(NETWORK_DEVICE, NETWORK_PORT)] * 2
+    informs = network.api("/api/informs")["informs"]
+    assert informs[-1] == {"id": informs[-1]["id"], "state": "dropped", "sends": 2, "device": NETWORK_DEVICE,
+                           "manager": f"127.0.0.1:{SILENT_PORT}"}

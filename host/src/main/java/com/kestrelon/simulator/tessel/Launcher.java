@@ -5,6 +5,8 @@ import com.kestrelon.simulator.tessel.control.AdminConfigException;
 import com.kestrelon.simulator.tessel.control.AdminServer;
 import com.kestrelon.simulator.tessel.control.AgentState;
 import com.kestrelon.simulator.tessel.control.DeviceTable;
+import com.kestrelon.simulator.tessel.control.InformLog;
+import com.kestrelon.simulator.tessel.control.NativeNotifications;
 import com.kestrelon.simulator.tessel.control.NativeReports;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.network.Network;
@@ -65,6 +67,8 @@ public final class Launcher {
   private NetworkSimulator engine; // guarded by lifecycle: set once the engine is initialised
   private AdminServer admin; // guarded by lifecycle: set once the control interface listens
   private volatile DeviceTable devices;
+  /** The informs sent through the control interface, told of their outcome by the engine. */
+  private final InformLog informs = new InformLog();
   private final Supplier<Optional<DescriptorBudget>> descriptorBudget;
   private final Function<PrintStream, NetworkSimulator> engines;
 
@@ -244,6 +248,7 @@ public final class Launcher {
         return 2;
       }
       engine = simulator;
+      handler.setInformListener(informs);
       if (!handler.jniJVMparams()) {
         return fail(err, "the engine did not accept the host");
       }
@@ -318,7 +323,8 @@ public final class Launcher {
         return 0;
       }
       try {
-        admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports());
+        admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports(),
+            new AdminServer.Notifications(new NativeNotifications(), informs));
       } catch (IOException e) {
         return fail(err, "the control interface cannot listen on " + control.listen() + ": " + e.getMessage());
       }

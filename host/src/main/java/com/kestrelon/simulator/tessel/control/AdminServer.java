@@ -2,6 +2,8 @@ package com.kestrelon.simulator.tessel.control;
 
 import com.google.gson.Gson;
 import com.google.gson.GsonBuilder;
+import com.google.gson.JsonElement;
+import com.google.gson.JsonObject;
 import com.google.gson.stream.JsonReader;
 import com.google.gson.stream.JsonToken;
 import com.kestrelon.simulator.tessel.network.Network;
@@ -51,6 +53,7 @@ public final class AdminServer implements AutoCloseable {
   private final DeviceTable devices;
   private final EngineReports reports;
   private final AdminAccess access;
+  private final Notifications notifications;
   private final Optional<byte[]> dashboard;
   private final RequestRate rate = new RequestRate();
   private final List<Route> routes = List.of(
@@ -60,6 +63,10 @@ public final class AdminServer implements AutoCloseable {
       new Route("/api/devices/([^/]+)", "GET", (exchange, path) -> device(path.group(1))),
       new Route("/api/devices/([^/]+)/(stop|start|restart)", "POST",
           (exchange, path) -> change(exchange, path.group(1), path.group(2))),
+      new Route("/api/devices/([^/]+)/notifications", "POST",
+          (exchange, path) -> notify(exchange, path.group(1))),
+      new Route("/api/informs", "GET", (exchange, path) -> informList()),
+      new Route("/api/informs/([^/]+)", "GET", (exchange, path) -> inform(path.group(1))),
       new Route("/api/stats", "GET", (exchange, path) -> json(200, statsJson())),
       new Route("/metrics", "GET", (exchange, path) -> metrics()));
 
@@ -94,14 +101,18 @@ public final class AdminServer implements AutoCloseable {
     }
   }
 
+  /** What sends the devices' notifications, and the log of the informs sent. */
+  public record Notifications(NotificationSender sender, InformLog informs) {}
+
   private AdminServer(HttpServer server, ExecutorService executor, Network network, DeviceTable devices,
-      EngineReports reports, AdminAccess access, Optional<byte[]> dashboard) {
+      EngineReports reports, Notifications notifications, AdminAccess access, Optional<byte[]> dashboard) {
     this.server = server;
     this.executor = executor;
     this.network = network;
     this.devices = devices;
     this.reports = reports;
     this.access = access;
+    this.notifications = notifications;
     this.dashboard = dashboard;
   }
 
@@ -110,7 +121,7 @@ public final class AdminServer implements AutoCloseable {
    * dashboard page itself needs it.
    */
   public static AdminServer start(InetSocketAddress listen, Optional<String> token, Network network,
-      DeviceTable devices, EngineReports reports) throws IOException {
+      DeviceTable devices, EngineReports reports, Notifications notifications) throws IOException {
     HttpServer server = HttpServer.create(listen, 0);
     // Two request threads: one slow client does not hold the others.
     AtomicInteger threads = new AtomicInteger();
@@ -119,7 +130,7 @@ public final class AdminServer implements AutoCloseable {
       thread.setDaemon(true);
       return thread;
     });
-    AdminServer admin = new AdminServer(server, executor, network, devices, reports,
+    AdminServer admin = new AdminServer(server, executor, network, devices, reports, notifications,
         new AdminAccess(listen.getAddress(), token), readDashboard());
     server.setExecutor(executor);
     server.createContext("/", admin::serve);
@@ -285,11 +296,15 @@ public final class AdminServer implements AutoCloseable {
     return json(200, deviceJson(device));
   }
 
-  private Response change(HttpExchange exchange, String address, String action) throws Refusal, IOException {
+  private static void checkOrigin(HttpExchange exchange) throws Refusal {
     String headerHost = exchange.getRequestHeaders().getFirst("Host");
     if (!AdminAccess.originAllowed(exchange.getRequestHeaders().getFirst("Origin"), headerHost)) {
       throw new Refusal(403, "a page from another origin may not change devices");
     }
+  }
+
+  private Response change(HttpExchange exchange, String address, String action) throws Refusal, IOException {
+    checkOrigin(exchange);
     Optional<String> protocol = protocol(exchange);
     Optional<DeviceTable.Change> change;
     try {
@@ -317,18 +332,87 @@ public final class AdminServer implements AutoCloseable {
    * site cannot change anything.
    */
   private static Optional<String> protocol(HttpExchange exchange) throws Refusal, IOException {
+    byte[] body = jsonBody(exchange);
+    return body.length == 0 ? Optional.empty() : protocolField(body);
+  }
+
+  /** The body, empty or of the JSON content type. */
+  private static byte[] jsonBody(HttpExchange exchange) throws Refusal, IOException {
     String type = exchange.getRequestHeaders().getFirst("Content-Type");
     if (type != null && !type.split(";", 2)[0].strip().equalsIgnoreCase("application/json")) {
       throw new Refusal(415, "a request body must be application/json, not " + type);
     }
     byte[] body = body(exchange);
-    if (body.length == 0) {
-      return Optional.empty();
-    }
-    if (type == null) {
+    if (body.length > 0 && type == null) {
       throw new Refusal(415, "a request body needs Content-Type: application/json");
     }
-    return protocolField(body);
+    return body;
+  }
+
+  /**
+   * Sends a notification from a running device: a trap answers whether it left, an inform its ID
+   * in the inform log. Nothing is sent when any part of the request is wrong.
+   */
+  private Response notify(HttpExchange exchange, String address) throws Refusal, IOException {
+    checkOrigin(exchange);
+    byte[] body = jsonBody(exchange);
+    Notification notification;
+    try {
+      notification = Notification.parse(jsonObject(body));
+    } catch (IllegalArgumentException e) {
+      throw new Refusal(400, e.getMessage());
+    }
+    Device device = devices.find(address).orElseThrow(() -> noDevice(address));
+    if (device.protocols().get("snmp") != AgentState.RUNNING) {
+      throw new Refusal(422, "the device " + device.address() + " is not running its SNMP agent");
+    }
+    NotificationSender.Outcome outcome = notifications.sender().send(device, notification);
+    if (outcome.result() != NotificationSender.Result.SENT) {
+      throw new Refusal(422, outcome.result().reason());
+    }
+    if (!notification.inform()) {
+      return json(200, Map.of("sent", true));
+    }
+    return json(202, Map.of("id", notifications.informs().add(device, notification, outcome.engineInformId())));
+  }
+
+  private static JsonObject jsonObject(byte[] body) throws Refusal {
+    if (body.length == 0) {
+      throw new Refusal(400, "the request needs a JSON object describing the notification");
+    }
+    try (JsonReader reader = new JsonReader(new StringReader(utf8(body)))) {
+      reader.setLenient(false);
+      JsonElement element = GSON.getAdapter(JsonElement.class).read(reader);
+      if (!element.isJsonObject()) {
+        throw new Refusal(400, "the body must be a JSON object");
+      }
+      if (reader.peek() != JsonToken.END_DOCUMENT) {
+        throw new Refusal(400, "malformed JSON: more after the object");
+      }
+      return element.getAsJsonObject();
+    } catch (IOException | RuntimeException e) {
+      throw new Refusal(400, "malformed JSON: " + e.getMessage());
+    }
+  }
+
+  private Response informList() {
+    return json(200, Map.of("informs", notifications.informs().all().stream().map(AdminServer::informJson).toList()));
+  }
+
+  private Response inform(String id) throws Refusal {
+    Optional<InformLog.Entry> entry = id.matches("[0-9]{1,9}")
+        ? notifications.informs().find(Integer.parseInt(id)) : Optional.empty();
+    return json(200, informJson(entry.orElseThrow(() -> new Refusal(404, "no inform " + id))));
+  }
+
+  private static Map<String, Object> informJson(InformLog.Entry entry) {
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("id", entry.id());
+    json.put("state", entry.state().text());
+    json.put("sends", entry.sends());
+    json.put("device", entry.device());
+    json.put("manager", entry.manager());
+    return json;
   }
 
   private static byte[] body(HttpExchange exchange) throws Refusal, IOException {

@@ -42,7 +42,8 @@ import picocli.CommandLine.Spec;
  */
 @Command(name = "./tessel ctl",
     description = "Shows and drives a running network through its control interface.",
-    subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class})
+    subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class, Ctl.Trap.class, Ctl.Inform.class,
+        Ctl.Informs.class})
 public final class Ctl implements Runnable {
   static final int API_ERROR = 1;
   static final int UNREACHABLE = 3;
@@ -87,7 +88,8 @@ public final class Ctl implements Runnable {
 
   @Override
   public void run() {
-    throw new ParameterException(spec.commandLine(), "Missing command: devices, device, stop, start, restart or stats");
+    throw new ParameterException(spec.commandLine(),
+        "Missing command: devices, device, stop, start, restart, stats, trap, inform or informs");
   }
 
   /**
@@ -129,6 +131,9 @@ public final class Ctl implements Runnable {
     @Spec
     CommandSpec spec;
 
+    /** The exit status of a command that succeeded; a command may report 1 for what it found. */
+    int status;
+
     @Override
     public Integer call() {
       Connection effective = connection.over(parent.connection);
@@ -136,7 +141,7 @@ public final class Ctl implements Runnable {
       PrintWriter out = spec.commandLine().getOut();
       try {
         execute(client, Boolean.TRUE.equals(effective.json), out);
-        return 0;
+        return status;
       } catch (ApiException e) {
         spec.commandLine().getErr().println("tessel ctl: " + e.getMessage());
         return API_ERROR;
@@ -288,6 +293,187 @@ public final class Ctl implements Runnable {
         }
       }
       table.print(out);
+    }
+  }
+
+  /**
+   * trap and inform: a notification from the device at ADDRESS to the manager of --to, built from
+   * the trap OID and OID TYPE VALUE triples (TYPE as net-snmp's snmptrap: i u c C s x d n o t a b);
+   * an SNMPv1 trap takes --enterprise, --generic and --specific instead of the trap OID.
+   */
+  abstract static class NotificationCommand extends ApiCommand {
+    @Parameters(index = "0", paramLabel = "ADDRESS", description = "the device's IPv4 address")
+    String address;
+
+    @Parameters(index = "1..*", paramLabel = "TRAPOID [OID TYPE VALUE]...",
+        description = "the trap's OID (not for v1), then a binding per OID TYPE VALUE")
+    List<String> rest = new ArrayList<>();
+
+    @Option(names = "--to", required = true, paramLabel = "HOST:PORT",
+        description = "the manager, such as 127.0.0.1:162 or [::1]:162")
+    String manager;
+
+    @Option(names = "--version", paramLabel = "V", description = "v1, v2c (the default) or v3")
+    String version = "v2c";
+
+    @Option(names = "--community", paramLabel = "C", description = "the community (v1 and v2c; default public)")
+    String community;
+
+    @Option(names = "--user", paramLabel = "U", description = "the SNMPv3 user, sent at its own security level")
+    String user;
+
+    @Option(names = "--context", paramLabel = "X", description = "the SNMPv3 context (default empty)")
+    String context;
+
+    @Option(names = "--enterprise", paramLabel = "E", description = "v1: the enterprise OID")
+    String enterprise;
+
+    @Option(names = "--generic", paramLabel = "G", description = "v1: the generic-trap, 0 to 6 (default 6)")
+    Integer generic;
+
+    @Option(names = "--specific", paramLabel = "S", description = "v1: the specific-trap (default 0)")
+    Integer specific;
+
+    /** The request body; a usage error when the arguments cannot make one. */
+    JsonObject body(String kind) {
+      if (community != null && user != null) {
+        throw usage("Give --community (v1, v2c) or --user (v3), not both");
+      }
+      if (context != null && user == null) {
+        throw usage("--context goes with --user");
+      }
+      boolean v1 = version.equals("v1");
+      if (!v1 && (enterprise != null || generic != null || specific != null)) {
+        throw usage("--enterprise, --generic and --specific make an SNMPv1 trap; use --version v1");
+      }
+      if (v1 && enterprise == null) {
+        throw usage("An SNMPv1 trap needs --enterprise E (and --generic G --specific S)");
+      }
+      int first = v1 ? 0 : 1;
+      if (rest.size() < first || (rest.size() - first) % 3 != 0) {
+        throw usage(v1 ? "After ADDRESS come bindings, each OID TYPE VALUE"
+            : "After ADDRESS come the trap OID and bindings, each OID TYPE VALUE");
+      }
+      JsonObject body = new JsonObject();
+      body.addProperty("kind", kind);
+      body.addProperty("version", version);
+      body.addProperty("manager", manager);
+      addIfGiven(body, "community", community);
+      addIfGiven(body, "user", user);
+      addIfGiven(body, "context", context);
+      if (v1) {
+        body.addProperty("enterprise", enterprise);
+        body.addProperty("generic", generic == null ? 6 : generic);
+        body.addProperty("specific", specific == null ? 0 : specific);
+      } else {
+        body.addProperty("oid", rest.get(0));
+      }
+      JsonArray varbinds = new JsonArray();
+      for (int i = first; i < rest.size(); i += 3) {
+        JsonObject binding = new JsonObject();
+        binding.addProperty("oid", rest.get(i));
+        binding.addProperty("type", rest.get(i + 1));
+        binding.addProperty("value", rest.get(i + 2));
+        varbinds.add(binding);
+      }
+      body.add("varbinds", varbinds);
+      return body;
+    }
+
+    JsonElement post(AdminClient client, JsonObject body) throws ApiException, UnreachableException {
+      return client.post("/api/devices/" + AdminClient.encode(address) + "/notifications", Optional.of(body));
+    }
+
+    ParameterException usage(String message) {
+      return new ParameterException(spec.commandLine(), message);
+    }
+
+    private static void addIfGiven(JsonObject body, String name, String value) {
+      if (value != null) {
+        body.addProperty(name, value);
+      }
+    }
+  }
+
+  @Command(name = "trap", description = "Sends a trap from the device now; prints 'sent'.")
+  static final class Trap extends NotificationCommand {
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = post(client, body("trap"));
+      out.println(json ? answer.toString() : "sent");
+    }
+  }
+
+  @Command(name = "inform",
+      description = "Sends an inform from the device now; prints its ID, or with --wait how it ended.")
+  static final class Inform extends NotificationCommand {
+    /** The most time --wait adds to the inform's own timeouts for its manager's discovery. */
+    static final long DISCOVERY_ALLOWANCE_MILLIS = 10_000;
+    private static final long POLL_MILLIS = 200;
+
+    @Option(names = "--timeout", paramLabel = "S", description = "seconds to wait for the Response (default 5)")
+    int timeout = 5;
+
+    @Option(names = "--retries", paramLabel = "N", description = "times to send it again (default 0)")
+    int retries;
+
+    @Option(names = "--wait", description = "wait for the outcome: print 'acknowledged' (exit 0) or 'dropped' (exit 1)")
+    boolean await;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonObject body = body("inform");
+      body.addProperty("timeout", timeout);
+      body.addProperty("retries", retries);
+      int id = post(client, body).getAsJsonObject().get("id").getAsInt();
+      if (!await) {
+        out.println(json ? "{\"id\":" + id + "}" : String.valueOf(id));
+        return;
+      }
+      String state = outcome(client, id);
+      out.println(state);
+      status = state.equals("acknowledged") ? 0 : 1;
+    }
+
+    /** Asks for the inform until it is no longer pending; bounded by its timeouts. */
+    private String outcome(AdminClient client, int id) throws ApiException, UnreachableException {
+      long deadline = System.nanoTime()
+          + (1_000L * timeout * (retries + 1L) + DISCOVERY_ALLOWANCE_MILLIS) * 1_000_000L;
+      while (true) {
+        String state = client.get("/api/informs/" + id).getAsJsonObject().get("state").getAsString();
+        if (!state.equals("pending")) {
+          return state;
+        }
+        if (System.nanoTime() - deadline > 0) {
+          throw new ApiException("inform " + id + " is still pending after its timeouts");
+        }
+        try {
+          Thread.sleep(POLL_MILLIS);
+        } catch (InterruptedException e) {
+          Thread.currentThread().interrupt();
+          throw new UnreachableException("interrupted while waiting for inform " + id);
+        }
+      }
+    }
+  }
+
+  @Command(name = "informs", description = "Lists the informs sent through the control interface, or one of them.")
+  static final class Informs extends ApiCommand {
+    @Parameters(arity = "0..1", paramLabel = "ID", description = "only the inform with this ID")
+    String id;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = client.get(id == null ? "/api/informs" : "/api/informs/" + AdminClient.encode(id));
+      if (json) {
+        printJson(out, answer);
+        return;
+      }
+      JsonArray informs = id == null ? answer.getAsJsonObject().getAsJsonArray("informs") : new JsonArray();
+      if (id != null) {
+        informs.add(answer);
+      }
+      printObjects(out, informs);
     }
   }
 

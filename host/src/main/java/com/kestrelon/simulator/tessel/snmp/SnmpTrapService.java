@@ -33,4 +33,18 @@ public class SnmpTrapService {
   public native void SendV3Trap(String managerHost, int managerPort, String community,
       String trapOid, String userName, String contextName, String[] oids, int[] types,
       String[] values, int agentId, String agentText);
+
+  /**
+   * One notification with its outcome, for hosts that must know it: pduType is the PDU's tag
+   * (0xA4 Trap, 0xA7 SNMPv2-Trap, 0xA6 InformRequest), version the manager's (0 SNMPv1, 1 SNMPv2c,
+   * 3 SNMPv3); enterprise, genericTrap and specificTrap make the SNMPv1 form, trapOid the SNMPv2
+   * one; an inform waits timeout seconds for its Response and is sent again retries times.
+   * Returns {result, informId}: result 0 when sent, else the reason it was not (see
+   * {@code NotificationSender.Result}); informId names the inform in the handler's reports (an
+   * SNMPv3 inform's too, though it leaves only once its manager is discovered), 0 for a trap.
+   */
+  public native int[] sendNotification(int pduType, int version, String managerHost,
+      int managerPort, String community, String userName, String contextName, String enterprise,
+      int genericTrap, int specificTrap, String trapOid, String[] oids, int[] types,
+      String[] values, int agentId, String agentText, int timeout, int retries);
 }

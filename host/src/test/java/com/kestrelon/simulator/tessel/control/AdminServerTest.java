@@ -50,6 +50,10 @@ class AdminServerTest {
 
   private final List<String> agentCalls = Collections.synchronizedList(new ArrayList<>());
   private final FakeReports reports = new FakeReports();
+  private final List<String> sent = Collections.synchronizedList(new ArrayList<>());
+  private volatile NotificationSender.Outcome sendOutcome = new NotificationSender.Outcome(NotificationSender.Result.SENT, 41);
+  private final AtomicLong millis = new AtomicLong(1_000_000);
+  private final InformLog informs = new InformLog(millis::get);
   private final HttpClient client = HttpClient.newBuilder().connectTimeout(Duration.ofSeconds(5)).build();
   private AdminServer server;
 
@@ -116,8 +120,13 @@ class AdminServerTest {
         agentCalls.add("stop " + device.address());
       }
     };
+    NotificationSender sender = (device, n) -> {
+      sent.add(device.agentId() + " " + n.version().text() + " " + n.manager() + " " + n.community() + n.user()
+          + " " + n.oid() + n.enterprise() + " " + n.bindings());
+      return sendOutcome;
+    };
     return AdminServer.start(new InetSocketAddress("127.0.0.1", 0), token, network,
-        table.build(Map.of("snmp", agents)), reports);
+        table.build(Map.of("snmp", agents)), reports, new AdminServer.Notifications(sender, informs));
   }
 
   private Answer send(String method, String path, String contentType, String body, String... headers)
@@ -197,6 +206,17 @@ class AdminServerTest {
       POST   | /api/devices/127.0.1.1/stop       | text/plain       | ''                        | 415 | -
       POST   | /api/devices/127.0.1.1/stop       | -                | '{"protocol": "snmp"}'    | 415 | -
       POST   | /api/devices/10.0.0.1/stop        | -                | -                         | 404 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1", "varbinds": [{"oid": "1.3.6.1.2.1.1.5.0", "type": "z", "value": "x"}]}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1", "varbinds": [{"oid": "1.3.6.1.2.1.1.5.0", "type": "i", "value": "two"}]}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1", "varbinds": [{"oid": "1.3.6.1.2.1.1.3.0", "type": "t"}]}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1", "varbinds": [{"oid": "1.3.6.1.2.1.1.6.0", "type": "a", "value": "10.0.0.256"}]}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "version": "v1", "manager": "127.0.0.1:162", "generic": 6, "specific": 1}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "inform", "version": "v1", "manager": "127.0.0.1", "enterprise": "1.3.6.1.4.1.99"}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1", "colour": "red"}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "trap", "version": "v3", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1"}' | 400 | -
+      POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "inform", "manager": "127.0.0.1:70000", "oid": "1.3.6.1.6.3.1.1.5.1"}' | 400 | -
+      POST   | /api/devices/127.0.2.2/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1"}' | 422 | -
+      GET    | /api/informs/7                    | -                | -                         | 404 | -
       """)
   void refusalsAnswerJsonAndChangeNothing(String method, String path, String type, String body, int status,
       String allow) throws Exception {
@@ -208,6 +228,74 @@ class AdminServerTest {
       assertEquals(allow, answer.header("Allow"));
     }
     assertEquals(List.of(), agentCalls);
+    assertEquals(List.of(), sent);
+  }
+
+  @Test
+  void notificationsAreSentWithTheirBindingsAsTheEngineTakesThem() throws Exception {
+    String path = "/api/devices/127.0.1.2/notifications";
+    Answer trap = send("POST", path, "application/json", """
+        {"kind": "trap", "manager": "[::1]:1162", "community": "c", "oid": ".1.3.6.1.6.3.1.1.5.3",
+         "varbinds": [{"oid": "1.3.6.1.2.1.2.2.1.1.2", "type": "i", "value": "2"},
+                      {"oid": "1.3.6.1.4.1.99.1", "type": "s", "value": "up"},
+                      {"oid": "1.3.6.1.4.1.99.2", "type": "x", "value": "0A 1b"},
+                      {"oid": "1.3.6.1.4.1.99.3", "type": "b", "value": "0,9"},
+                      {"oid": "1.3.6.1.4.1.99.4", "type": "C", "value": "18446744073709551615"},
+                      {"oid": "1.3.6.1.4.1.99.5", "type": "o", "value": "1.3.6"}]}""");
+    assertEquals(200, trap.status(), trap.body());
+    assertTrue(trap.json().get("sent").getAsBoolean());
+    assertEquals(List.of("1 v2c [::1]:1162 c .1.3.6.1.6.3.1.1.5.3 [Binding[oid=.1.3.6.1.2.1.2.2.1.1.2, type=2, value=2], "
+        + "Binding[oid=.1.3.6.1.4.1.99.1, type=4, value='7570'h], Binding[oid=.1.3.6.1.4.1.99.2, type=4, value='0a1b'h], "
+        + "Binding[oid=.1.3.6.1.4.1.99.3, type=4, value='8040'h], "
+        + "Binding[oid=.1.3.6.1.4.1.99.4, type=70, value=18446744073709551615], "
+        + "Binding[oid=.1.3.6.1.4.1.99.5, type=6, value=.1.3.6]]"), sent);
+
+    sendOutcome = new NotificationSender.Outcome(NotificationSender.Result.REFUSED, 0);
+    Answer refused = send("POST", path, "application/json",
+        "{\"kind\": \"trap\", \"version\": \"v3\", \"user\": \"nobody\", \"manager\": \"127.0.0.1\", \"oid\": \"1.3.6.1.4.1.99.0.1\"}");
+    assertEquals(422, refused.status());
+    assertTrue(refused.json().get("error").getAsString().contains("notify view"), refused.body());
+
+    sendOutcome = new NotificationSender.Outcome(NotificationSender.Result.SENT, 41);
+    Answer inform = send("POST", path, "application/json", """
+        {"kind": "inform", "manager": "127.0.0.1:1162", "oid": "1.3.6.1.4.1.99.0.1", "timeout": 2, "retries": 2}""");
+    assertEquals(202, inform.status(), inform.body());
+    String informPath = "/api/informs/" + inform.json().get("id").getAsInt();
+    millis.addAndGet(2500);
+    assertEquals("{\"id\":1,\"state\":\"pending\",\"sends\":2,\"device\":\"127.0.1.2\",\"manager\":\"127.0.0.1:1162\"}",
+        get(informPath).body());
+    informs.answered(41, 5, "127.0.1.2", "127.0.0.1", 1162, 0, 0, null, null, null);
+    millis.addAndGet(60_000);
+    JsonObject listed = get("/api/informs").json().getAsJsonArray("informs").get(0).getAsJsonObject();
+    assertEquals("acknowledged", listed.get("state").getAsString());
+    assertEquals(2, listed.get("sends").getAsInt());
+  }
+
+  @Test
+  void theInformLogFollowsTheEnginesReports() {
+    Device device = new Device("127.0.1.1", 0x7F000101L, 0, "R1", "routers", Map.of("snmp", AgentState.RUNNING));
+    Notification v3 = Notification.parse(JsonParser.parseString("""
+        {"kind": "inform", "version": "v3", "user": "u", "manager": "127.0.0.1:1162", "oid": "1.3.6.1.4.1.99.0.1",
+         "timeout": 1, "retries": 3}""").getAsJsonObject());
+    // A report may come before the send that caused it has returned.
+    informs.answered(7, 1, "127.0.1.1", "127.0.0.1", 1162, 0, 0, null, null, null);
+    int early = informs.add(device, v3, 7);
+    int undiscovered = informs.add(device, v3, 8);
+    int silent = informs.add(device, v3, 9);
+    millis.addAndGet(40);
+    informs.dropped(8, 3, "", "u", "", "127.0.0.1", 1162, null, null, null);
+    millis.addAndGet(3900);
+    informs.answered(8, 1, "127.0.1.1", "127.0.0.1", 1162, 0, 0, null, null, null);
+    assertEquals(InformLog.State.ACKNOWLEDGED, informs.find(early).orElseThrow().state());
+    assertEquals(new InformLog.Entry(undiscovered, InformLog.State.DROPPED, 0, "127.0.1.1", "127.0.0.1:1162"),
+        informs.find(undiscovered).orElseThrow(), "dropped at once, and for good");
+    assertEquals(InformLog.State.PENDING, informs.find(silent).orElseThrow().state());
+    assertEquals(4, informs.find(silent).orElseThrow().sends(), "1 + retries at most");
+    for (int i = 0; i < InformLog.KEPT; i++) {
+      informs.add(device, v3, 100 + i);
+    }
+    assertEquals(InformLog.KEPT, informs.all().size());
+    assertTrue(informs.find(silent).isEmpty());
   }
 
   @Test

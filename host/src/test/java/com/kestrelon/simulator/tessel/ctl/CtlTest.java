@@ -35,6 +35,7 @@ class CtlTest {
   private HttpServer server;
   private String url;
   private final List<String> requests = new CopyOnWriteArrayList<>(); // "METHOD URI BEARER BODY"
+  private final java.util.concurrent.atomic.AtomicInteger informPolls = new java.util.concurrent.atomic.AtomicInteger();
   private String out;
   private String err;
 
@@ -78,6 +79,14 @@ class CtlTest {
       boolean allowed = bearer.equals("Bearer " + TOKEN);
       reply(exchange, allowed ? 200 : 401,
           allowed ? device("10.0.0.5", "stopped") : "{\"error\": \"a valid token is needed\"}");
+    } else if (uri.getPath().equals("/api/devices/10.0.0.5/notifications")) {
+      boolean inform = body.contains("\"inform\"");
+      reply(exchange, inform ? 202 : 200, inform ? "{\"id\": 9}" : "{\"sent\": true}");
+    } else if (uri.getPath().equals("/api/informs/9")) {
+      String state = informPolls.incrementAndGet() < 3 ? "pending" : "dropped";
+      reply(exchange, 200, "{\"id\": 9, \"state\": \"" + state + "\", \"sends\": 1}");
+    } else if (uri.getPath().equals("/api/informs")) {
+      reply(exchange, 200, "{\"informs\": [{\"id\": 8, \"state\": \"acknowledged\", \"sends\": 2}]}");
     } else if (uri.getPath().equals("/api/stats")) {
       reply(exchange, 200, "{\"snmp\": {\"counters\": {\"snmpInPkts\": 12, \"snmpInBadVersions\": 0},"
           + " \"requestsPerSecond\": 3.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
@@ -139,6 +148,50 @@ class CtlTest {
     assertTrue(err.contains("a valid token is needed"), err);
     assertEquals(1, ctl("--admin", url, "device", "10.9.9.9"));
     assertTrue(err.contains("no device at 10.9.9.9"), err);
+  }
+
+  @Test
+  void trapAndInformBuildTheNotificationFromTheirArguments() {
+    assertEquals(0, ctl("--admin", url, "trap", "10.0.0.5", "--to", "[::1]:1162", "--community", "c",
+        "1.3.6.1.6.3.1.1.5.3", "1.3.6.1.2.1.2.2.1.1.2", "i", "-2", "1.3.6.1.4.1.99.1", "s", "link down"));
+    assertEquals("sent\n", out);
+    assertEquals("POST /api/devices/10.0.0.5/notifications null {\"kind\":\"trap\",\"version\":\"v2c\","
+        + "\"manager\":\"[::1]:1162\",\"community\":\"c\",\"oid\":\"1.3.6.1.6.3.1.1.5.3\",\"varbinds\":["
+        + "{\"oid\":\"1.3.6.1.2.1.2.2.1.1.2\",\"type\":\"i\",\"value\":\"-2\"},"
+        + "{\"oid\":\"1.3.6.1.4.1.99.1\",\"type\":\"s\",\"value\":\"link down\"}]}", requests.get(0));
+    assertEquals(0, ctl("--admin", url, "trap", "10.0.0.5", "--to", "127.0.0.1:162", "--version", "v1",
+        "--enterprise", "1.3.6.1.4.1.99", "--specific", "7"));
+    assertTrue(requests.get(1).endsWith("\"enterprise\":\"1.3.6.1.4.1.99\",\"generic\":6,\"specific\":7,\"varbinds\":[]}"),
+        requests.get(1));
+
+    assertEquals(1, ctl("--admin", url, "inform", "10.0.0.5", "--to", "127.0.0.1:162", "--version", "v3", "--user",
+        "u", "--context", "ctx", "--timeout", "1", "--wait", "1.3.6.1.4.1.99.0.1"));
+    assertEquals("dropped\n", out);
+    assertTrue(requests.get(2).contains("\"user\":\"u\",\"context\":\"ctx\",\"oid\":\"1.3.6.1.4.1.99.0.1\","
+        + "\"varbinds\":[],\"timeout\":1,\"retries\":0}"), requests.get(2));
+    assertEquals(6, requests.size(), "polled until the inform was no longer pending");
+    assertEquals(0, ctl("--admin", url, "inform", "10.0.0.5", "--to", "127.0.0.1:162", "1.3.6.1.4.1.99.0.1"));
+    assertEquals("9\n", out);
+    assertEquals(0, ctl("--admin", url, "informs"));
+    assertEquals(List.of("ID  STATE         SENDS", "8   acknowledged  2"), out.lines().toList());
+  }
+
+  @Test
+  void notificationArgumentsThatMakeNoNotificationSendNothing() {
+    String[][] wrong = {
+        {"trap", "10.0.0.5", "1.3.6.1.4.1.99.0.1"},
+        {"trap", "10.0.0.5", "--to", "127.0.0.1:162"},
+        {"trap", "10.0.0.5", "--to", "127.0.0.1:162", "1.3.6.1.4.1.99.0.1", "1.3.6.1.2.1.1.5.0", "s"},
+        {"trap", "10.0.0.5", "--to", "127.0.0.1:162", "--version", "v1", "--generic", "2"},
+        {"trap", "10.0.0.5", "--to", "127.0.0.1:162", "--enterprise", "1.3.6.1.4.1.99", "1.3.6.1.4.1.99.0.1"},
+        {"trap", "10.0.0.5", "--to", "127.0.0.1:162", "--community", "c", "--user", "u", "1.3.6.1.4.1.99.0.1"},
+        {"inform", "10.0.0.5", "--to", "127.0.0.1:162", "--retries", "two", "1.3.6.1.4.1.99.0.1"},
+    };
+    for (String[] args : wrong) {
+      String[] withAdmin = Stream.concat(Stream.of("--admin", url), Stream.of(args)).toArray(String[]::new);
+      assertEquals(2, ctl(withAdmin), String.join(" ", args));
+    }
+    assertEquals(List.of(), requests);
   }
 
   @Test
