@@ -6,6 +6,7 @@
 #include <memory>
 #include <mutex>
 #include <new>
+#include <optional>
 #include <unordered_map>
 #include <utility>
 
@@ -13,6 +14,8 @@
 #include "base/conversions.h"
 #include "engine/engine_state.h"
 #include "engine/log.h"
+#include "notify/standard_traps.h"
+#include "notify/trap_pdu.h"
 
 namespace tessel {
 namespace {
@@ -170,6 +173,7 @@ void InstallSessionTransport(SessionOpener opener, SessionCloser closer) {
 std::int64_t FillAgentInfoAndStartAgent(const AgentRegistration& registration) {
   LOG_TRACE("\n\t@@@@@ Inside FillAgentInfoAndStartAgent() @@@@@ \n");
   std::int64_t socket = kNoSocket;
+  std::optional<AgentSession> started;
   try {
     std::unique_ptr<AgentSession> session = NewSession(registration);
     AgentInfo& info = *session->agentInfo;
@@ -179,10 +183,12 @@ std::int64_t FillAgentInfoAndStartAgent(const AgentRegistration& registration) {
     Registry& registry = TheRegistry();
     std::lock_guard<std::mutex> lock(registry.mutex);
     socket = OpenAndKeepLocked(registry, std::move(session));
+    if (socket != kNoSocket) started = CopyAgentSession(*registry.sessions.back());
   } catch (const std::bad_alloc&) {
     LOG_ERROR("Memory allocation failure ...\n");
     return kOutOfMemory;
   }
+  if (started) RaiseStandardTrap(*started, kColdStart);
   PrintStatus(socket != kNoSocket ? StartedText(registration.port, registration.address)
                                   : NotStartedText(registration.port, registration.address));
   return socket;
@@ -223,7 +229,7 @@ bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t eng
   LOG_TRACE("\n\t@@@@@ Inside StartAgent() @@@@@ \n");
   Registry& registry = TheRegistry();
   {
-    std::lock_guard<std::mutex> lock(registry.mutex);
+    std::unique_lock<std::mutex> lock(registry.mutex);
     auto found = FindForStartOrStop(registry, address, port);
     if (found == registry.sessions.end()) {
       LOG_TRACE("The td Info cannot be obtained for %s\n", address.c_str());
@@ -231,11 +237,14 @@ bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t eng
     }
     AgentSession& session = **found;
     // A running agent stays on its socket: a second bind of its port could only fail.
-    if (!session.agentInfo->started.load())
-      HoldSocket(session, OpenSessionLocked(registry, session));
+    bool wasRunning = session.agentInfo->started.load() != 0;
+    if (!wasRunning) HoldSocket(session, OpenSessionLocked(registry, session));
     if (session.agentInfo->started.load()) {
       session.agentInfo->engineBoots = engineBoots;
       LOG_TRACE("The engine boot count value @ start is : %ld\n", static_cast<long>(engineBoots));
+      AgentSession started = CopyAgentSession(session);
+      lock.unlock();
+      if (!wasRunning) RaiseStandardTrap(started, kColdStart);
       return true;
     }
     ForgetAddressLocked(registry, session);
@@ -266,10 +275,15 @@ bool StopAgent(const std::string& address, std::int32_t port) {
 bool RestartAgent(std::int32_t index) {
   LOG_TRACE("\n\t@@@@@ Inside RestartAgent() @@@@@ \n");
   Registry& registry = TheRegistry();
-  std::lock_guard<std::mutex> lock(registry.mutex);
+  std::unique_lock<std::mutex> lock(registry.mutex);
   if (index < 0 || static_cast<std::size_t>(index) >= registry.sessions.size()) return false;
   AgentSession& session = *registry.sessions[static_cast<std::size_t>(index)];
-  if (!session.agentInfo->started.load()) HoldSocket(session, OpenSessionLocked(registry, session));
+  if (session.agentInfo->started.load()) return true;
+  HoldSocket(session, OpenSessionLocked(registry, session));
+  if (!session.agentInfo->started.load()) return true;
+  AgentSession started = CopyAgentSession(session);
+  lock.unlock();
+  RaiseStandardTrap(started, kColdStart);
   return true;
 }
 

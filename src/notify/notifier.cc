@@ -177,8 +177,32 @@ std::optional<VarBindList> BindingsFromTexts(const NotificationBindingTexts& tex
   return bindings;
 }
 
-// The manager's socket address and its numeric text; nothing when the host does not resolve.
-bool ResolveManager(const std::string& host, std::uint16_t port, NotificationTarget* target) {
+std::optional<SnmpPdu> BuildPdu(const NotificationRequest& request, VarBindList bindings,
+                                const AgentSession& device, NotifyResult* failure) {
+  std::uint32_t upTime = UptimeSince(device.agentInfo->startTime, true);
+  if (request.pduType == kTrapV1) {
+    std::optional<Oid> enterprise = OidFromText(request.enterprise);
+    if (!enterprise) {
+      LOG_ERROR("The enterprise OID %s is not valid\n", request.enterprise.c_str());
+      *failure = NotifyResult::kBadBinding;
+      return std::nullopt;
+    }
+    return BuildV1Trap(*enterprise, AgentAddressOf(device.transport.localAddress),
+                       request.genericTrap, request.specificTrap, upTime, std::move(bindings));
+  }
+  std::optional<Oid> trapOid = OidFromText(request.trapOid);
+  if (!trapOid) {
+    LOG_ERROR("The snmpTrapOID %s is not valid\n", request.trapOid.c_str());
+    *failure = NotifyResult::kBadBinding;
+    return std::nullopt;
+  }
+  return BuildV2Notification(request.pduType, upTime, *trapOid, std::move(bindings));
+}
+
+}  // namespace
+
+bool ResolveNotificationTarget(const std::string& host, std::uint16_t port,
+                               NotificationTarget* target) {
   PeerSocketAddress address{};
   if (host.find(':') != std::string::npos) {
     std::string bare = host.size() > 2 && host.front() == '[' && host.back() == ']'
@@ -206,30 +230,8 @@ bool ResolveManager(const std::string& host, std::uint16_t port, NotificationTar
   return true;
 }
 
-std::optional<SnmpPdu> BuildPdu(const NotificationRequest& request, VarBindList bindings,
-                                const AgentSession& device, NotifyResult* failure) {
-  std::uint32_t upTime = UptimeSince(device.agentInfo->startTime, true);
-  if (request.pduType == kTrapV1) {
-    std::optional<Oid> enterprise = OidFromText(request.enterprise);
-    if (!enterprise) {
-      LOG_ERROR("The enterprise OID %s is not valid\n", request.enterprise.c_str());
-      *failure = NotifyResult::kBadBinding;
-      return std::nullopt;
-    }
-    return BuildV1Trap(*enterprise, AgentAddressOf(device.transport.localAddress),
-                       request.genericTrap, request.specificTrap, upTime, std::move(bindings));
-  }
-  std::optional<Oid> trapOid = OidFromText(request.trapOid);
-  if (!trapOid) {
-    LOG_ERROR("The snmpTrapOID %s is not valid\n", request.trapOid.c_str());
-    *failure = NotifyResult::kBadBinding;
-    return std::nullopt;
-  }
-  return BuildV2Notification(request.pduType, upTime, *trapOid, std::move(bindings));
-}
-
-NotifyOutcome Deliver(const SnmpPdu& built, const NotificationTarget& target,
-                      const AgentSession& device) {
+NotifyOutcome DeliverNotification(const SnmpPdu& built, const NotificationTarget& target,
+                                  const AgentSession& device) {
   std::optional<SnmpPdu> pdu =
       NotificationForVersion(built, target.version, AgentAddressOf(device.transport.localAddress));
   if (!pdu) {
@@ -265,8 +267,6 @@ NotifyOutcome Deliver(const SnmpPdu& built, const NotificationTarget& target,
   return {added.sent ? NotifyResult::kSent : NotifyResult::kNotSent, added.informId};
 }
 
-}  // namespace
-
 NotifyOutcome SendNotification(const NotificationRequest& request) {
   NotifyResult failure = NotifyResult::kSent;
   std::optional<VarBindList> bindings = BindingsFromTexts(request.bindings, &failure);
@@ -278,8 +278,8 @@ NotifyOutcome SendNotification(const NotificationRequest& request) {
   target.contextName = request.contextName;
   target.timeout = request.timeout;
   target.retries = request.retries;
-  if (!ResolveManager(request.managerHost, static_cast<std::uint16_t>(request.managerPort),
-                      &target)) {
+  if (!ResolveNotificationTarget(request.managerHost,
+                                 static_cast<std::uint16_t>(request.managerPort), &target)) {
     LOG_ERROR("Unable to resolve host : %s\n", request.managerHost.c_str());
     LOG_ERROR("Hence trap cannot be sent ..... \n");
     return {NotifyResult::kUnresolved};
@@ -291,7 +291,7 @@ NotifyOutcome SendNotification(const NotificationRequest& request) {
   }
   std::optional<SnmpPdu> pdu = BuildPdu(request, std::move(*bindings), *device, &failure);
   if (!pdu) return {failure};
-  return Deliver(*pdu, target, *device);
+  return DeliverNotification(*pdu, target, *device);
 }
 
 bool AcknowledgeInform(InformList& informs, const SnmpPdu& pdu, const AgentSession& agent) {

@@ -64,6 +64,13 @@ struct NotifyOutcome {
 
 NotifyOutcome SendNotification(const NotificationRequest& request);
 
+// The manager's socket address and its numeric text in target; false when host does not resolve.
+bool ResolveNotificationTarget(const std::string& host, std::uint16_t port,
+                               NotificationTarget* target);
+// Sends a built notification from device to one resolved manager, in the manager's version.
+NotifyOutcome DeliverNotification(const SnmpPdu& pdu, const NotificationTarget& target,
+                                  const AgentSession& device);
+
 // Starts the inform timer and takes the Responses that reach agents.
 void InitNotifications();
 // Stops the inform timer and forgets every pending inform.

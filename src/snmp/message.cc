@@ -6,6 +6,8 @@
 
 #include "engine/engine_state.h"
 #include "engine/log.h"
+#include "notify/standard_traps.h"
+#include "notify/trap_pdu.h"
 #include "snmp/ber.h"
 #include "snmp/pdu_codec.h"
 #include "snmp/statistics.h"
@@ -112,7 +114,10 @@ int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const 
     ResponseReceiver receiver = responseReceiver.load();
     return receiver != nullptr && receiver(*pdu, agent) ? kMessageConsumed : kMessageDrop;
   }
-  if (!IsValidAuthentication(*pdu, *agent.agentInfo)) return kMessageDrop;
+  if (!IsValidAuthentication(*pdu, *agent.agentInfo)) {
+    RaiseStandardTrap(agent, kAuthenticationFailure);
+    return kMessageDrop;
+  }
   switch (ProcessRequestPdu(pdu, agent, nullptr)) {
     case RequestOutcome::kEchoInform:
       return AnswerInform(message, length, layout, reply, replyLength);

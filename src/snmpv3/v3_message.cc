@@ -10,6 +10,8 @@
 
 #include "engine/engine_state.h"
 #include "engine/log.h"
+#include "notify/standard_traps.h"
+#include "notify/trap_pdu.h"
 #include "snmp/ber.h"
 #include "snmp/message.h"
 #include "snmp/pdu_codec.h"
@@ -666,6 +668,10 @@ int ProcessSnmpV3Message(const std::uint8_t* message, std::size_t length, std::u
   request.agentBoots = agent.agentInfo ? agent.agentInfo->engineBoots.load() : 0;
   request.agentTime = AgentEngineTime(agent);
   Check check = CheckSecurity(request);
+  // Discovery and time synchronisation are part of the protocol; only a wrong digest is a
+  // failed authentication.
+  if (check.verdict == Verdict::kReport && check.error.counter == kWrongDigest.counter)
+    RaiseStandardTrap(agent, kAuthenticationFailure);
   if (check.verdict == Verdict::kReport)
     return SendReport(request, check.error, reply, replyLength);
   if (check.verdict == Verdict::kDrop) return kMessageDrop;

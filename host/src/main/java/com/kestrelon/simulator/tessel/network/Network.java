@@ -16,11 +16,38 @@ import java.util.regex.Pattern;
  * @param admin where the control interface listens; empty when it is off
  * @param stateDir the folder a run keeps state in for the next run
  * @param groups the device groups in file order; their address ranges do not overlap
+ * @param trapSinks the managers that receive the standard traps of every device
  */
-public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group> groups) {
+public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group> groups, List<TrapSink> trapSinks) {
 
   public Network {
     groups = List.copyOf(groups);
+    trapSinks = List.copyOf(trapSinks);
+  }
+
+  /** A network without trap sinks. */
+  public Network(Log log, Optional<Admin> admin, Path stateDir, List<Group> groups) {
+    this(log, admin, stateDir, groups, List.of());
+  }
+
+  /**
+   * A manager that receives the standard traps (coldStart, authenticationFailure) of devices, in
+   * its own version: SNMPv1 and SNMPv2c with a community, SNMPv3 as a user of the devices' SNMPv3
+   * configuration in a context. An inform sink waits {@code timeout} seconds for each answer and
+   * sends {@code retries} more times.
+   */
+  public record TrapSink(String version, String address, int port, String community, String user,
+      String context, boolean inform, int timeout, int retries) {
+    public static final List<String> VERSIONS = List.of("v1", "v2c", "v3");
+
+    /** The engine's number for the version: 0, 1 or 3. */
+    public int versionNumber() {
+      return switch (version) {
+        case "v1" -> 0;
+        case "v2c" -> 1;
+        default -> 3;
+      };
+    }
   }
 
   /** The total number of devices. */
@@ -64,8 +91,19 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
    * @param deviceName the name template: {@code {n}} stands for the 1-based number of the device
    *     in the group, {@code {address}} for its address
    * @param snmp the group's SNMP agents; empty when the group serves no SNMP
+   * @param trapSinks the managers that receive its devices' standard traps, besides the network's
    */
-  public record Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp) {
+  public record Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
+      List<TrapSink> trapSinks) {
+
+    public Group {
+      trapSinks = List.copyOf(trapSinks);
+    }
+
+    /** A group without trap sinks of its own. */
+    public Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp) {
+      this(name, count, firstAddress, deviceName, snmp, List.of());
+    }
 
     public long lastAddress() {
       return firstAddress + count - 1;

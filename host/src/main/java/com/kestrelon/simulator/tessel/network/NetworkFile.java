@@ -5,6 +5,7 @@ import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.Network.TrapSink;
 import java.io.IOException;
 import java.io.Reader;
 import java.nio.ByteBuffer;
@@ -39,10 +40,12 @@ import org.yaml.snakeyaml.nodes.Tag;
 public final class NetworkFile {
   private static final List<String> NETWORK_KEYS = List.of("log", "admin", "state-dir", "trap-sinks", "groups");
   private static final List<String> GROUP_KEYS =
-      List.of("name", "count", "address", "device-name", "snmp", "tl1", "cli");
+      List.of("name", "count", "address", "device-name", "snmp", "trap-sinks", "notifications", "tl1", "cli");
+  private static final List<String> SINK_KEYS =
+      List.of("version", "address", "port", "community", "user", "context", "kind", "timeout", "retries");
   private static final List<String> SNMP_KEYS = List.of("port", "data", "v3", "read-community", "write-community");
   /** Protocol sections whose devices the host cannot serve yet. */
-  private static final List<String> LATER_PROTOCOLS = List.of("tl1", "cli");
+  private static final List<String> LATER_PROTOCOLS = List.of("notifications", "tl1", "cli");
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
 
   private final String name;
@@ -66,15 +69,7 @@ public final class NetworkFile {
   private Network network(Path file) throws NetworkFileException {
     Node root = compose(file);
     Map<String, NodeTuple> keys = mapping(root, "the network", NETWORK_KEYS);
-    if (keys.containsKey("trap-sinks")) {
-      NodeTuple sinks = keys.get("trap-sinks");
-      if (!(sinks.getValueNode() instanceof SequenceNode list)) {
-        throw fault(sinks, "trap-sinks takes a list");
-      }
-      if (!list.getValue().isEmpty()) {
-        throw fault(sinks, "trap-sinks is not available yet");
-      }
-    }
+    List<TrapSink> trapSinks = trapSinks(keys.get("trap-sinks"));
     Log log = log(keys.get("log"));
     Optional<Admin> admin =
         keys.containsKey("admin") ? admin(keys.get("admin")) : Optional.of(new Admin("127.0.0.1", 8161));
@@ -87,7 +82,7 @@ public final class NetworkFile {
     for (Node group : list.getValue()) {
       groups.add(group(group));
     }
-    return new Network(log, admin, stateDir, groups);
+    return new Network(log, admin, stateDir, groups, trapSinks);
   }
 
   private Node compose(Path file) throws NetworkFileException {
@@ -161,7 +156,63 @@ public final class NetworkFile {
     if (snmp.isEmpty()) {
       throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp)");
     }
-    return new Group(groupName, count, first, deviceName, snmp);
+    return new Group(groupName, count, first, deviceName, snmp, trapSinks(keys.get("trap-sinks")));
+  }
+
+  /** A {@code trap-sinks} list; none when the key is absent. */
+  private List<TrapSink> trapSinks(NodeTuple entry) throws NetworkFileException {
+    if (entry == null) {
+      return List.of();
+    }
+    if (!(entry.getValueNode() instanceof SequenceNode list)) {
+      throw fault(entry, "trap-sinks takes a list of sinks");
+    }
+    List<TrapSink> sinks = new ArrayList<>();
+    for (Node sink : list.getValue()) {
+      sinks.add(trapSink(sink));
+    }
+    return sinks;
+  }
+
+  private TrapSink trapSink(Node node) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(node, "a trap sink", SINK_KEYS);
+    NodeTuple versionEntry = required(keys, "version", node, "a trap sink");
+    String version = text(versionEntry);
+    if (!TrapSink.VERSIONS.contains(version)) {
+      throw fault(versionEntry, "version takes v1, v2c or v3, not '" + version + "'");
+    }
+    String address = text(required(keys, "address", node, "a trap sink"));
+    int port = keys.containsKey("port") ? number(keys.get("port"), 1, 65535) : 162;
+    String kind = keys.containsKey("kind") ? text(keys.get("kind")) : "trap";
+    if (!kind.equals("trap") && !kind.equals("inform")) {
+      throw fault(keys.get("kind"), "kind takes trap or inform, not '" + kind + "'");
+    }
+    if (kind.equals("inform") && version.equals("v1")) {
+      throw fault(keys.get("kind"), "SNMPv1 has no inform: a v1 sink takes kind trap");
+    }
+    boolean v3 = version.equals("v3");
+    String credential = v3 ? "user" : "community";
+    String other = v3 ? "community" : "user";
+    if (keys.containsKey(other) || (!v3 && keys.containsKey("context"))) {
+      NodeTuple wrong = keys.containsKey(other) ? keys.get(other) : keys.get("context");
+      throw fault(wrong, "a " + version + " sink takes " + (v3 ? "user and context" : "community") + ", not "
+          + key(wrong));
+    }
+    if (v3 && !keys.containsKey("user")) {
+      throw fault(node, "a v3 sink needs 'user'");
+    }
+    String secret = keys.containsKey(credential) ? text(keys.get(credential)) : "public";
+    String context = keys.containsKey("context") ? contextName(keys.get("context")) : "";
+    int timeout = keys.containsKey("timeout") ? number(keys.get("timeout"), 1, 3600) : 5;
+    int retries = keys.containsKey("retries") ? number(keys.get("retries"), 0, 100) : 0;
+    return new TrapSink(version, address, port, v3 ? "" : secret, v3 ? secret : "", context,
+        kind.equals("inform"), timeout, retries);
+  }
+
+  /** A context may be named "" (the default context). */
+  private static String contextName(NodeTuple entry) {
+    return entry.getValueNode() instanceof ScalarNode scalar && !scalar.getTag().equals(Tag.NULL)
+        ? scalar.getValue() : "";
   }
 
   private Snmp snmp(NodeTuple entry, String group) throws NetworkFileException {

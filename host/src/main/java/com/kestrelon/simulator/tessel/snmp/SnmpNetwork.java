@@ -9,9 +9,11 @@ import com.kestrelon.simulator.tessel.data.MibLayout;
 import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.Network.TrapSink;
 import java.io.IOException;
 import java.nio.file.NoSuchFileException;
 import java.nio.file.Path;
+import java.util.ArrayList;
 import java.util.Arrays;
 import java.util.LinkedHashMap;
 import java.util.List;
@@ -36,6 +38,7 @@ public final class SnmpNetwork implements ProtocolAgents {
   private final List<CellDefinition> cells;
   private final List<SnmpV3Config> snmpV3;
   private final SnmpHandler handler;
+  private final List<TrapSink> networkSinks;
 
   /** A data or SNMPv3 file that cannot be read: the file and why. */
   public static final class FileException extends Exception {
@@ -46,9 +49,10 @@ public final class SnmpNetwork implements ProtocolAgents {
     }
   }
 
-  private SnmpNetwork(List<Group> groups, Map<Path, DeviceData> data, List<SnmpV3Config> snmpV3)
-      throws DeviceDataException {
+  private SnmpNetwork(List<Group> groups, Map<Path, DeviceData> data, List<SnmpV3Config> snmpV3,
+      List<TrapSink> networkSinks) throws DeviceDataException {
     this.groups = groups;
+    this.networkSinks = networkSinks;
     this.snmpV3 = snmpV3;
     firstAgentIds = new int[groups.size()];
     stores = new DeviceStore[groups.size()];
@@ -82,7 +86,7 @@ public final class SnmpNetwork implements ProtocolAgents {
         snmpV3.put(v3.get(), read(v3.get(), () -> SnmpV3Config.load(v3.get())));
       }
     }
-    return new SnmpNetwork(groups, data, List.copyOf(snmpV3.values()));
+    return new SnmpNetwork(groups, data, List.copyOf(snmpV3.values()), network.trapSinks());
   }
 
   private interface Reader<T> {
@@ -132,6 +136,37 @@ public final class SnmpNetwork implements ProtocolAgents {
           cell.subIds().toArray(String[]::new), cell.dataTypes().toArray(String[]::new),
           cell.accessTexts().toArray(String[]::new), cell.isTable(), cell.rowStatusColumn(), null)) {
         return Optional.of("the engine refused the objects registered at " + cell.oid());
+      }
+    }
+    return registerTrapSinks();
+  }
+
+  /** Each group's devices send their standard traps to the network's sinks and the group's own. */
+  private Optional<String> registerTrapSinks() {
+    SnmpTrapService engine = null;
+    for (int g = 0; g < groups.size(); g++) {
+      List<TrapSink> sinks = new ArrayList<>(networkSinks);
+      sinks.addAll(groups.get(g).trapSinks());
+      if (sinks.isEmpty()) {
+        continue;
+      }
+      engine = engine == null ? new SnmpTrapService() : engine;
+      int refused = engine.setTrapSinks(firstAgentIds[g], groups.get(g).count(),
+          sinks.stream().mapToInt(TrapSink::versionNumber).toArray(),
+          sinks.stream().map(TrapSink::address).toArray(String[]::new),
+          sinks.stream().mapToInt(TrapSink::port).toArray(),
+          sinks.stream().map(TrapSink::community).toArray(String[]::new),
+          sinks.stream().map(TrapSink::user).toArray(String[]::new),
+          sinks.stream().map(TrapSink::context).toArray(String[]::new),
+          sinks.stream().mapToInt(sink -> sink.inform() ? 1 : 0).toArray(),
+          sinks.stream().mapToInt(TrapSink::timeout).toArray(),
+          sinks.stream().mapToInt(TrapSink::retries).toArray());
+      if (refused >= 0) {
+        return Optional.of("trap sink " + sinks.get(refused).address() + " of group " + groups.get(g).name()
+            + " does not resolve");
+      }
+      if (refused != -1) {
+        return Optional.of("the engine refused the trap sinks of group " + groups.get(g).name());
       }
     }
     return Optional.empty();

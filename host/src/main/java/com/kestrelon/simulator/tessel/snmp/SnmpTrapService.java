@@ -47,4 +47,16 @@ public class SnmpTrapService {
       int managerPort, String community, String userName, String contextName, String enterprise,
       int genericTrap, int specificTrap, String trapOid, String[] oids, int[] types,
       String[] values, int agentId, String agentText, int timeout, int retries);
+
+  /**
+   * The trap sinks of the devices with agent ids [firstAgentId, firstAgentId + count), replacing
+   * those given before for the same first id; give them before the devices start, whose coldStart
+   * goes to them. One element per sink in every array: version 0 (SNMPv1), 1 (SNMPv2c) or 3
+   * (SNMPv3), host and port, community (SNMPv1, SNMPv2c), user and context (SNMPv3), inform 1 for
+   * an inform sink, its timeout in seconds and retries. Returns -1 when set, the index of the first
+   * sink whose host does not resolve, or -2 when the arrays differ in length.
+   */
+  public native int setTrapSinks(int firstAgentId, int count, int[] versions, String[] hosts,
+      int[] ports, String[] communities, String[] users, String[] contexts, int[] informs,
+      int[] timeouts, int[] retries);
 }

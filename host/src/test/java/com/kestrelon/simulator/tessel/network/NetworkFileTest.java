@@ -8,6 +8,7 @@ import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.Network.TrapSink;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.List;
@@ -72,10 +73,32 @@ class NetworkFileTest {
             "6: tl1 is not available yet"),
         fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    cli: {port: 2323}\n",
             "6: cli is not available yet"),
-        fault("trap-sinks: [127.0.0.1:162]\n", "3: trap-sinks is not available yet"),
+        fault("trap-sinks: [127.0.0.1:162]\n", "3: a trap sink takes a mapping of version"),
+        fault("trap-sinks:\n  - {version: v4, address: h}\n", "4: version takes v1, v2c or v3, not 'v4'"),
+        fault("trap-sinks:\n  - {version: v2c, address: h, kind: note}\n", "4: kind takes trap or inform"),
+        fault("trap-sinks:\n  - {version: v1, address: h, kind: inform}\n", "4: SNMPv1 has no inform"),
+        fault("trap-sinks:\n  - {version: v3, address: h}\n", "4: a v3 sink needs 'user'"),
+        fault("trap-sinks:\n  - {version: v3, address: h, user: u, community: c}\n",
+            "4: a v3 sink takes user and context, not community"),
+        fault("trap-sinks:\n  - {version: v2c, address: h, user: u}\n", "4: a v2c sink takes community, not user"),
+        fault("trap-sinks:\n  - {version: v2c, address: h, port: 65536}\n", "4: port takes a whole number from 1 to 65535"),
+        fault("trap-sinks:\n  - {version: v2c, adress: h}\n", "4: unknown key 'adress' in a trap sink"),
+        fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec},\n     trap-sinks: [{version: v2c}]}\n",
+            "4: a trap sink needs 'address'"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    notifications: []\n",
+            "6: notifications is not available yet"),
         fault("log: {level: 4}\n", "3: level takes a whole number from 0 to 3"),
         fault("admin: {listen: 127.0.0.1}\n", "3: listen takes HOST:PORT"),
         fault("state-dir: [a\n", "4: "));
+  }
+
+  @Test
+  void readsTrapSinksOfTheNetworkAndOfAGroup() throws Exception {
+    Path file = write(FIRST_GROUP.replace("d.snmprec}}", "d.snmprec},\n     trap-sinks: [{version: v3, address: h, user: u}]}")
+        + "trap-sinks:\n  - {version: v2c, address: 127.0.0.1, port: 1162, kind: inform, timeout: 2, retries: 1}\n");
+    Network network = NetworkFile.read(file);
+    assertEquals(List.of(new TrapSink("v2c", "127.0.0.1", 1162, "public", "", "", true, 2, 1)), network.trapSinks());
+    assertEquals(List.of(new TrapSink("v3", "h", 162, "", "u", "", false, 5, 0)), network.groups().get(0).trapSinks());
   }
 
   private static Arguments fault(String rest, String expected) {
