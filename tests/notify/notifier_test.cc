@@ -9,10 +9,12 @@
 #include <thread>
 
 #include "engine/agent_registry.h"
+#include "notify/standard_traps.h"
 #include "notify/trap_pdu.h"
 #include "snmp/message.h"
 #include "snmp/service.h"
 #include "snmpv3/engine_id.h"
+#include "snmpv3/usm_crypto.h"
 #include "snmpv3/usm_users.h"
 #include "snmpv3/v3_config.h"
 #include "snmpv3/v3_message.h"
@@ -56,9 +58,10 @@ class ManagerSocket {
     return std::make_pair(datagram,
                           std::string(text) + ":" + std::to_string(ntohs(source.sin_port)));
   }
-  void SendToDevice(const std::vector<std::uint8_t>& datagram, std::uint16_t port = kDevicePort) {
+  void SendToDevice(const std::vector<std::uint8_t>& datagram, std::uint16_t port = kDevicePort,
+                    const std::string& device = kDevice) {
     sockaddr_in to{AF_INET, htons(port), {}, {}};
-    inet_pton(AF_INET, kDevice.c_str(), &to.sin_addr);
+    inet_pton(AF_INET, device.c_str(), &to.sin_addr);
     sendto(socket_, datagram.data(), datagram.size(), 0, reinterpret_cast<sockaddr*>(&to),
            sizeof to);
   }
@@ -301,6 +304,93 @@ TEST_F(NotifierTest, V3TrapsNameTheDeviceAndKeepToTheNotifyView) {
   for (const NotificationRequest& refused : {excludedTrap, outsideBinding, stranger, otherContext})
     EXPECT_EQ(SendNotification(refused).result, NotifyResult::kRefused);
   EXPECT_FALSE(manager_.Receive(200));
+}
+
+// A device with a v1 and a v2c sink: its start raises one coldStart to each, in each one's form;
+// a request with an unknown community one authenticationFailure to each; so does an SNMPv3
+// request with a wrong digest, but engine discovery raises nothing.
+TEST_F(NotifierTest, StandardTrapsReachEverySinkOfTheDeviceInItsVersion) {
+  ManagerSocket v1Sink, v2Sink;
+  const std::string sinked = "127.78.1.2";
+  auto sink = [](std::int32_t version, const char* host, std::uint16_t port,
+                 const char* community) {
+    TrapSinkConfig config;
+    config.version = version;
+    config.host = host;
+    config.port = port;
+    config.community = community;
+    return config;
+  };
+  std::vector<TrapSinkConfig> sinks = {sink(kSnmpV1, "127.0.0.1", v1Sink.Port(), "v1c"),
+                                       sink(kSnmpV2c, "localhost", v2Sink.Port(), "v2c")};
+  EXPECT_EQ(SetTrapSinks(kAgentId + 1, 1, {sinks[0], sink(kSnmpV2c, "1:::2", 162, "")}), 1);
+  ASSERT_EQ(SetTrapSinks(kAgentId + 1, 1, sinks), -1);
+  ASSERT_GT(
+      FillAgentInfoAndStartAgent({kAgentId + 1, sinked, kDevicePort, {"public"}, {}, 0, "", "", 0}),
+      0);
+  const std::vector<std::uint8_t> sinkedAddress = {0x40, 4, 127, 78, 1, 2};
+  const std::vector<std::uint8_t> enterpriseSnmpTraps = {6, 8, 0x2B, 6, 1, 6, 3, 1, 1, 5};
+  auto expectV1 = [&](std::uint8_t generic) {
+    auto trap = v1Sink.Receive();
+    ASSERT_TRUE(trap);
+    EXPECT_EQ(trap->second, sinked + ":" + std::to_string(kDevicePort));
+    EXPECT_EQ(trap->first.at(PduOffset(trap->first)), kTrapV1);
+    EXPECT_TRUE(Contains(trap->first, {4, 3, 'v', '1', 'c'}));
+    EXPECT_TRUE(Contains(trap->first, enterpriseSnmpTraps));
+    EXPECT_TRUE(Contains(trap->first, sinkedAddress));
+    EXPECT_TRUE(Contains(trap->first, {2, 1, generic, 2, 1, 0, 0x43}));
+  };
+  auto expectV2 = [&](std::uint8_t trapOidLast) {
+    auto trap = v2Sink.Receive();
+    ASSERT_TRUE(trap);
+    EXPECT_EQ(trap->second, sinked + ":" + std::to_string(kDevicePort));
+    EXPECT_EQ(trap->first.at(PduOffset(trap->first)), kTrapV2);
+    EXPECT_TRUE(Contains(trap->first, {6, 9, 0x2B, 6, 1, 6, 3, 1, 1, 5, trapOidLast}));
+  };
+  expectV1(kColdStart);
+  expectV2(1);
+
+  tessel::Request badCommunity;
+  badCommunity.community = "guess";
+  badCommunity.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue{}}};
+  v1Sink.SendToDevice(EncodeRequest(badCommunity), kDevicePort, sinked);
+  expectV1(kAuthenticationFailure);
+  expectV2(5);
+
+  AddNotifiedUser("signer", "MD5_AUTH", "signerpass1", kAuthNoPriv, {{"1.3", kVacmViewIncluded}});
+  SnmpPdu get;
+  get.type = kGetRequest;
+  get.requestId = 7;
+  std::vector<std::uint8_t> pdu = EncodeNotificationPdu(get);
+  auto v3Message = [&](const V3Envelope& envelope) {
+    std::vector<std::uint8_t> message(kMaxSnmpMessage);
+    std::size_t length = message.size();
+    EXPECT_TRUE(EncodeV3Message(envelope, pdu.data(), pdu.size(), message.data(), &length));
+    message.resize(length);
+    return message;
+  };
+  V3Envelope discovery;
+  discovery.msgId = 1;
+  discovery.msgMaxSize = 1500;
+  discovery.reportable = true;
+  ManagerSocket manager;
+  manager.SendToDevice(v3Message(discovery), kDevicePort, sinked);
+  ASSERT_TRUE(manager.Receive());  // the Report that tells the engine ID
+  EXPECT_FALSE(v1Sink.Receive(200));
+  EXPECT_FALSE(v2Sink.Receive(0));
+
+  V3Envelope forged = discovery;
+  forged.level = kAuthNoPriv;
+  forged.engineId = AgentEngineId(*FindAgentSession(sinked, kDevicePort));
+  forged.userName = "signer";
+  forged.auth = AuthProtocol::kMd5;
+  forged.authKey = GetLocalKeyValue("not-the-password", forged.auth, forged.engineId);
+  manager.SendToDevice(v3Message(forged), kDevicePort, sinked);
+  expectV1(kAuthenticationFailure);
+  expectV2(5);
+  EXPECT_FALSE(v1Sink.Receive(200));
+  EXPECT_FALSE(v2Sink.Receive(0));
+  ClearTrapSinks();
 }
 
 }  // namespace
