@@ -71,11 +71,12 @@ class FileNetwork:
 
     SUMMARY = re.compile(r"^\d+ devices running: ")
 
-    def __init__(self, groups, admin_port, token=None):
+    def __init__(self, groups, admin_port, token=None, top=""):
         self.workdir = Path(tempfile.mkdtemp(prefix="tessel-net-"))
         self.admin = f"http://127.0.0.1:{admin_port}"
         path = self.workdir / "network.yaml"
         path.write_text(f"log: {{level: 0, file: tessel.log}}\nstate-dir: {self.workdir / 'state'}\n"
+                        f"{textwrap.dedent(top).strip()}\n"
                         f"groups:\n{textwrap.indent(textwrap.dedent(groups).strip(), '  ')}\n")
         self.token, self.token_file = token, self.workdir / "token"
         access = ("--admin", f"127.0.0.1:{admin_port}")

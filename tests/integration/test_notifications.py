@@ -11,7 +11,7 @@ from pathlib import Path
 
 import pytest
 
-from conftest import BASE_PORT, BUILD, JAVA, PROFILE, ROOT, FileNetwork
+from conftest import BASE_PORT, BUILD, JAVA, PROFILE, ROOT, FileNetwork, snmp
 
 DEVICE = "127.0.3.60"
 DEVICE_PORT = BASE_PORT + 5
@@ -230,3 +230,48 @@ def test_ctl_inform_nobody_answers_ends_dropped_after_each_send(network, silent)
     informs = network.api("/api/informs")["informs"]
     assert informs[-1] == {"id": informs[-1]["id"], "state": "dropped", "sends": 2, "device": NETWORK_DEVICE,
                            "manager": f"127.0.0.1:{SILENT_PORT}"}
+
+
+SINKED = ["127.0.3.80", "127.0.3.81"]
+
+
+def test_standard_traps_reach_the_network_and_group_sinks_each_in_its_version(trapd):
+    """A v1 sink for the whole network and a v2c sink of the group: each device's coldStart, an
+    authenticationFailure for a wrong community, and a coldStart again after a restart."""
+    before = len(trapd(0, wait=0))
+    net = FileNetwork(f"""
+        - name: sinked
+          count: 2
+          address: {SINKED[0]}
+          snmp: {{port: {NETWORK_PORT}, data: {PROFILE}}}
+          trap-sinks: [{{version: v2c, address: 127.0.0.1, port: {TRAPD_PORT}}}]
+        """, BASE_PORT + 7, top=f"trap-sinks: [{{version: v1, address: localhost, port: {TRAPD_PORT}}}]")
+
+    def arrived(count, since):
+        """Rows since..count of this test, in order of source and version."""
+        rows = trapd(before + count)[before:]
+        assert len(rows) == count, rows
+        return sorted(rows[since:], key=lambda row: (source(row), row[5]))
+
+    def expect(rows, devices, generic):
+        """Per device a v1 Trap and an SNMPv2-Trap of the standard trap generic, from the device."""
+        assert len(rows) == 2 * len(devices)
+        for device, (v1, v2) in zip(devices, zip(rows[0::2], rows[1::2])):
+            assert source(v1) == source(v2) == f"{device}:{NETWORK_PORT}"
+            assert v1[1:6] == [device, ".1.3.6.1.6.3.1.1.5", str(generic), "0", "TRAP, SNMP v1, community public"]
+            assert v2[5] == "TRAP2, SNMP v2c, community public"
+            assert v2[6].split("\t")[1] == f".1.3.6.1.6.3.1.1.4.1.0 = OID: .1.3.6.1.6.3.1.1.5.{generic + 1}"
+
+    try:
+        expect(arrived(4, 0), SINKED, 0)
+        snmp("snmpget", "-v2c", "-c", "guess", "-t", "1", "-r", "0", f"{SINKED[1]}:{NETWORK_PORT}",
+             "1.3.6.1.2.1.1.5.0", check=False)
+        expect(arrived(6, 4), SINKED[1:], 4)
+        status = subprocess.run([str(ROOT / "tessel"), "ctl", "--admin", net.admin, "restart", SINKED[0]],
+                                capture_output=True, text=True, timeout=120)
+        assert status.returncode == 0, status.stderr
+        expect(arrived(8, 6), SINKED[:1], 0)
+        time.sleep(0.5)
+        assert len(trapd(0, wait=0)) == before + 8, "one of each, no more"
+    finally:
+        assert net.stop() == 0

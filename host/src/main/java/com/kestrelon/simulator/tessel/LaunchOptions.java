@@ -176,7 +176,8 @@ public final class LaunchOptions {
         throw new UsageException("--admin takes " + Admin.expected() + ", not '" + admin + "'");
       }
     }
-    return new Network(log, listen, stateDir == null ? network.stateDir() : stateDir, network.groups());
+    return new Network(log, listen, stateDir == null ? network.stateDir() : stateDir, network.groups(),
+        network.trapSinks());
   }
 
   private static int number(String name, int value, int low, int high) throws UsageException {
