@@ -9,6 +9,7 @@
 #include "engine/engine_state.h"
 #include "engine/log.h"
 #include "notify/notifier.h"
+#include "notify/standard_traps.h"
 #include "snmp/handlers.h"
 #include "snmp/mib_tree.h"
 #include "snmp/service.h"
@@ -103,6 +104,7 @@ bool InitAgentParams(const EngineParams& params) {
 void InitAgentRegistry() {
   LOG_TRACE("\n\t@@@@@ Inside jniJVMparams() @@@@@ \n");
   FreeSimulatorResources();
+  ClearTrapSinks();  // the host gives a new network's sinks after this
   // SNMPv3 rows may arrive before the service starts; they are kept under this engine ID.
   ReadFromSnmpV3ConfFile();
 }

@@ -321,8 +321,12 @@ TEST_F(NotifierTest, StandardTrapsReachEverySinkOfTheDeviceInItsVersion) {
     config.community = community;
     return config;
   };
+  ManagerSocket informSink;
   std::vector<TrapSinkConfig> sinks = {sink(kSnmpV1, "127.0.0.1", v1Sink.Port(), "v1c"),
-                                       sink(kSnmpV2c, "localhost", v2Sink.Port(), "v2c")};
+                                       sink(kSnmpV2c, "localhost", v2Sink.Port(), "v2c"),
+                                       sink(kSnmpV2c, "127.0.0.1", informSink.Port(), "v2c")};
+  sinks[2].inform = true;
+  sinks[2].timeout = 60;
   EXPECT_EQ(SetTrapSinks(kAgentId + 1, 1, {sinks[0], sink(kSnmpV2c, "1:::2", 162, "")}), 1);
   ASSERT_EQ(SetTrapSinks(kAgentId + 1, 1, sinks), -1);
   ASSERT_GT(
@@ -349,6 +353,13 @@ TEST_F(NotifierTest, StandardTrapsReachEverySinkOfTheDeviceInItsVersion) {
   };
   expectV1(kColdStart);
   expectV2(1);
+  auto inform = informSink.Receive();
+  ASSERT_TRUE(inform);
+  EXPECT_EQ(inform->first.at(PduOffset(inform->first)), kInformRequest);
+  EXPECT_TRUE(Contains(inform->first, {6, 9, 0x2B, 6, 1, 6, 3, 1, 1, 5, 1}));
+  EXPECT_EQ(PendingInforms(), 1u);
+  ClearTrapSinks();
+  ASSERT_EQ(SetTrapSinks(kAgentId + 1, 1, {sinks[0], sinks[1]}), -1);
 
   tessel::Request badCommunity;
   badCommunity.community = "guess";
