@@ -397,10 +397,24 @@ TEST_F(NotifierTest, StandardTrapsReachEverySinkOfTheDeviceInItsVersion) {
   forged.auth = AuthProtocol::kMd5;
   forged.authKey = GetLocalKeyValue("not-the-password", forged.auth, forged.engineId);
   manager.SendToDevice(v3Message(forged), kDevicePort, sinked);
+  ASSERT_TRUE(manager.Receive());  // the wrongDigest Report
   expectV1(kAuthenticationFailure);
   expectV2(5);
   EXPECT_FALSE(v1Sink.Receive(200));
   EXPECT_FALSE(v2Sink.Receive(0));
+
+  // A v3 sink gets the trap from the device's engine, as its user, at the user's level.
+  TrapSinkConfig v3Sink = sink(kSnmpV3, "127.0.0.1", manager.Port(), "");
+  v3Sink.userName = "signer";
+  ASSERT_EQ(SetTrapSinks(kAgentId + 1, 1, {v3Sink}), -1);
+  EXPECT_EQ(RaiseStandardTrap(*FindAgentSession(sinked, kDevicePort), kColdStart), 1u);
+  auto v3Trap = manager.Receive();
+  ASSERT_TRUE(v3Trap);
+  V3Received received;
+  ParseV3Message(v3Trap->first.data(), v3Trap->first.size(), nullptr, &received);
+  EXPECT_EQ(received.engineId, forged.engineId);
+  EXPECT_EQ(received.level, kAuthNoPriv);
+  EXPECT_EQ(received.userName, "signer");
   ClearTrapSinks();
 }
 
