@@ -52,6 +52,38 @@ struct InformReport {
   std::vector<std::string> values;
 };
 
+// A PDU as the host's scrambler sees it: its header fields, its bindings as texts (a value with no
+// text form is null), and the agent it passes through.
+struct ScrambleQuery {
+  std::int64_t version = 0;
+  std::string community;
+  std::vector<std::string> oids;
+  std::vector<std::optional<std::string>> values;
+  std::int64_t requestId = 0;
+  std::uint8_t pduType = 0;
+  std::int64_t errorStatus = 0;
+  std::int64_t errorIndex = 0;
+  std::string oidField;  // an SNMPv1 trap's enterprise without its last two sub-identifiers
+  std::int32_t timeout = 0;
+  std::int32_t retries = 0;
+  std::string agentAddress;
+  std::int32_t agentPort = 0;  // the configured port minus two
+  std::string managerAddress;
+  bool isResponse = false;  // the reply on its way out, rather than the PDU received
+};
+
+// The fields the host's scrambler replaces; what it leaves empty stays as it was.
+struct ScrambleChanges {
+  std::optional<std::int32_t> errorStatus;
+  std::optional<std::int32_t> errorIndex;
+  std::optional<std::int32_t> requestId;
+  std::optional<std::uint8_t> pduType;
+  std::optional<std::string> community;
+  std::optional<std::string> oidField;  // dotted
+  std::optional<std::int32_t> timeout;
+  std::optional<std::int32_t> retries;
+};
+
 // A host's answer: a String[] whose elements may be null, or null altogether.
 using HostAnswer = std::optional<std::vector<std::optional<std::string>>>;
 
@@ -74,6 +106,12 @@ class HostBridge {
   // that does not follow informs leaves them alone.
   virtual void LogResponseMessage(const InformReport& /*report*/) {}
   virtual void StoreDroppedInformMessage(const InformReport& /*report*/) {}
+
+  // The fields to replace in a PDU passing through an agent while scrambling is on; nothing
+  // leaves the PDU as it is. A host without a scrambler changes nothing.
+  virtual std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& /*query*/) {
+    return std::nullopt;
+  }
 };
 
 // The installed host, or nullptr. Installing is not synchronised with calls in flight: install

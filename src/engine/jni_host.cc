@@ -114,6 +114,53 @@ const JavaStrings* LoadJavaStrings(JNIEnv* env) {
   return loaded ? &strings : nullptr;
 }
 
+// What the engine reads of the Hashtable a scrambler returns. These classes never unload either.
+struct JavaTables {
+  jclass numberClass = nullptr;
+  jclass stringClass = nullptr;
+  jmethodID get = nullptr;              // Hashtable.get(Object)
+  jmethodID keys = nullptr;             // Hashtable.keys()
+  jmethodID hasMoreElements = nullptr;  // Enumeration.hasMoreElements()
+  jmethodID nextElement = nullptr;      // Enumeration.nextElement()
+  jmethodID intValue = nullptr;         // Number.intValue()
+  jmethodID byteValue = nullptr;        // Number.byteValue()
+};
+
+const JavaTables* LoadJavaTables(JNIEnv* env) {
+  static std::mutex mutex;
+  static JavaTables tables;
+  static bool loaded = false;
+  std::lock_guard<std::mutex> lock(mutex);
+  if (loaded) return &tables;
+  const JavaStrings* strings = LoadJavaStrings(env);
+  LocalFrame frame(env);
+  if (strings == nullptr || !frame.Pushed()) return nullptr;
+  jclass hashtable = env->FindClass("java/util/Hashtable");
+  jclass enumeration = hashtable ? env->FindClass("java/util/Enumeration") : nullptr;
+  jclass number = enumeration ? env->FindClass("java/lang/Number") : nullptr;
+  if (number == nullptr) {
+    env->ExceptionClear();
+    LOG_ERROR("unable to find class Hashtable, Enumeration or Number \n");
+    return nullptr;
+  }
+  JavaTables found;
+  found.stringClass = strings->stringClass;
+  found.get = LookUpMethod(env, hashtable, "get", "(Ljava/lang/Object;)Ljava/lang/Object;");
+  found.keys = LookUpMethod(env, hashtable, "keys", "()Ljava/util/Enumeration;");
+  found.hasMoreElements = LookUpMethod(env, enumeration, "hasMoreElements", "()Z");
+  found.nextElement = LookUpMethod(env, enumeration, "nextElement", "()Ljava/lang/Object;");
+  found.intValue = LookUpMethod(env, number, "intValue", "()I");
+  found.byteValue = LookUpMethod(env, number, "byteValue", "()B");
+  if (!found.get || !found.keys || !found.hasMoreElements || !found.nextElement ||
+      !found.intValue || !found.byteValue)
+    return nullptr;
+  found.numberClass = static_cast<jclass>(env->NewGlobalRef(number));
+  if (found.numberClass == nullptr) return nullptr;
+  tables = found;
+  loaded = true;
+  return &tables;
+}
+
 // Bytes 1..127 read the same in UTF-8 and in the JVM's modified UTF-8; every other byte must be
 // decoded by the JVM's own UTF-8 decoder. (char may be signed or not: compare the octet.)
 bool IsPlainAscii(const std::string& text) {
@@ -241,6 +288,12 @@ constexpr MethodName kInformMethods[kInformMethodCount] = {
      "String;[Ljava/lang/String;[Ljava/lang/String;)V"},
 };
 
+// The handler's scrambler: the PDU's header and bindings in, a Hashtable of replaced fields out.
+constexpr MethodName kScrambleMethod = {
+    "ScramblePDU",
+    "(JLjava/lang/String;[Ljava/lang/String;[Ljava/lang/String;JBJJLjava/lang/String;IILjava/lang/"
+    "String;ILjava/lang/String;Z)Ljava/util/Hashtable;"};
+
 // Status methods the handler must have although the engine does not call them.
 constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"},
                                          {"setProgressValue", "(I)V"}};
@@ -262,6 +315,7 @@ struct HandlerBinding {
   GlobalRef object;
   jmethodID methods[kValueMethodCount] = {};
   jmethodID informMethods[kInformMethodCount] = {};
+  jmethodID scramble = nullptr;
 };
 
 // The arguments of one value call, converted in the caller's local frame.
@@ -297,6 +351,31 @@ class JavaArguments {
   JavaArguments& Int(std::int32_t number) {
     jvalue value;
     value.i = number;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Long(std::int64_t number) {
+    jvalue value;
+    value.j = number;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Byte(std::uint8_t octet) {
+    jvalue value;
+    value.b = static_cast<jbyte>(octet);
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Bool(bool flag) {
+    jvalue value;
+    value.z = flag ? JNI_TRUE : JNI_FALSE;
+    values_.push_back(value);
+    return *this;
+  }
+  JavaArguments& Texts(const std::vector<std::optional<std::string>>& texts) {
+    jvalue value;
+    value.l = OptionalStringsToJava(env_, texts);
+    failed_ = failed_ || value.l == nullptr;
     values_.push_back(value);
     return *this;
   }
@@ -373,6 +452,25 @@ jclass JavaStringClass(JNIEnv* env) {
   return strings == nullptr ? nullptr : strings->stringClass;
 }
 
+jobjectArray OptionalStringsToJava(JNIEnv* env,
+                                   const std::vector<std::optional<std::string>>& texts) {
+  jclass stringClass = JavaStringClass(env);
+  if (stringClass == nullptr) return nullptr;
+  jobjectArray array = env->NewObjectArray(static_cast<jsize>(texts.size()), stringClass, nullptr);
+  if (array == nullptr) {
+    env->ExceptionClear();
+    return nullptr;
+  }
+  for (std::size_t i = 0; i < texts.size(); ++i) {
+    if (!texts[i]) continue;
+    jstring text = StringToJava(env, *texts[i]);
+    if (text == nullptr) return nullptr;
+    env->SetObjectArrayElement(array, static_cast<jsize>(i), text);
+    env->DeleteLocalRef(text);
+  }
+  return array;
+}
+
 jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size) {
   jclass stringClass = JavaStringClass(env);
   if (stringClass == nullptr) return nullptr;
@@ -434,6 +532,8 @@ bool JniHost::BindSnmpHandler(JNIEnv* env, jobject handler) {
         LookUpMethod(env, type, kInformMethods[i].name, kInformMethods[i].signature);
     if (binding->informMethods[i] == nullptr) return false;
   }
+  binding->scramble = LookUpMethod(env, type, kScrambleMethod.name, kScrambleMethod.signature);
+  if (binding->scramble == nullptr || LoadJavaTables(env) == nullptr) return false;
   for (const MethodName& method : kStatusMethods) {
     if (LookUpMethod(env, type, method.name, method.signature) == nullptr) return false;
   }
@@ -619,6 +719,102 @@ void JniHost::StoreDroppedInformMessage(const InformReport& report) {
     a.Text(report.managerAddress).Int(report.managerPort);
     a.Texts(report.oids).Texts(report.types).Texts(report.values);
   });
+}
+
+std::optional<ScrambleChanges> JniHost::ScramblePDU(const ScrambleQuery& query) {
+  std::shared_ptr<const HandlerBinding> handler = Handler();
+  if (!handler || handler->scramble == nullptr) return std::nullopt;
+  JNIEnv* env = AttachedEnv(handler->vm);
+  if (env == nullptr) return std::nullopt;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return std::nullopt;
+  try {
+    JavaArguments a(env);
+    a.Long(query.version).Text(query.community).Texts(query.oids).Texts(query.values);
+    a.Long(query.requestId).Byte(query.pduType).Long(query.errorStatus).Long(query.errorIndex);
+    a.Text(query.oidField).Int(query.timeout).Int(query.retries);
+    a.Constant(query.agentAddress).Int(query.agentPort).Text(query.managerAddress);
+    a.Bool(query.isResponse);
+    if (a.Failed()) return std::nullopt;
+    jobject table = env->CallObjectMethodA(handler->object.Get(), handler->scramble, a.Values());
+    if (ClearException(env, kScrambleMethod.name) || table == nullptr) return std::nullopt;
+    return ChangesFromJava(env, table);
+  } catch (const std::bad_alloc&) {
+    LOG_ERROR("unable to alloc memory \n");
+    return std::nullopt;
+  }
+}
+
+namespace {
+
+enum class ScrambleKey { kInt, kByte, kText, kOther };
+
+// How a scrambler key's value is read, and where it goes.
+ScrambleKey Place(const std::string& key, ScrambleChanges* changes,
+                  std::optional<std::int32_t>** number, std::optional<std::string>** text) {
+  struct IntKey {
+    const char* name;
+    std::optional<std::int32_t> ScrambleChanges::*field;
+  };
+  static constexpr IntKey kIntKeys[] = {{"errstat", &ScrambleChanges::errorStatus},
+                                        {"errindex", &ScrambleChanges::errorIndex},
+                                        {"reqid", &ScrambleChanges::requestId},
+                                        {"timeout", &ScrambleChanges::timeout},
+                                        {"retries", &ScrambleChanges::retries}};
+  for (const IntKey& intKey : kIntKeys) {
+    if (key == intKey.name) {
+      *number = &(changes->*intKey.field);
+      return ScrambleKey::kInt;
+    }
+  }
+  if (key == "command") return ScrambleKey::kByte;
+  if (key == "community") *text = &changes->community;
+  if (key == "oid") *text = &changes->oidField;
+  return *text != nullptr ? ScrambleKey::kText : ScrambleKey::kOther;
+}
+
+}  // namespace
+
+std::optional<ScrambleChanges> JniHost::ChangesFromJava(JNIEnv* env, jobject table) {
+  const JavaTables* tables = LoadJavaTables(env);
+  if (tables == nullptr) return std::nullopt;
+  jobject keys = env->CallObjectMethod(table, tables->keys);
+  if (ClearException(env, "keys") || keys == nullptr) return std::nullopt;
+  ScrambleChanges changes;
+  while (env->CallBooleanMethod(keys, tables->hasMoreElements)) {
+    if (ClearException(env, "hasMoreElements")) return std::nullopt;
+    jobject key = env->CallObjectMethod(keys, tables->nextElement);
+    if (ClearException(env, "nextElement")) return std::nullopt;
+    if (key == nullptr || !env->IsInstanceOf(key, tables->stringClass)) return std::nullopt;
+    std::optional<std::string> name = ToCpp(env, static_cast<jstring>(key));
+    jobject value = env->CallObjectMethod(table, tables->get, key);
+    env->DeleteLocalRef(key);
+    if (ClearException(env, "get") || !name || value == nullptr) return std::nullopt;
+    std::optional<std::int32_t>* number = nullptr;
+    std::optional<std::string>* text = nullptr;
+    ScrambleKey kind = Place(*name, &changes, &number, &text);
+    bool isNumber = env->IsInstanceOf(value, tables->numberClass);
+    bool read = true;
+    if (kind == ScrambleKey::kInt) {
+      read = isNumber;
+      if (read) *number = env->CallIntMethod(value, tables->intValue);
+    } else if (kind == ScrambleKey::kByte) {
+      read = isNumber;
+      if (read)
+        changes.pduType = static_cast<std::uint8_t>(env->CallByteMethod(value, tables->byteValue));
+    } else if (kind == ScrambleKey::kText) {
+      read = env->IsInstanceOf(value, tables->stringClass);
+      if (read) *text = ToCpp(env, static_cast<jstring>(value));
+      read = read && text->has_value();
+    }
+    env->DeleteLocalRef(value);
+    if (!read || ClearException(env, "intValue")) {
+      LOG_ERROR("The scrambler's value for %s is not of its type\n", name->c_str());
+      return std::nullopt;
+    }
+  }
+  if (ClearException(env, "hasMoreElements")) return std::nullopt;
+  return changes;
 }
 
 }  // namespace tessel

@@ -50,6 +50,7 @@ class JniHost final : public HostBridge {
   HostAnswer TableSetOidVal(const HostValueQuery& query) override;
   void LogResponseMessage(const InformReport& report) override;
   void StoreDroppedInformMessage(const InformReport& report) override;
+  std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& query) override;
 
  private:
   // Calls the handler's inform method (kLogResponse or kStoreDropped) with what fill adds.
@@ -61,6 +62,8 @@ class JniHost final : public HostBridge {
   template <typename Fill>
   HostAnswer CallValueMethod(int method, Fill fill);
   HostAnswer AnswerFromJava(JNIEnv* env, jobjectArray answer);
+  // The fields a scrambler's Hashtable replaces; nothing when it cannot be read whole.
+  std::optional<ScrambleChanges> ChangesFromJava(JNIEnv* env, jobject table);
 
   mutable std::mutex mutex_;  // guards the two bindings; calls work on their own copies
   std::shared_ptr<const SimulatorBinding> simulator_;
@@ -74,6 +77,9 @@ jstring StringToJava(JNIEnv* env, const std::string& text);
 jclass JavaStringClass(JNIEnv* env);
 // A String[size] holding texts in order and null after them; nullptr on failure.
 jobjectArray StringsToJava(JNIEnv* env, const std::vector<std::string>& texts, std::size_t size);
+// A String[] of texts in order, null where a text is missing; nullptr on failure.
+jobjectArray OptionalStringsToJava(JNIEnv* env,
+                                   const std::vector<std::optional<std::string>>& texts);
 
 // The engine's array counts are 16-bit: longer host arrays are read up to this many elements.
 inline constexpr jsize kMaxJavaArrayElements = 65535;

@@ -10,6 +10,7 @@
 #include "notify/trap_pdu.h"
 #include "snmp/ber.h"
 #include "snmp/pdu_codec.h"
+#include "snmp/scrambler.h"
 #include "snmp/statistics.h"
 #include "snmpv3/v3_message.h"
 
@@ -111,6 +112,7 @@ int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const 
                          SnmpPdu* pdu, std::uint8_t* reply, std::size_t* replyLength,
                          const AgentSession& agent) {
   if (pdu->type == kGetResponse) {
+    ScrambleIfOn(pdu, agent, false);
     ResponseReceiver receiver = responseReceiver.load();
     return receiver != nullptr && receiver(*pdu, agent) ? kMessageConsumed : kMessageDrop;
   }
@@ -128,6 +130,7 @@ int ProcessParsedRequest(const std::uint8_t* message, std::size_t length, const 
     case RequestOutcome::kReply:
       break;
   }
+  ScrambleIfOn(pdu, agent, true);
   if (!CreateSnmpMessage(layout.bindings, layout.bindingsLength, reply, replyLength, pdu))
     return kMessageDrop;
   CountErrorStatus(pdu->errorStatus);

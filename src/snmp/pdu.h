@@ -67,6 +67,9 @@ struct SnmpPdu {
   std::int32_t genericTrap = 0;
   std::int32_t specificTrap = 0;
   std::uint32_t timeStamp = 0;
+  // An inform's wait (seconds) and retransmissions, as the host's scrambler sees and sets them.
+  std::int32_t timeout = 0;
+  std::int32_t retries = 0;
 
   VarBindList requestVarBinds;
   VarBindList responseVarBinds;

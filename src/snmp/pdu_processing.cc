@@ -6,6 +6,7 @@
 
 #include "engine/log.h"
 #include "snmp/ber.h"
+#include "snmp/scrambler.h"
 #include "snmp/value_text.h"
 
 namespace tessel {
@@ -434,6 +435,7 @@ bool GetNextOid(const TreeCell& cell, Oid* oid) {
 }
 
 std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent, const SecurityAccess* access) {
+  ScrambleIfOn(pdu, agent, false);
   pdu->errorStatus = kNoError;
   pdu->errorIndex = 0;
   MibTreeReadLock tree;
@@ -448,6 +450,7 @@ std::int32_t ProcessPDU(SnmpPdu* pdu, const AgentSession& agent, const SecurityA
 
 std::int32_t ProcessGetBulkVarBinds(SnmpPdu* pdu, const AgentSession& agent,
                                     const SecurityAccess* access) {
+  ScrambleIfOn(pdu, agent, false);
   std::size_t count = pdu->requestVarBinds.size();
   std::size_t nonRepeaters =
       std::min<std::size_t>(static_cast<std::size_t>(std::max(pdu->errorStatus, 0)), count);

@@ -15,6 +15,7 @@
 #include "snmp/ber.h"
 #include "snmp/message.h"
 #include "snmp/pdu_codec.h"
+#include "snmp/scrambler.h"
 #include "snmp/statistics.h"
 #include "snmpv3/engine_id.h"
 #include "snmpv3/usm_crypto.h"
@@ -475,7 +476,9 @@ std::size_t WrapperOverhead(const V3Request& request, const ScopedPdu& scoped) {
          scoped.contextEngineId.size() + scoped.contextName.size();
 }
 
-int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::size_t* replyLength) {
+int Respond(V3Request& request, ScopedPdu& scoped, std::uint8_t* reply, std::size_t* replyLength,
+            const AgentSession& agent) {
+  ScrambleIfOn(&scoped.pdu, agent, true);
   std::size_t limit = std::min(
       {static_cast<std::size_t>(request.header.msgMaxSize), kMaxSnmpMessage, *replyLength});
   std::size_t overhead = WrapperOverhead(request, scoped);
@@ -524,7 +527,7 @@ int ProcessScopedPdu(V3Request& request, std::uint8_t* reply, std::size_t* reply
     case RequestOutcome::kReply:
       break;
   }
-  return Respond(request, scoped, reply, replyLength);
+  return Respond(request, scoped, reply, replyLength, agent);
 }
 
 // Header and security parameters; false when the message is dropped (counted). The message is

@@ -8,6 +8,7 @@ import os
 import re
 import select
 import shutil
+import socket
 import subprocess
 import time
 
@@ -66,6 +67,51 @@ def test_ctl_stops_and_starts_a_device_that_managers_then_miss_and_find(network)
                   str(network.token_file))
     assert started.returncode == 0, started.stderr
     assert sys_descr(host) == described
+
+
+def request_id_of_reply(address, port, request_id):
+    """Sends a v2c Get of sysDescr.0 with request_id from loopback; the request-id of the reply."""
+    def tlv(tag, content):
+        return bytes([tag, len(content)]) + content
+    binding = tlv(0x30, tlv(0x06, bytes([0x2B, 6, 1, 2, 1, 1, 1, 0])) + b"\x05\x00")
+    pdu = tlv(0xA0, tlv(0x02, bytes([request_id])) + b"\x02\x01\x00" * 2 + tlv(0x30, binding))
+    message = tlv(0x30, b"\x02\x01\x01" + tlv(0x04, b"public") + pdu)
+    with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as manager:
+        manager.settimeout(2)
+        manager.sendto(message, (address, port))
+        reply = manager.recv(65535)
+
+    def enter(data, at):  # the start and end of the contents of the TLV at `at`
+        first = data[at + 1]
+        if first < 0x80:
+            return at + 2, at + 2 + first
+        size = first & 0x7F
+        length = int.from_bytes(data[at + 2:at + 2 + size], "big")
+        return at + 2 + size, at + 2 + size + length
+    at, _ = enter(reply, 0)
+    for _ in range(2):  # version, community
+        at = enter(reply, at)[1]
+    assert reply[at] == 0xA2, reply.hex()
+    at, _ = enter(reply, at)
+    start, end = enter(reply, at)
+    return int.from_bytes(reply[start:end], "big", signed=True)
+
+
+def test_scrambled_replies_carry_another_request_id_until_scrambling_is_off(network):
+    access = ("--admin", network.admin, "--token-file", str(network.token_file))
+    scrambled, plain = f"127.0.6.2:{ROUTER_PORT}", f"127.0.6.3:{ROUTER_PORT}"
+    on = ctl("scramble", "--devices", "127.0.6.2", "--responses", "reqid=5", *access)
+    try:
+        assert on.returncode == 0, on.stderr
+        assert request_id_of_reply("127.0.6.2", ROUTER_PORT, 42) == 5
+        assert sys_descr(scrambled) is None, "net-snmp waits for its own request-id and times out"
+        assert sys_descr(plain), "a device not listed answers as ever"
+    finally:
+        off = ctl("scramble", "off", *access)
+    assert off.returncode == 0, off.stderr
+    assert off.stdout == "scrambling off\n"
+    assert request_id_of_reply("127.0.6.2", ROUTER_PORT, 42) == 42
+    assert sys_descr(scrambled) == sys_descr(plain)
 
 
 class Browser:

@@ -140,4 +140,20 @@ void MemoryHost::StoreDroppedInformMessage(const InformReport& report) {
   dropped_.push_back(report);
 }
 
+void MemoryHost::SetScrambler(Scrambler scrambler) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  scrambler_ = std::move(scrambler);
+}
+
+std::vector<ScrambleQuery> MemoryHost::ScrambleQueries() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return scrambleQueries_;
+}
+
+std::optional<ScrambleChanges> MemoryHost::ScramblePDU(const ScrambleQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  scrambleQueries_.push_back(query);
+  return scrambler_ ? scrambler_(query) : std::nullopt;
+}
+
 }  // namespace tessel

@@ -3,6 +3,7 @@
 // of the named object, table GetNext of the next instance of the same column). Thread-safe.
 #pragma once
 
+#include <functional>
 #include <map>
 #include <mutex>
 #include <string>
@@ -33,6 +34,11 @@ class MemoryHost : public HostBridge {
   std::vector<InformReport> AnsweredInforms() const;
   std::vector<InformReport> DroppedInforms() const;
 
+  // What ScramblePDU answers; the queries it was given are kept in order.
+  using Scrambler = std::function<std::optional<ScrambleChanges>(const ScrambleQuery&)>;
+  void SetScrambler(Scrambler scrambler);
+  std::vector<ScrambleQuery> ScrambleQueries() const;
+
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
   HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) override;
@@ -42,6 +48,7 @@ class MemoryHost : public HostBridge {
   HostAnswer TableSetOidVal(const HostValueQuery& query) override;
   void LogResponseMessage(const InformReport& report) override;
   void StoreDroppedInformMessage(const InformReport& report) override;
+  std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& query) override;
 
  private:
   struct Entry {
@@ -63,6 +70,8 @@ class MemoryHost : public HostBridge {
   std::vector<InformReport> answered_;
   std::vector<InformReport> dropped_;
   bool recordReads_ = false;
+  Scrambler scrambler_;
+  std::vector<ScrambleQuery> scrambleQueries_;
 };
 
 // The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community

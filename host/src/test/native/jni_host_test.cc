@@ -139,5 +139,42 @@ TEST_F(JniHostTest, EngineThreadAttachesOnceAndDetachesAtItsEnd) {
   EXPECT_EQ(ThreadsNamed(env_, "tessel-engine"), 0);
 }
 
+TEST_F(JniHostTest, ScramblerGetsEveryArgumentInOrderAndItsTableIsReadWholeOrNotAtAll) {
+  JniHost& host = JniHost::Instance();
+  ASSERT_TRUE(host.BindSnmpHandler(
+      env_, NewObject("com/kestrelon/simulator/tessel/NativeProbe$ScramblingHandler")));
+  ScrambleQuery query;
+  query.version = 1;
+  query.community = "public";
+  query.oids = {".1.3.6.1.2.1.1.5.0", ".1.3.6.1.2.1.1.3.0"};
+  query.values = {"r1", std::nullopt};
+  query.requestId = 4000000000;
+  query.pduType = 0xA2;
+  query.errorStatus = 2;
+  query.errorIndex = 1;
+  query.oidField = ".1.3.6";
+  query.timeout = 5;
+  query.retries = 1;
+  query.agentAddress = "127.0.1.7";
+  query.agentPort = 159;
+  query.managerAddress = "127.0.0.9";
+  query.isResponse = true;
+  std::optional<ScrambleChanges> changes = host.ScramblePDU(query);
+  ASSERT_TRUE(changes);
+  EXPECT_EQ(
+      changes->community,
+      "1 public [.1.3.6.1.2.1.1.5.0, .1.3.6.1.2.1.1.3.0] [r1, null] 4000000000 -94 2 1 .1.3.6 "
+      "5 1 127.0.1.7 159 127.0.0.9 true");
+  EXPECT_EQ(changes->requestId, 5);
+  EXPECT_EQ(changes->pduType, 0xA2);
+  EXPECT_EQ(changes->oidField, ".1.3.6.1.4.1.99");
+  EXPECT_EQ(changes->retries, 2);
+  EXPECT_EQ(changes->errorStatus, std::nullopt);
+
+  query.agentAddress = "wrong-type";
+  EXPECT_EQ(host.ScramblePDU(query), std::nullopt);
+  EXPECT_FALSE(env_->ExceptionCheck());
+}
+
 }  // namespace
 }  // namespace tessel

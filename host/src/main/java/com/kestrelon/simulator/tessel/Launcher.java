@@ -8,6 +8,7 @@ import com.kestrelon.simulator.tessel.control.DeviceTable;
 import com.kestrelon.simulator.tessel.control.InformLog;
 import com.kestrelon.simulator.tessel.control.NativeNotifications;
 import com.kestrelon.simulator.tessel.control.NativeReports;
+import com.kestrelon.simulator.tessel.control.Scrambling;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
@@ -69,6 +70,8 @@ public final class Launcher {
   private volatile DeviceTable devices;
   /** The informs sent through the control interface, told of their outcome by the engine. */
   private final InformLog informs = new InformLog();
+  /** What the devices' PDUs have replaced, set through the control interface. */
+  private volatile Scrambling scrambling;
   private final Supplier<Optional<DescriptorBudget>> descriptorBudget;
   private final Function<PrintStream, NetworkSimulator> engines;
 
@@ -249,6 +252,8 @@ public final class Launcher {
       }
       engine = simulator;
       handler.setInformListener(informs);
+      scrambling = new Scrambling(simulator::scramblePdu);
+      handler.setScrambler(scrambling);
       if (!handler.jniJVMparams()) {
         return fail(err, "the engine did not accept the host");
       }
@@ -324,7 +329,7 @@ public final class Launcher {
       }
       try {
         admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports(),
-            new AdminServer.Notifications(new NativeNotifications(), informs));
+            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling);
       } catch (IOException e) {
         return fail(err, "the control interface cannot listen on " + control.listen() + ": " + e.getMessage());
       }

@@ -4,6 +4,8 @@ import com.kestrelon.simulator.tessel.data.DeviceData;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.snmp.DeviceStore;
 import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
+import java.util.Arrays;
+import java.util.Hashtable;
 
 /** What the native host-bridge test asks the JVM about, and the handlers it binds. */
 public final class NativeProbe {
@@ -47,6 +49,34 @@ public final class NativeProbe {
         String databaseName, String tableName, int dataType, int agentId, int rowStatusColumn,
         String address, int port, String syntax) {
       throw new IllegalStateException("host failure");
+    }
+  }
+
+  /**
+   * A handler whose scrambler answers every argument it was given, in order, as the community,
+   * with a field of each type; for the agent "wrong-type" a reqid that is not a number.
+   */
+  public static final class ScramblingHandler extends SnmpHandler {
+    @Override
+    public Hashtable<String, Object> ScramblePDU(long version, String community, String[] oids,
+        String[] values, long requestId, byte command, long errorStatus, long errorIndex,
+        String enterprise, int timeout, int retries, String agentAddress, int agentPort,
+        String managerAddress, boolean isResponse) {
+      Hashtable<String, Object> fields = new Hashtable<>();
+      if (agentAddress.equals("wrong-type")) {
+        fields.put("reqid", "5");
+        return fields;
+      }
+      fields.put("community", String.join(" ", String.valueOf(version), community, Arrays.toString(oids),
+          Arrays.toString(values), String.valueOf(requestId), String.valueOf(command), String.valueOf(errorStatus),
+          String.valueOf(errorIndex), enterprise, String.valueOf(timeout), String.valueOf(retries), agentAddress,
+          String.valueOf(agentPort), managerAddress, String.valueOf(isResponse)));
+      fields.put("reqid", 5);
+      fields.put("command", (byte) 0xA2);
+      fields.put("oid", ".1.3.6.1.4.1.99");
+      fields.put("retries", 2);
+      fields.put("unknown", new Object());
+      return fields;
     }
   }
 }

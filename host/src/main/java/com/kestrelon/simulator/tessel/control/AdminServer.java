@@ -54,6 +54,7 @@ public final class AdminServer implements AutoCloseable {
   private final EngineReports reports;
   private final AdminAccess access;
   private final Notifications notifications;
+  private final Scrambling scrambling;
   private final Optional<byte[]> dashboard;
   private final RequestRate rate = new RequestRate();
   private final List<Route> routes = List.of(
@@ -67,6 +68,7 @@ public final class AdminServer implements AutoCloseable {
           (exchange, path) -> notify(exchange, path.group(1))),
       new Route("/api/informs", "GET", (exchange, path) -> informList()),
       new Route("/api/informs/([^/]+)", "GET", (exchange, path) -> inform(path.group(1))),
+      new Route("/api/scramble", "GET, PUT, DELETE", (exchange, path) -> scramble(exchange)),
       new Route("/api/stats", "GET", (exchange, path) -> json(200, statsJson())),
       new Route("/metrics", "GET", (exchange, path) -> metrics()));
 
@@ -105,7 +107,8 @@ public final class AdminServer implements AutoCloseable {
   public record Notifications(NotificationSender sender, InformLog informs) {}
 
   private AdminServer(HttpServer server, ExecutorService executor, Network network, DeviceTable devices,
-      EngineReports reports, Notifications notifications, AdminAccess access, Optional<byte[]> dashboard) {
+      EngineReports reports, Notifications notifications, Scrambling scrambling, AdminAccess access,
+      Optional<byte[]> dashboard) {
     this.server = server;
     this.executor = executor;
     this.network = network;
@@ -113,6 +116,7 @@ public final class AdminServer implements AutoCloseable {
     this.reports = reports;
     this.access = access;
     this.notifications = notifications;
+    this.scrambling = scrambling;
     this.dashboard = dashboard;
   }
 
@@ -121,7 +125,8 @@ public final class AdminServer implements AutoCloseable {
    * dashboard page itself needs it.
    */
   public static AdminServer start(InetSocketAddress listen, Optional<String> token, Network network,
-      DeviceTable devices, EngineReports reports, Notifications notifications) throws IOException {
+      DeviceTable devices, EngineReports reports, Notifications notifications, Scrambling scrambling)
+      throws IOException {
     HttpServer server = HttpServer.create(listen, 0);
     // Two request threads: one slow client does not hold the others.
     AtomicInteger threads = new AtomicInteger();
@@ -130,7 +135,7 @@ public final class AdminServer implements AutoCloseable {
       thread.setDaemon(true);
       return thread;
     });
-    AdminServer admin = new AdminServer(server, executor, network, devices, reports, notifications,
+    AdminServer admin = new AdminServer(server, executor, network, devices, reports, notifications, scrambling,
         new AdminAccess(listen.getAddress(), token), readDashboard());
     server.setExecutor(executor);
     server.createContext("/", admin::serve);
@@ -193,7 +198,7 @@ public final class AdminServer implements AutoCloseable {
     for (Route route : routes) {
       Matcher matcher = route.path.matcher(path);
       if (matcher.matches()) {
-        if (!route.method.equals(method)) {
+        if (!List.of(route.method.split(", ")).contains(method)) {
           throw new Refusal(405, path + " takes " + route.method + ", not " + method,
               Map.of("Allow", route.method));
         }
@@ -358,7 +363,7 @@ public final class AdminServer implements AutoCloseable {
     byte[] body = jsonBody(exchange);
     Notification notification;
     try {
-      notification = Notification.parse(jsonObject(body));
+      notification = Notification.parse(jsonObject(body, "the notification"));
     } catch (IllegalArgumentException e) {
       throw new Refusal(400, e.getMessage());
     }
@@ -376,9 +381,9 @@ public final class AdminServer implements AutoCloseable {
     return json(202, Map.of("id", notifications.informs().add(device, notification, outcome.engineInformId())));
   }
 
-  private static JsonObject jsonObject(byte[] body) throws Refusal {
+  private static JsonObject jsonObject(byte[] body, String describing) throws Refusal {
     if (body.length == 0) {
-      throw new Refusal(400, "the request needs a JSON object describing the notification");
+      throw new Refusal(400, "the request needs a JSON object describing " + describing);
     }
     try (JsonReader reader = new JsonReader(new StringReader(utf8(body)))) {
       reader.setLenient(false);
@@ -393,6 +398,28 @@ public final class AdminServer implements AutoCloseable {
     } catch (IOException | RuntimeException e) {
       throw new Refusal(400, "malformed JSON: " + e.getMessage());
     }
+  }
+
+  /**
+   * GET shows the scrambling setting, PUT replaces it and turns scrambling on, DELETE turns it
+   * off; each answers the setting then in force.
+   */
+  private Response scramble(HttpExchange exchange) throws Refusal, IOException {
+    String method = exchange.getRequestMethod();
+    if (!method.equals("GET")) {
+      checkOrigin(exchange);
+    }
+    if (method.equals("PUT")) {
+      JsonObject body = jsonObject(jsonBody(exchange), "the scrambling");
+      try {
+        scrambling.set(Scrambling.parse(body, address -> devices.find(address).map(Device::address)));
+      } catch (IllegalArgumentException e) {
+        throw new Refusal(400, e.getMessage());
+      }
+    } else if (method.equals("DELETE")) {
+      scrambling.off();
+    }
+    return json(200, scrambling.current().map(Scrambling.Setting::json).orElse(Map.of("enabled", false)));
   }
 
   private Response informList() {

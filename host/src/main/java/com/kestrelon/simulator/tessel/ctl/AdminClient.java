@@ -60,12 +60,27 @@ final class AdminClient {
 
   /** POST of a path, with {@code body} as JSON, or with no body when it is empty. */
   JsonElement post(String path, Optional<JsonObject> body) throws ApiException, UnreachableException {
+    return send("POST", path, body);
+  }
+
+  /** PUT of a path with {@code body} as JSON. */
+  JsonElement put(String path, JsonObject body) throws ApiException, UnreachableException {
+    return send("PUT", path, Optional.of(body));
+  }
+
+  /** DELETE of a path. */
+  JsonElement delete(String path) throws ApiException, UnreachableException {
+    return send("DELETE", path, Optional.empty());
+  }
+
+  private JsonElement send(String method, String path, Optional<JsonObject> body)
+      throws ApiException, UnreachableException {
     HttpRequest.Builder request = request(path);
     if (body.isPresent()) {
       request.header("Content-Type", "application/json")
-          .POST(HttpRequest.BodyPublishers.ofString(body.get().toString(), StandardCharsets.UTF_8));
+          .method(method, HttpRequest.BodyPublishers.ofString(body.get().toString(), StandardCharsets.UTF_8));
     } else {
-      request.POST(HttpRequest.BodyPublishers.noBody());
+      request.method(method, HttpRequest.BodyPublishers.noBody());
     }
     return send(request.build());
   }

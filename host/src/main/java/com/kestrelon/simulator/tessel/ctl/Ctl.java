@@ -43,7 +43,7 @@ import picocli.CommandLine.Spec;
 @Command(name = "./tessel ctl",
     description = "Shows and drives a running network through its control interface.",
     subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class, Ctl.Trap.class, Ctl.Inform.class,
-        Ctl.Informs.class})
+        Ctl.Informs.class, Ctl.Scramble.class})
 public final class Ctl implements Runnable {
   static final int API_ERROR = 1;
   static final int UNREACHABLE = 3;
@@ -89,7 +89,7 @@ public final class Ctl implements Runnable {
   @Override
   public void run() {
     throw new ParameterException(spec.commandLine(),
-        "Missing command: devices, device, stop, start, restart, stats, trap, inform or informs");
+        "Missing command: devices, device, stop, start, restart, stats, trap, inform, informs or scramble");
   }
 
   /**
@@ -474,6 +474,98 @@ public final class Ctl implements Runnable {
         informs.add(answer);
       }
       printObjects(out, informs);
+    }
+  }
+
+  @Command(name = "scramble",
+      description = {"Has devices replace header fields of the requests they receive (--requests) and of the "
+          + "replies they send (--responses): reqid, errstat, errindex, command (the PDU type), community, oid, "
+          + "timeout, retries. A new setting replaces the previous one; 'scramble off' stops it, and "
+          + "'scramble' alone shows it."})
+  static final class Scramble extends ApiCommand {
+    private static final Set<String> TEXT_KEYS = Set.of("community", "oid");
+
+    @Parameters(arity = "0..1", paramLabel = "off", description = "stop scrambling")
+    String off;
+
+    @Option(names = "--devices", paramLabel = "A,B|all", description = "the devices that scramble (default all)")
+    String devices;
+
+    @Option(names = "--requests", paramLabel = "KEY=VALUE,...", description = "fields replaced in requests")
+    String requests;
+
+    @Option(names = "--responses", paramLabel = "KEY=VALUE,...", description = "fields replaced in replies")
+    String responses;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      boolean setting = devices != null || requests != null || responses != null;
+      JsonElement answer;
+      if (off != null) {
+        if (!off.equals("off") || setting) {
+          throw new ParameterException(spec.commandLine(), "scramble takes 'off' alone, or options, not '" + off + "'");
+        }
+        answer = client.delete("/api/scramble");
+      } else if (setting) {
+        answer = client.put("/api/scramble", body());
+      } else {
+        answer = client.get("/api/scramble");
+      }
+      if (json) {
+        printJson(out, answer);
+        return;
+      }
+      JsonObject shown = answer.getAsJsonObject();
+      if (!shown.get("enabled").getAsBoolean()) {
+        out.println("scrambling off");
+        return;
+      }
+      out.println("devices    " + text(shown.get("devices")));
+      out.println("requests   " + fieldsText(shown.getAsJsonObject("requests")));
+      out.println("responses  " + fieldsText(shown.getAsJsonObject("responses")));
+    }
+
+    private JsonObject body() {
+      JsonObject body = new JsonObject();
+      if (devices != null && !devices.equals("all")) {
+        JsonArray list = new JsonArray();
+        for (String address : devices.split(",")) {
+          list.add(address.strip());
+        }
+        body.add("devices", list);
+      }
+      if (requests != null) {
+        body.add("requests", fields("--requests", requests));
+      }
+      if (responses != null) {
+        body.add("responses", fields("--responses", responses));
+      }
+      return body;
+    }
+
+    /** KEY=VALUE pairs; numbers go as JSON numbers, community and oid as strings. */
+    private JsonObject fields(String option, String pairs) {
+      JsonObject fields = new JsonObject();
+      for (String pair : pairs.split(",")) {
+        int equals = pair.indexOf('=');
+        if (equals <= 0) {
+          throw new ParameterException(spec.commandLine(), option + " takes KEY=VALUE pairs, not '" + pair + "'");
+        }
+        String key = pair.substring(0, equals).strip();
+        String value = pair.substring(equals + 1);
+        if (!TEXT_KEYS.contains(key) && value.strip().matches("-?[0-9]{1,19}")) {
+          fields.addProperty(key, Long.parseLong(value.strip()));
+        } else {
+          fields.addProperty(key, value);
+        }
+      }
+      return fields;
+    }
+
+    private static String fieldsText(JsonObject fields) {
+      List<String> pairs = new ArrayList<>();
+      fields.entrySet().forEach(entry -> pairs.add(entry.getKey() + "=" + text(entry.getValue())));
+      return pairs.isEmpty() ? "-" : String.join(",", pairs);
     }
   }
 

@@ -1,6 +1,7 @@
 package com.kestrelon.simulator.tessel.snmp;
 
 import com.kestrelon.simulator.tessel.NativeLibrary;
+import java.util.Hashtable;
 import java.util.function.IntFunction;
 
 /**
@@ -160,6 +161,35 @@ public class SnmpHandler {
       listener.dropped(informId, version, community, userName, contextName, managerAddress,
           managerPort, oids, types, values);
     }
+  }
+
+  /** Decides which header fields of the PDUs passing through an agent are replaced. */
+  public interface Scrambler {
+    /**
+     * The fields to replace in a PDU of the agent at agentAddress (keys errstat, errindex, reqid,
+     * timeout and retries as Integer, command as Byte, community and oid as String), or null to
+     * leave it alone. isResponse: the reply on its way out, else the PDU as received.
+     */
+    Hashtable<String, Object> scramble(String agentAddress, boolean isResponse);
+  }
+
+  private volatile Scrambler scrambler;
+
+  /** The engine asks scrambler only while scrambling is switched on (NetworkSimulator.scramblePdu). */
+  public void setScrambler(Scrambler scrambler) {
+    this.scrambler = scrambler;
+  }
+
+  /**
+   * Called by the engine, while scrambling is on, for every PDU an agent receives and every reply
+   * it sends: the PDU's header, its bindings as texts, and the agent and manager it is between.
+   */
+  public Hashtable<String, Object> ScramblePDU(long version, String community, String[] oids,
+      String[] values, long requestId, byte command, long errorStatus, long errorIndex,
+      String enterprise, int timeout, int retries, String agentAddress, int agentPort,
+      String managerAddress, boolean isResponse) {
+    Scrambler current = scrambler;
+    return current == null ? null : current.scramble(agentAddress, isResponse);
   }
 
   private static String[] answer(String value) {

@@ -55,6 +55,8 @@ class AdminServerTest {
   private final AtomicLong millis = new AtomicLong(1_000_000);
   private final InformLog informs = new InformLog(millis::get);
   private final HttpClient client = HttpClient.newBuilder().connectTimeout(Duration.ofSeconds(5)).build();
+  private final List<Integer> engineSwitch = Collections.synchronizedList(new ArrayList<>());
+  private final Scrambling scrambling = new Scrambling(engineSwitch::add);
   private AdminServer server;
 
   @TempDir
@@ -126,7 +128,8 @@ class AdminServerTest {
       return sendOutcome;
     };
     return AdminServer.start(new InetSocketAddress("127.0.0.1", 0), token, network,
-        table.build(Map.of("snmp", agents)), reports, new AdminServer.Notifications(sender, informs));
+        table.build(Map.of("snmp", agents)), reports, new AdminServer.Notifications(sender, informs),
+        scrambling);
   }
 
   private Answer send(String method, String path, String contentType, String body, String... headers)
@@ -217,6 +220,18 @@ class AdminServerTest {
       POST   | /api/devices/127.0.1.1/notifications | application/json | '{"kind": "inform", "manager": "127.0.0.1:70000", "oid": "1.3.6.1.6.3.1.1.5.1"}' | 400 | -
       POST   | /api/devices/127.0.2.2/notifications | application/json | '{"kind": "trap", "manager": "127.0.0.1:162", "oid": "1.3.6.1.6.3.1.1.5.1"}' | 422 | -
       GET    | /api/informs/7                    | -                | -                         | 404 | -
+      POST   | /api/scramble                     | -                | -                         | 405 | GET, PUT, DELETE
+      PUT    | /api/scramble                     | -                | -                         | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"devices": "all", "colour": 1}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"devices": []}'         | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"devices": ["10.0.0.1"]}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"requests": {"colour": 1}}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"responses": {"reqid": "five"}}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"responses": {"reqid": 2147483648}}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"responses": {"errstat": 1.5}}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"responses": {"command": 256}}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"responses": {"oid": "1.x"}}' | 400 | -
+      PUT    | /api/scramble                     | application/json | '{"responses": {"community": 7}}' | 400 | -
       """)
   void refusalsAnswerJsonAndChangeNothing(String method, String path, String type, String body, int status,
       String allow) throws Exception {
@@ -229,6 +244,36 @@ class AdminServerTest {
     }
     assertEquals(List.of(), agentCalls);
     assertEquals(List.of(), sent);
+    assertEquals(List.of(), engineSwitch);
+  }
+
+  @Test
+  void scramblingIsSetReplacedShownAndTurnedOff() throws Exception {
+    assertEquals("{\"enabled\":false}", get("/api/scramble").body());
+    Answer on = send("PUT", "/api/scramble", "application/json", """
+        {"devices": ["127.0.1.2", "127.000.001.003"], "requests": {"community": "x"},
+         "responses": {"reqid": 5, "errstat": 5, "errindex": 1, "command": 162, "oid": ".1.3.6.1.4.1.99"}}""");
+    assertEquals(200, on.status(), on.body());
+    assertEquals("{\"enabled\":true,\"devices\":[\"127.0.1.2\",\"127.0.1.3\"],\"requests\":{\"community\":\"x\"},"
+        + "\"responses\":{\"reqid\":5,\"errstat\":5,\"errindex\":1,\"command\":162,\"oid\":\".1.3.6.1.4.1.99\"}}",
+        on.body());
+    assertEquals(on.body(), get("/api/scramble").body());
+    assertEquals(Map.of("reqid", 5, "errstat", 5, "errindex", 1, "command", (byte) 0xA2, "oid", ".1.3.6.1.4.1.99"),
+        scrambling.scramble("127.0.1.3", true));
+    assertEquals(Map.of("community", "x"), scrambling.scramble("127.0.1.2", false));
+    assertEquals(null, scrambling.scramble("127.0.1.1", true), "a device not listed is left alone");
+
+    // A PUT replaces the whole setting.
+    assertEquals(200, send("PUT", "/api/scramble", "application/json", "{\"responses\": {\"reqid\": 9}}").status());
+    assertEquals(Map.of("reqid", 9), scrambling.scramble("127.0.1.1", true));
+    assertEquals(Map.of(), scrambling.scramble("127.0.1.1", false));
+    assertEquals(403, send("DELETE", "/api/scramble", null, null, "Origin", "http://evil.example").status());
+
+    Answer off = send("DELETE", "/api/scramble", null, null);
+    assertEquals(200, off.status());
+    assertEquals("{\"enabled\":false}", off.body());
+    assertEquals(null, scrambling.scramble("127.0.1.1", true));
+    assertEquals(List.of(1, 1, 0), engineSwitch);
   }
 
   @Test

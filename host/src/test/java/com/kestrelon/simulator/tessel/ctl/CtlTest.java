@@ -87,6 +87,10 @@ class CtlTest {
       reply(exchange, 200, "{\"id\": 9, \"state\": \"" + state + "\", \"sends\": 1}");
     } else if (uri.getPath().equals("/api/informs")) {
       reply(exchange, 200, "{\"informs\": [{\"id\": 8, \"state\": \"acknowledged\", \"sends\": 2}]}");
+    } else if (uri.getPath().equals("/api/scramble")) {
+      reply(exchange, 200, exchange.getRequestMethod().equals("PUT")
+          ? "{\"enabled\": true, \"devices\": [\"10.0.0.5\"], \"requests\": {}, \"responses\": {\"reqid\": 5, \"community\": \"x\"}}"
+          : "{\"enabled\": false}");
     } else if (uri.getPath().equals("/api/stats")) {
       reply(exchange, 200, "{\"snmp\": {\"counters\": {\"snmpInPkts\": 12, \"snmpInBadVersions\": 0},"
           + " \"requestsPerSecond\": 3.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
@@ -192,6 +196,25 @@ class CtlTest {
       assertEquals(2, ctl(withAdmin), String.join(" ", args));
     }
     assertEquals(List.of(), requests);
+  }
+
+  @Test
+  void scrambleSetsShowsAndTurnsOff() {
+    assertEquals(0, ctl("--admin", url, "scramble", "--devices", "10.0.0.5, 10.0.0.6", "--responses",
+        "reqid=5,community=12,oid=1.3.6"));
+    assertEquals("PUT /api/scramble null {\"devices\":[\"10.0.0.5\",\"10.0.0.6\"],\"responses\":"
+        + "{\"reqid\":5,\"community\":\"12\",\"oid\":\"1.3.6\"}}", requests.get(0));
+    assertEquals(List.of("devices    [\"10.0.0.5\"]", "requests   -", "responses  reqid=5,community=x"),
+        out.lines().toList());
+    assertEquals(0, ctl("--admin", url, "scramble", "--devices", "all", "--requests", "command=162"));
+    assertEquals("PUT /api/scramble null {\"requests\":{\"command\":162}}", requests.get(1));
+    assertEquals(0, ctl("--admin", url, "scramble", "off"));
+    assertEquals("scrambling off\n", out);
+    assertEquals(0, ctl("--admin", url, "scramble"));
+    assertEquals(List.of("DELETE", "GET"), requests.subList(2, 4).stream().map(r -> r.split(" ")[0]).toList());
+    assertEquals(2, ctl("--admin", url, "scramble", "off", "--devices", "all"));
+    assertEquals(2, ctl("--admin", url, "scramble", "--responses", "reqid"));
+    assertEquals(4, requests.size(), "a usage error sends nothing");
   }
 
   @Test
