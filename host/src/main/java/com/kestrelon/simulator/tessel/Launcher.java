@@ -7,6 +7,7 @@ import com.kestrelon.simulator.tessel.control.AgentState;
 import com.kestrelon.simulator.tessel.control.DeviceTable;
 import com.kestrelon.simulator.tessel.control.InformLog;
 import com.kestrelon.simulator.tessel.control.NativeNotifications;
+import com.kestrelon.simulator.tessel.control.NotificationSchedule;
 import com.kestrelon.simulator.tessel.control.NativeReports;
 import com.kestrelon.simulator.tessel.control.Scrambling;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
@@ -67,6 +68,7 @@ public final class Launcher {
   private boolean stopRequested; // guarded by lifecycle
   private NetworkSimulator engine; // guarded by lifecycle: set once the engine is initialised
   private AdminServer admin; // guarded by lifecycle: set once the control interface listens
+  private NotificationSchedule schedule; // guarded by lifecycle: set once the devices serve
   private volatile DeviceTable devices;
   /** The informs sent through the control interface, told of their outcome by the engine. */
   private final InformLog informs = new InformLog();
@@ -190,6 +192,7 @@ public final class Launcher {
   public void requestStop() {
     NetworkSimulator running;
     AdminServer control;
+    NotificationSchedule timers;
     synchronized (lifecycle) {
       if (stopRequested) {
         return;
@@ -197,6 +200,10 @@ public final class Launcher {
       stopRequested = true;
       running = engine;
       control = admin;
+      timers = schedule;
+    }
+    if (timers != null) {
+      timers.close();
     }
     // The control interface goes first: nothing may start a device while the engine stops.
     if (control != null) {
@@ -281,6 +288,9 @@ public final class Launcher {
       }
       if (!handler.initSnmpThread()) {
         return fail(err, "the engine's SNMP service did not start");
+      }
+      if (network.groups().stream().anyMatch(group -> !group.notifications().isEmpty())) {
+        schedule = NotificationSchedule.start(network, devices, new NativeNotifications(), informs, err);
       }
     }
     return SERVING;

@@ -12,7 +12,9 @@ public final class NativeNotifications implements NotificationSender {
 
   @Override
   public Outcome send(Device device, Notification n) {
-    int pduType = n.version() == Notification.Version.V1 ? TRAP_V1 : n.inform() ? INFORM : TRAP_V2;
+    // The form follows what the notification names (an enterprise makes an SNMPv1 trap); the engine
+    // puts it in the manager's version.
+    int pduType = n.inform() ? INFORM : n.enterprise().isEmpty() ? TRAP_V2 : TRAP_V1;
     int[] outcome = engine.sendNotification(pduType, n.version().number(), n.managerHost(),
         n.managerPort(), n.community(), n.user(), n.context(), n.enterprise(), n.generic(),
         n.specific(), n.oid(), n.bindingOids(), n.bindingTypes(), n.bindingValues(),

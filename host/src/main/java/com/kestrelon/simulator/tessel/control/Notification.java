@@ -126,7 +126,7 @@ public record Notification(boolean inform, Version version, String managerHost, 
     require(inform || !json.has("timeout") && !json.has("retries"), "timeout and retries are for informs");
   }
 
-  private static Version version(String text) {
+  static Version version(String text) {
     for (Version version : Version.values()) {
       if (version.text.equals(text)) {
         return version;

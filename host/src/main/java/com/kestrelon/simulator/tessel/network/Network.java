@@ -1,7 +1,9 @@
 package com.kestrelon.simulator.tessel.network;
 
+import com.kestrelon.simulator.tessel.control.Notification;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import java.nio.ByteBuffer;
+import java.time.Duration;
 import java.nio.file.Path;
 import java.util.List;
 import java.util.Optional;
@@ -92,12 +94,20 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
    *     in the group, {@code {address}} for its address
    * @param snmp the group's SNMP agents; empty when the group serves no SNMP
    * @param trapSinks the managers that receive its devices' standard traps, besides the network's
+   * @param notifications what every device of the group sends on a timer
    */
   public record Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
-      List<TrapSink> trapSinks) {
+      List<TrapSink> trapSinks, List<Scheduled> notifications) {
 
     public Group {
       trapSinks = List.copyOf(trapSinks);
+      notifications = List.copyOf(notifications);
+    }
+
+    /** A group that sends nothing on a timer. */
+    public Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
+        List<TrapSink> trapSinks) {
+      this(name, count, firstAddress, deviceName, snmp, trapSinks, List.of());
     }
 
     /** A group without trap sinks of its own. */
@@ -119,6 +129,16 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
       return deviceName.replace("{n}", Integer.toString(index + 1)).replace("{address}", address(index));
     }
   }
+
+  /**
+   * A notification every device of a group sends once per {@code every}.
+   *
+   * @param toSinks true when it goes to each of the device's trap sinks, in the sink's version,
+   *     with the sink's identity, timeout and retries; then {@code notification} gives only its
+   *     kind, its form and its bindings
+   * @param notification what is sent and, unless {@code toSinks}, to whom
+   */
+  public record Scheduled(Duration every, boolean toSinks, Notification notification) {}
 
   /**
    * The SNMP agent every device of a group runs.

@@ -1,9 +1,15 @@
 package com.kestrelon.simulator.tessel.network;
 
+import com.google.gson.JsonArray;
+import com.google.gson.JsonElement;
+import com.google.gson.JsonObject;
+import com.google.gson.JsonPrimitive;
+import com.kestrelon.simulator.tessel.control.Notification;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
+import com.kestrelon.simulator.tessel.network.Network.Scheduled;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
 import com.kestrelon.simulator.tessel.network.Network.TrapSink;
 import java.io.IOException;
@@ -13,11 +19,14 @@ import java.nio.file.Files;
 import java.nio.file.InvalidPathException;
 import java.nio.file.NoSuchFileException;
 import java.nio.file.Path;
+import java.time.Duration;
 import java.util.ArrayList;
 import java.util.LinkedHashMap;
 import java.util.List;
 import java.util.Map;
 import java.util.Optional;
+import java.util.regex.Matcher;
+import java.util.regex.Pattern;
 import org.yaml.snakeyaml.Yaml;
 import org.yaml.snakeyaml.error.Mark;
 import org.yaml.snakeyaml.error.MarkedYAMLException;
@@ -44,8 +53,16 @@ public final class NetworkFile {
   private static final List<String> SINK_KEYS =
       List.of("version", "address", "port", "community", "user", "context", "kind", "timeout", "retries");
   private static final List<String> SNMP_KEYS = List.of("port", "data", "v3", "read-community", "write-community");
+  private static final List<String> SCHEDULED_KEYS = List.of("every", "to", "kind", "version", "oid",
+      "enterprise", "generic", "specific", "varbinds", "community", "user", "context", "timeout", "retries");
+  /** Keys a notification to the trap sinks takes from each sink instead. */
+  private static final List<String> SINK_OWN_KEYS = List.of("community", "user", "context", "timeout", "retries");
+  private static final List<String> NUMBER_KEYS = List.of("generic", "specific", "timeout", "retries");
+  private static final Pattern PERIOD = Pattern.compile("([0-9]{1,9})(ms|s|m|h)");
+  private static final Duration SHORTEST_PERIOD = Duration.ofMillis(100);
+  private static final Duration LONGEST_PERIOD = Duration.ofDays(1);
   /** Protocol sections whose devices the host cannot serve yet. */
-  private static final List<String> LATER_PROTOCOLS = List.of("notifications", "tl1", "cli");
+  private static final List<String> LATER_PROTOCOLS = List.of("tl1", "cli");
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
 
   private final String name;
@@ -156,22 +173,130 @@ public final class NetworkFile {
     if (snmp.isEmpty()) {
       throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp)");
     }
-    return new Group(groupName, count, first, deviceName, snmp, trapSinks(keys.get("trap-sinks")));
+    return new Group(groupName, count, first, deviceName, snmp, trapSinks(keys.get("trap-sinks")),
+        notifications(keys.get("notifications")));
+  }
+
+  /** A {@code notifications} list; none when the key is absent. */
+  private List<Scheduled> notifications(NodeTuple entry) throws NetworkFileException {
+    return list(entry, "notifications", this::scheduled);
+  }
+
+  /**
+   * One scheduled notification: the control interface's notification (its keys, checks and
+   * defaults) plus {@code every} and {@code to}, which is {@code sinks} or one manager.
+   */
+  private Scheduled scheduled(Node node) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(node, "a notification", SCHEDULED_KEYS);
+    Duration every = period(required(keys, "every", node, "a notification"));
+    NodeTuple to = required(keys, "to", node, "a notification");
+    boolean toSinks = text(to).equals("sinks");
+    JsonObject json = new JsonObject();
+    for (NodeTuple field : keys.values()) {
+      String key = key(field);
+      if (toSinks && SINK_OWN_KEYS.contains(key)) {
+        throw fault(field, key + " comes from each sink when a notification goes to the sinks");
+      }
+      if (!key.equals("every") && !key.equals("to")) {
+        json.add(key, key.equals("varbinds") ? bindingList(field) : scalar(field));
+      }
+    }
+    if (!json.has("kind")) {
+      json.addProperty("kind", "trap");
+    }
+    if (toSinks) {
+      // The sinks give the identity, so only the form is taken from the version here.
+      String form = json.has("version") && json.get("version").getAsString().equals("v1") ? "v1" : "v2c";
+      json.addProperty("version", form);
+      json.addProperty("manager", "127.0.0.1");
+    } else {
+      json.addProperty("manager", text(to));
+    }
+    try {
+      return new Scheduled(every, toSinks, Notification.parse(json));
+    } catch (IllegalArgumentException e) {
+      throw fault(culprit(keys, node, e.getMessage()), e.getMessage());
+    }
+  }
+
+  /** The node a notification's fault is about: the varbind or the key its reason starts with. */
+  private static Node culprit(Map<String, NodeTuple> keys, Node entry, String reason) {
+    Matcher varbind = Pattern.compile("varbind ([0-9]+)").matcher(reason);
+    if (varbind.lookingAt() && keys.containsKey("varbinds")
+        && keys.get("varbinds").getValueNode() instanceof SequenceNode list) {
+      return list.getValue().get(Integer.parseInt(varbind.group(1)) - 1);
+    }
+    String about = reason.startsWith("manager") ? "to" : reason.split("[ :]", 2)[0];
+    return keys.containsKey(about) ? keys.get(about).getKeyNode() : entry;
+  }
+
+  /** {@code 500ms}, {@code 30s}, {@code 5m} or {@code 1h}; from 100 ms to one day. */
+  private Duration period(NodeTuple entry) throws NetworkFileException {
+    Matcher period = PERIOD.matcher(entry.getValueNode() instanceof ScalarNode scalar ? scalar.getValue() : "");
+    if (!period.matches()) {
+      throw fault(entry, "every takes a period such as 500ms, 30s, 5m or 1h");
+    }
+    long amount = Long.parseLong(period.group(1));
+    Duration every = switch (period.group(2)) {
+      case "ms" -> Duration.ofMillis(amount);
+      case "s" -> Duration.ofSeconds(amount);
+      case "m" -> Duration.ofMinutes(amount);
+      default -> Duration.ofHours(amount);
+    };
+    if (every.compareTo(SHORTEST_PERIOD) < 0 || every.compareTo(LONGEST_PERIOD) > 0) {
+      throw fault(entry, "every takes a period from 100ms to 24h, not " + period.group());
+    }
+    return every;
+  }
+
+  /** A scalar as the control interface's JSON has it: counts as numbers, the rest as text. */
+  private static JsonElement scalar(NodeTuple field) {
+    if (!(field.getValueNode() instanceof ScalarNode scalar) || scalar.getTag().equals(Tag.NULL)) {
+      return new JsonArray(); // not a text: the notification's check names the key
+    }
+    String text = scalar.getValue();
+    return NUMBER_KEYS.contains(key(field)) && text.matches("-?[0-9]{1,18}")
+        ? new JsonPrimitive(Long.parseLong(text)) : new JsonPrimitive(text);
+  }
+
+  private JsonElement bindingList(NodeTuple field) throws NetworkFileException {
+    if (!(field.getValueNode() instanceof SequenceNode list)) {
+      throw fault(field, "varbinds takes a list of {oid, type, value}");
+    }
+    JsonArray bindings = new JsonArray();
+    for (Node node : list.getValue()) {
+      JsonObject binding = new JsonObject();
+      for (NodeTuple entry : mapping(node, "a varbind", List.of("oid", "type", "value")).values()) {
+        binding.add(key(entry), scalar(entry));
+      }
+      bindings.add(binding);
+    }
+    return bindings;
   }
 
   /** A {@code trap-sinks} list; none when the key is absent. */
   private List<TrapSink> trapSinks(NodeTuple entry) throws NetworkFileException {
+    return list(entry, "sinks", this::trapSink);
+  }
+
+  /** Reads one item of a list. */
+  private interface ItemReader<T> {
+    T read(Node item) throws NetworkFileException;
+  }
+
+  /** The items of the list {@code entry} holds; none when the key is absent. */
+  private <T> List<T> list(NodeTuple entry, String items, ItemReader<T> reader) throws NetworkFileException {
     if (entry == null) {
       return List.of();
     }
     if (!(entry.getValueNode() instanceof SequenceNode list)) {
-      throw fault(entry, "trap-sinks takes a list of sinks");
+      throw fault(entry, key(entry) + " takes a list of " + items);
     }
-    List<TrapSink> sinks = new ArrayList<>();
-    for (Node sink : list.getValue()) {
-      sinks.add(trapSink(sink));
+    List<T> read = new ArrayList<>();
+    for (Node item : list.getValue()) {
+      read.add(reader.read(item));
     }
-    return sinks;
+    return read;
   }
 
   private TrapSink trapSink(Node node) throws NetworkFileException {

@@ -7,10 +7,12 @@ import static org.junit.jupiter.api.Assertions.assertTrue;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
+import com.kestrelon.simulator.tessel.network.Network.Scheduled;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
 import com.kestrelon.simulator.tessel.network.Network.TrapSink;
 import java.nio.file.Files;
 import java.nio.file.Path;
+import java.time.Duration;
 import java.util.List;
 import java.util.Optional;
 import java.util.stream.Stream;
@@ -85,8 +87,23 @@ class NetworkFileTest {
         fault("trap-sinks:\n  - {version: v2c, adress: h}\n", "4: unknown key 'adress' in a trap sink"),
         fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec},\n     trap-sinks: [{version: v2c}]}\n",
             "4: a trap sink needs 'address'"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    notifications: []\n",
-            "6: notifications is not available yet"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 50ms, to: sinks, oid: 1.3.6.1.4.1.9}\n",
+            "8: every takes a period from 100ms to 24h, not 50ms"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1 s, to: sinks, oid: 1.3.6.1.4.1.9}\n", "8: every takes a period such as"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1s, to: sinks, oid: 1.3.6.1.4.1.9, evry: 2s}\n",
+            "8: unknown key 'evry' in a notification"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1s, oid: 1.3.6.1.4.1.9}\n", "8: a notification needs 'to'"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: sinks\n        community: c\n",
+            "10: community comes from each sink"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: 127.0.0.1:99999\n        oid: 1.3.6.1\n",
+            "9: manager: the port is a number from 1 to 65535"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: sinks\n        version: v1\n        generic: 6\n",
+            "8: no enterprise given"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: sinks\n        oid: 1.3.6.1\n        varbinds:\n"
+            + "          - {oid: 1.3.6.1.2, type: i, value: 1}\n          - {oid: 1.3.6.1.2, type: q, value: 1}\n",
+            "13: varbind 2: unknown type 'q'"),
+        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1s, to: sinks, kind: inform, version: v1, enterprise: 1.3.6.1.4.1.9}\n",
+            "8: SNMPv1 has no inform"),
         fault("log: {level: 4}\n", "3: level takes a whole number from 0 to 3"),
         fault("admin: {listen: 127.0.0.1}\n", "3: listen takes HOST:PORT"),
         fault("state-dir: [a\n", "4: "));
@@ -99,6 +116,26 @@ class NetworkFileTest {
     Network network = NetworkFile.read(file);
     assertEquals(List.of(new TrapSink("v2c", "127.0.0.1", 1162, "public", "", "", true, 2, 1)), network.trapSinks());
     assertEquals(List.of(new TrapSink("v3", "h", 162, "", "u", "", false, 5, 0)), network.groups().get(0).trapSinks());
+  }
+
+  @Test
+  void readsScheduledNotificationsWithTheControlInterfacesChecks() throws Exception {
+    Path file = write(FIRST_GROUP.replace("d.snmprec}}", "d.snmprec},\n     notifications: [\n"
+        + "       {every: 1500ms, to: sinks, version: v1, enterprise: 1.3.6.1.4.1.9, specific: 7},\n"
+        + "       {every: 5m, to: '[::1]:1162', kind: inform, version: v3, user: u, oid: 1.3.6.1.4.1.9.1,\n"
+        + "        retries: 2, varbinds: [{oid: 1.3.6.1.2.1.1.5.0, type: s, value: up}]}]}"));
+    List<Scheduled> scheduled = NetworkFile.read(file).groups().get(0).notifications();
+    assertEquals(2, scheduled.size());
+    Scheduled v1 = scheduled.get(0);
+    assertEquals(Duration.ofMillis(1500), v1.every());
+    assertTrue(v1.toSinks());
+    assertEquals(List.of(".1.3.6.1.4.1.9", "6", "7", "false"), List.of(v1.notification().enterprise(),
+        "" + v1.notification().generic(), "" + v1.notification().specific(), "" + v1.notification().inform()));
+    Scheduled inform = scheduled.get(1);
+    assertEquals(Duration.ofMinutes(5), inform.every());
+    assertEquals(List.of("false", "::1", "1162", "u", "2", ".1.3.6.1.2.1.1.5.0"), List.of("" + inform.toSinks(),
+        inform.notification().managerHost(), "" + inform.notification().managerPort(), inform.notification().user(),
+        "" + inform.notification().retries(), inform.notification().bindings().get(0).oid()));
   }
 
   private static Arguments fault(String rest, String expected) {
