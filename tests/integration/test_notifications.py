@@ -275,3 +275,51 @@ def test_standard_traps_reach_the_network_and_group_sinks_each_in_its_version(tr
         assert len(trapd(0, wait=0)) == before + 8, "one of each, no more"
     finally:
         assert net.stop() == 0
+
+
+SCHEDULED = ["127.0.3.90", "127.0.3.91"]
+
+
+def test_scheduled_traps_leave_each_device_in_turn_until_it_stops(trapd):
+    """A group of two sends a trap every second, the second device half a period after the first;
+    a device stopped through ./tessel ctl sends no more while the other goes on."""
+    net = FileNetwork(f"""
+        - name: timed
+          count: 2
+          address: {SCHEDULED[0]}
+          snmp: {{port: {NETWORK_PORT}, data: {PROFILE}}}
+          notifications:
+            - {{every: 1s, to: '127.0.0.1:{TRAPD_PORT}', oid: 1.3.6.1.4.1.99.0.9,
+               varbinds: [{{oid: 1.3.6.1.2.1.1.5.0, type: s, value: timed}}]}}
+        """, BASE_PORT + 7)
+
+    def sent():
+        """Per device, the scheduled traps logged so far."""
+        rows = [row for row in trapd(0, wait=0) if "OID: .1.3.6.1.4.1.99.0.9" in row[6]]
+        return {device: sum(source(row) == f"{device}:{NETWORK_PORT}" for row in rows) for device in SCHEDULED}
+
+    try:
+        first_seen, deadline = {}, time.monotonic() + 5
+        while len(first_seen) < 2 and time.monotonic() < deadline:
+            counts = sent()
+            for device in SCHEDULED:
+                if counts[device] and device not in first_seen:
+                    first_seen[device] = time.monotonic()
+            time.sleep(0.05)
+        assert len(first_seen) == 2, sent()
+        spread = first_seen[SCHEDULED[1]] - first_seen[SCHEDULED[0]]
+        assert 0.2 <= spread % 1.0 <= 0.8, f"the second device's turn came {spread:.2f} s after the first's"
+        row = next(row for row in trapd(0, wait=0) if "OID: .1.3.6.1.4.1.99.0.9" in row[6])
+        assert row[5] == "TRAP2, SNMP v2c, community public" and 'STRING: "timed"' in row[6]
+
+        stop = subprocess.run([str(ROOT / "tessel"), "ctl", "--admin", net.admin, "stop", SCHEDULED[1]],
+                              capture_output=True, text=True, timeout=120)
+        assert stop.returncode == 0, stop.stderr
+        time.sleep(0.2)
+        before = sent()
+        time.sleep(2.5)
+        after = sent()
+        assert after[SCHEDULED[1]] == before[SCHEDULED[1]], "a stopped device sent"
+        assert after[SCHEDULED[0]] - before[SCHEDULED[0]] >= 2
+    finally:
+        assert net.stop() == 0
