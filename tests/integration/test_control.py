@@ -11,6 +11,7 @@ import shutil
 import socket
 import subprocess
 import time
+import urllib.request
 
 import pytest
 
@@ -185,6 +186,15 @@ class Browser:
 
 def test_dashboard_asks_for_the_token_then_shows_and_starts_a_stopped_device(network, tmp_path):
     network.api("/api/devices/127.0.6.2/stop", "POST")
+    manager = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)  # takes the inform and never answers
+    manager.bind(("127.0.0.1", 0))
+    to = f"127.0.0.1:{manager.getsockname()[1]}"
+    inform = urllib.request.Request(
+        network.admin + "/api/devices/127.0.6.1/notifications", method="POST",
+        data=json.dumps({"kind": "inform", "manager": to, "oid": "1.3.6.1.4.1.99.0.1", "timeout": 60}).encode(),
+        headers={"Authorization": f"Bearer {TOKEN}", "Content-Type": "application/json"})
+    with urllib.request.urlopen(inform, timeout=10) as answer:
+        inform_id = json.load(answer)["id"]
     browser = Browser(tmp_path / "profile")
     try:
         browser.open(network.admin + "/")
@@ -198,6 +208,8 @@ def test_dashboard_asks_for_the_token_then_shows_and_starts_a_stopped_device(net
         assert browser.evaluate(state) == "stopped"
         assert browser.evaluate('document.querySelector(\'tr[data-group="routers"] [data-state="stopped"]\')'
                                 '.textContent') == "1"
+        assert browser.evaluate(f'[...document.querySelectorAll(\'#informs tr[data-inform="{inform_id}"] td\')]'
+                                '.map((cell) => cell.textContent)') == [str(inform_id), "127.0.6.1", to, "pending", "1"]
         SCREENSHOT.unlink(missing_ok=True)
         browser.screenshot(SCREENSHOT)
         assert SCREENSHOT.stat().st_size > 10_000
@@ -207,3 +219,4 @@ def test_dashboard_asks_for_the_token_then_shows_and_starts_a_stopped_device(net
         assert network.api("/api/devices/127.0.6.2")["protocols"] == {"snmp": "running"}
     finally:
         browser.close()
+        manager.close()
