@@ -30,6 +30,10 @@ class NetworkFileTest {
         - {name: a, count: 10, address: 127.0.1.1, snmp: {data: d.snmprec}}
       """;
 
+  /** A group whose notifications list starts on line 8. */
+  private static final String TIMED =
+      "  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n";
+
   @TempDir
   Path dir;
 
@@ -87,22 +91,22 @@ class NetworkFileTest {
         fault("trap-sinks:\n  - {version: v2c, adress: h}\n", "4: unknown key 'adress' in a trap sink"),
         fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec},\n     trap-sinks: [{version: v2c}]}\n",
             "4: a trap sink needs 'address'"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 50ms, to: sinks, oid: 1.3.6.1.4.1.9}\n",
+        fault(TIMED + "      - {every: 50ms, to: sinks, oid: 1.3.6.1.4.1.9}\n",
             "8: every takes a period from 100ms to 24h, not 50ms"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1 s, to: sinks, oid: 1.3.6.1.4.1.9}\n", "8: every takes a period such as"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1s, to: sinks, oid: 1.3.6.1.4.1.9, evry: 2s}\n",
+        fault(TIMED + "      - {every: 1 s, to: sinks, oid: 1.3.6.1.4.1.9}\n", "8: every takes a period such as"),
+        fault(TIMED + "      - {every: 1s, to: sinks, oid: 1.3.6.1.4.1.9, evry: 2s}\n",
             "8: unknown key 'evry' in a notification"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1s, oid: 1.3.6.1.4.1.9}\n", "8: a notification needs 'to'"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: sinks\n        community: c\n",
+        fault(TIMED + "      - {every: 1s, oid: 1.3.6.1.4.1.9}\n", "8: a notification needs 'to'"),
+        fault(TIMED + "      - every: 1s\n        to: sinks\n        community: c\n",
             "10: community comes from each sink"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: 127.0.0.1:99999\n        oid: 1.3.6.1\n",
+        fault(TIMED + "      - every: 1s\n        to: 127.0.0.1:99999\n        oid: 1.3.6.1\n",
             "9: manager: the port is a number from 1 to 65535"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: sinks\n        version: v1\n        generic: 6\n",
+        fault(TIMED + "      - every: 1s\n        to: sinks\n        version: v1\n        generic: 6\n",
             "8: no enterprise given"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - every: 1s\n        to: sinks\n        oid: 1.3.6.1\n        varbinds:\n"
+        fault(TIMED + "      - every: 1s\n        to: sinks\n        oid: 1.3.6.1\n        varbinds:\n"
             + "          - {oid: 1.3.6.1.2, type: i, value: 1}\n          - {oid: 1.3.6.1.2, type: q, value: 1}\n",
             "13: varbind 2: unknown type 'q'"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n      - {every: 1s, to: sinks, kind: inform, version: v1, enterprise: 1.3.6.1.4.1.9}\n",
+        fault(TIMED + "      - {every: 1s, to: sinks, kind: inform, version: v1, enterprise: 1.3.6.1.4.1.9}\n",
             "8: SNMPv1 has no inform"),
         fault("log: {level: 4}\n", "3: level takes a whole number from 0 to 3"),
         fault("admin: {listen: 127.0.0.1}\n", "3: listen takes HOST:PORT"),
