@@ -77,9 +77,17 @@ public final class NotificationSchedule implements AutoCloseable {
     long period = entry.every().toNanos();
     for (int i = 0; i < group.count(); i++) {
       String address = group.address(i);
-      long first = Math.multiplyExact((long) i, period) / group.count();
+      long first = turn(i, group.count(), period);
       timer.scheduleAtFixedRate(() -> fire(address, targets), first, period, TimeUnit.NANOSECONDS);
     }
+  }
+
+  /**
+   * i × period / n, rounded down, without overflow: with period = q × n + r it is i × q + i × r / n,
+   * where i × r stays below n² (at most 2⁶²).
+   */
+  static long turn(long i, long n, long period) {
+    return i * (period / n) + i * (period % n) / n;
   }
 
   private void fire(String address, List<Notification> targets) {

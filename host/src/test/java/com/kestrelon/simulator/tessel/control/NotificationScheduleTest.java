@@ -12,6 +12,7 @@ import com.kestrelon.simulator.tessel.network.Network.Scheduled;
 import com.kestrelon.simulator.tessel.network.Network.TrapSink;
 import java.io.ByteArrayOutputStream;
 import java.io.PrintStream;
+import java.math.BigInteger;
 import java.nio.file.Path;
 import java.time.Duration;
 import java.util.ArrayList;
@@ -101,6 +102,16 @@ class NotificationScheduleTest {
       taken.add(next);
     }
     return taken;
+  }
+
+  @Test
+  void turnsSpreadOverADayForTheLargestGroupWithoutOverflow() {
+    long day = Duration.ofDays(1).toNanos();
+    long n = Integer.MAX_VALUE;
+    for (long i : new long[] {0, 1, n / 3, n - 1}) {
+      long exact = BigInteger.valueOf(i).multiply(BigInteger.valueOf(day)).divide(BigInteger.valueOf(n)).longValueExact();
+      assertEquals(exact, NotificationSchedule.turn(i, n, day), "turn of device " + i);
+    }
   }
 
   @Test
