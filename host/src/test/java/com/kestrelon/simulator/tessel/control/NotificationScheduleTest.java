@@ -108,8 +108,9 @@ class NotificationScheduleTest {
   void turnsSpreadOverADayForTheLargestGroupWithoutOverflow() {
     long day = Duration.ofDays(1).toNanos();
     long n = Integer.MAX_VALUE;
+    BigInteger dayTimes = BigInteger.valueOf(day);
     for (long i : new long[] {0, 1, n / 3, n - 1}) {
-      long exact = BigInteger.valueOf(i).multiply(BigInteger.valueOf(day)).divide(BigInteger.valueOf(n)).longValueExact();
+      long exact = BigInteger.valueOf(i).multiply(dayTimes).divide(BigInteger.valueOf(n)).longValueExact();
       assertEquals(exact, NotificationSchedule.turn(i, n, day), "turn of device " + i);
     }
   }
