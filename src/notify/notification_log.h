@@ -12,7 +12,6 @@ namespace tessel {
 
 // The manager block, then the PDU.
 void DumpNotification(const NotificationTarget& target, const SnmpPdu& pdu);
-void DumpPdu(const SnmpPdu& pdu);
 
 // Fills the report's oids, types and values from the bindings.
 void BindingsToHostTexts(const VarBindList& bindings, InformReport* report);

@@ -17,6 +17,7 @@
 #include "notify/v3_notification.h"
 #include "snmp/agent_sockets.h"
 #include "snmp/message.h"
+#include "snmp/pdu_dump.h"
 #include "snmp/statistics.h"
 #include "snmp/value_text.h"
 #include "snmpv3/v3_message.h"

@@ -5,6 +5,7 @@
 #include "engine/log.h"
 #include "snmp/ber.h"
 #include "snmp/message.h"
+#include "snmp/pdu_dump.h"
 #include "snmp/statistics.h"
 
 namespace tessel {
@@ -226,6 +227,7 @@ RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent,
                                  const SecurityAccess* access) {
   switch (pdu->type) {
     case kInformRequest:
+      DumpPdu(*pdu);
       return RequestOutcome::kEchoInform;
     case kGetResponse:
     case kReport:
@@ -246,6 +248,7 @@ RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent,
       CountSnmp(SnmpCounter::kAsnParseErrors);
       return RequestOutcome::kDrop;
   }
+  DumpPdu(*pdu);
   std::int32_t status = Dispatch(pdu, agent, access);
   if (status == kResourceFailure) {
     LOG_ERROR("PACKET DROPPED !!! \n");
@@ -262,6 +265,7 @@ RequestOutcome ProcessRequestPdu(SnmpPdu* pdu, const AgentSession& agent,
     CountAnswered(*pdu);
   }
   pdu->type = kGetResponse;
+  DumpPdu(*pdu);
   return RequestOutcome::kReply;
 }
 

@@ -2,7 +2,12 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdio>
+#include <fstream>
+#include <sstream>
+
 #include "engine/engine_state.h"
+#include "engine/log.h"
 #include "snmp/statistics.h"
 #include "support/snmp_agent_fixture.h"
 
@@ -31,6 +36,24 @@ TEST_F(MessageTest, GetIsAnsweredWithTheFixedHeaderForm) {
   EXPECT_EQ(Count(SnmpCounter::kInMessages), 1u);
   EXPECT_EQ(Count(SnmpCounter::kV2GetRequests), 1u);
   EXPECT_EQ(Count(SnmpCounter::kOutResponses), 1u);
+}
+
+TEST_F(MessageTest, TrafficLogDumpsRequestAndResponseFromLevelOne) {
+  const std::string path = ::testing::TempDir() + "traffic.log";
+  ASSERT_TRUE(OpenEngineLog({1, path, 0}));
+  ASSERT_TRUE(Send(GetOf("1.3.6.1.2.1.1.5.0")));
+  OpenEngineLog({0, "", 0});
+  std::stringstream log;
+  log << std::ifstream(path).rdbuf();
+  std::remove(path.c_str());
+  const std::string text = log.str();
+  std::size_t request = text.find("Request Message Start");
+  std::size_t response = text.find("Response Message Start");
+  ASSERT_NE(request, std::string::npos);
+  ASSERT_NE(response, std::string::npos);
+  EXPECT_LT(request, response);
+  EXPECT_NE(text.find("Command\t\t\t\t= GET REQUEST"), std::string::npos);
+  EXPECT_NE(text.find("1.3.6.1.2.1.1.5.0\tOCTET STRING\tr1", response), std::string::npos);
 }
 
 TEST_F(MessageTest, RefusedMessagesAreDroppedAndCounted) {
