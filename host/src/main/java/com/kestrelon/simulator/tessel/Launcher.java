@@ -10,6 +10,7 @@ import com.kestrelon.simulator.tessel.control.NativeNotifications;
 import com.kestrelon.simulator.tessel.control.NotificationSchedule;
 import com.kestrelon.simulator.tessel.control.NativeReports;
 import com.kestrelon.simulator.tessel.control.Scrambling;
+import com.kestrelon.simulator.tessel.control.Tl1Control;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
@@ -339,7 +340,7 @@ public final class Launcher {
       }
       try {
         admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports(),
-            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling);
+            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling, Tl1Control.NONE);
       } catch (IOException e) {
         return fail(err, "the control interface cannot listen on " + control.listen() + ": " + e.getMessage());
       }

@@ -46,6 +46,7 @@ public final class AdminServer implements AutoCloseable {
   private static final String JSON = "application/json; charset=utf-8";
   private static final Set<String> DEVICE_QUERY = Set.of("group", "state", "offset", "limit");
   private static final Gson GSON = new GsonBuilder().disableHtmlEscaping().create();
+  private static final Gson GSON_NULLS = new GsonBuilder().disableHtmlEscaping().serializeNulls().create();
 
   private final HttpServer server;
   private final ExecutorService executor;
@@ -55,8 +56,10 @@ public final class AdminServer implements AutoCloseable {
   private final AdminAccess access;
   private final Notifications notifications;
   private final Scrambling scrambling;
+  private final Tl1Control tl1;
   private final Optional<byte[]> dashboard;
   private final RequestRate rate = new RequestRate();
+  private final RequestRate tl1Rate = new RequestRate();
   private final List<Route> routes = List.of(
       new Route("/", "GET", (exchange, path) -> dashboard()),
       new Route("/api/network", "GET", (exchange, path) -> json(200, networkJson())),
@@ -66,6 +69,14 @@ public final class AdminServer implements AutoCloseable {
           (exchange, path) -> change(exchange, path.group(1), path.group(2))),
       new Route("/api/devices/([^/]+)/notifications", "POST",
           (exchange, path) -> notify(exchange, path.group(1))),
+      new Route("/api/devices/([^/]+)/tl1/messages", "POST",
+          (exchange, path) -> tl1Messages(exchange, path.group(1))),
+      new Route("/api/devices/([^/]+)/tl1/atag", "POST", (exchange, path) -> tl1Atag(exchange, path.group(1))),
+      new Route("/api/devices/([^/]+)/tl1/pending", "GET", (exchange, path) -> tl1Pending(path.group(1))),
+      new Route("/api/devices/([^/]+)/tl1/pending/([^/]+)", "DELETE",
+          (exchange, path) -> tl1PendingAction(exchange, path.group(1), path.group(2), false)),
+      new Route("/api/devices/([^/]+)/tl1/pending/([^/]+)/run", "POST",
+          (exchange, path) -> tl1PendingAction(exchange, path.group(1), path.group(2), true)),
       new Route("/api/informs", "GET", (exchange, path) -> informList()),
       new Route("/api/informs/([^/]+)", "GET", (exchange, path) -> inform(path.group(1))),
       new Route("/api/scramble", "GET, PUT, DELETE", (exchange, path) -> scramble(exchange)),
@@ -107,8 +118,8 @@ public final class AdminServer implements AutoCloseable {
   public record Notifications(NotificationSender sender, InformLog informs) {}
 
   private AdminServer(HttpServer server, ExecutorService executor, Network network, DeviceTable devices,
-      EngineReports reports, Notifications notifications, Scrambling scrambling, AdminAccess access,
-      Optional<byte[]> dashboard) {
+      EngineReports reports, Notifications notifications, Scrambling scrambling, Tl1Control tl1,
+      AdminAccess access, Optional<byte[]> dashboard) {
     this.server = server;
     this.executor = executor;
     this.network = network;
@@ -117,6 +128,7 @@ public final class AdminServer implements AutoCloseable {
     this.access = access;
     this.notifications = notifications;
     this.scrambling = scrambling;
+    this.tl1 = tl1;
     this.dashboard = dashboard;
   }
 
@@ -125,8 +137,8 @@ public final class AdminServer implements AutoCloseable {
    * dashboard page itself needs it.
    */
   public static AdminServer start(InetSocketAddress listen, Optional<String> token, Network network,
-      DeviceTable devices, EngineReports reports, Notifications notifications, Scrambling scrambling)
-      throws IOException {
+      DeviceTable devices, EngineReports reports, Notifications notifications, Scrambling scrambling,
+      Tl1Control tl1) throws IOException {
     HttpServer server = HttpServer.create(listen, 0);
     // Two request threads: one slow client does not hold the others.
     AtomicInteger threads = new AtomicInteger();
@@ -136,7 +148,7 @@ public final class AdminServer implements AutoCloseable {
       return thread;
     });
     AdminServer admin = new AdminServer(server, executor, network, devices, reports, notifications, scrambling,
-        new AdminAccess(listen.getAddress(), token), readDashboard());
+        tl1, new AdminAccess(listen.getAddress(), token), readDashboard());
     server.setExecutor(executor);
     server.createContext("/", admin::serve);
     server.start();
@@ -382,22 +394,104 @@ public final class AdminServer implements AutoCloseable {
   }
 
   private static JsonObject jsonObject(byte[] body, String describing) throws Refusal {
+    JsonElement element = jsonElement(body, "a JSON object describing " + describing);
+    if (!element.isJsonObject()) {
+      throw new Refusal(400, "the body must be a JSON object");
+    }
+    return element.getAsJsonObject();
+  }
+
+  private static JsonElement jsonElement(byte[] body, String describing) throws Refusal {
     if (body.length == 0) {
-      throw new Refusal(400, "the request needs a JSON object describing " + describing);
+      throw new Refusal(400, "the request needs " + describing);
     }
     try (JsonReader reader = new JsonReader(new StringReader(utf8(body)))) {
       reader.setLenient(false);
       JsonElement element = GSON.getAdapter(JsonElement.class).read(reader);
-      if (!element.isJsonObject()) {
-        throw new Refusal(400, "the body must be a JSON object");
-      }
       if (reader.peek() != JsonToken.END_DOCUMENT) {
-        throw new Refusal(400, "malformed JSON: more after the object");
+        throw new Refusal(400, "malformed JSON: more after the value");
       }
-      return element.getAsJsonObject();
+      return element;
     } catch (IOException | RuntimeException e) {
       throw new Refusal(400, "malformed JSON: " + e.getMessage());
     }
+  }
+
+  /** Autonomous messages to every TL1 client of a device, queued together. */
+  private Response tl1Messages(HttpExchange exchange, String address) throws Refusal, IOException {
+    checkOrigin(exchange);
+    JsonElement body = jsonElement(jsonBody(exchange), "a message object or an array of them");
+    List<Tl1Message> messages;
+    try {
+      messages = Tl1Message.parseAll(body);
+    } catch (IllegalArgumentException e) {
+      throw new Refusal(400, e.getMessage());
+    }
+    int clients = tl1.sendMessages(tl1Device(address), messages);
+    if (clients == 0) {
+      throw new Refusal(409, "no client connected to the device " + address);
+    }
+    return json(200, Map.of("clients", clients));
+  }
+
+  private Response tl1Atag(HttpExchange exchange, String address) throws Refusal, IOException {
+    checkOrigin(exchange);
+    JsonObject body = jsonObject(jsonBody(exchange), "the ATAG");
+    if (body.size() != 1 || !body.has("atag") || !body.get("atag").isJsonPrimitive()
+        || !body.get("atag").getAsString().matches("[0-9]{1,9}")) {
+      throw new Refusal(400, "the body is {\"atag\": N} with N a whole number from 0 to 999999999");
+    }
+    int atag = body.get("atag").getAsInt();
+    if (!tl1.setAtag(tl1Device(address), atag)) {
+      throw new Refusal(409, "no client connected to the device " + address);
+    }
+    return json(200, Map.of("atag", atag));
+  }
+
+  private Response tl1Pending(String address) throws Refusal {
+    List<Map<String, Object>> entries = new ArrayList<>();
+    for (Tl1Control.PendingCommand entry : tl1.pending(tl1Device(address))) {
+      Map<String, Object> json = new LinkedHashMap<>();
+      json.put("id", entry.id());
+      json.put("session", entry.session());
+      json.put("on", entry.on());
+      json.put("date", entry.date());
+      json.put("time", entry.time());
+      json.put("command", entry.command());
+      entries.add(json);
+    }
+    return new Response(200, JSON, GSON_NULLS.toJson(Map.of("pending", entries)).getBytes(StandardCharsets.UTF_8),
+        Map.of());
+  }
+
+  /** Runs a waiting command now, or cancels it. */
+  private Response tl1PendingAction(HttpExchange exchange, String address, String id, boolean run)
+      throws Refusal, IOException {
+    checkOrigin(exchange);
+    if (jsonBody(exchange).length > 0) {
+      throw new Refusal(400, "this request takes no body");
+    }
+    Device device = tl1Device(address);
+    int number = id.matches("[0-9]{1,9}") ? Integer.parseInt(id) : -1;
+    boolean done = number >= 0 && (run ? tl1.runPending(device, number) : tl1.cancelPending(device, number));
+    if (!done) {
+      throw new Refusal(404, "no pending command " + id + " on the device " + address);
+    }
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("id", number);
+    json.put("state", run ? "ran" : "cancelled");
+    return json(200, json);
+  }
+
+  /** The device, when its TL1 agent is running. */
+  private Device tl1Device(String address) throws Refusal {
+    Device device = devices.find(address).orElseThrow(() -> noDevice(address));
+    AgentState state = device.protocols().get("tl1");
+    if (state != AgentState.RUNNING) {
+      throw new Refusal(422, "the device " + device.address()
+          + (state == null ? " has no TL1 agent" : " is not running its TL1 agent"));
+    }
+    return device;
   }
 
   /**
@@ -510,15 +604,20 @@ public final class AdminServer implements AutoCloseable {
       json.put("errorStatus", error.errorStatus());
       errors.add(json);
     }
+    Tl1Control.Counters tl1Counters = tl1.counters();
+    Map<String, Object> tl1Json = new LinkedHashMap<>();
+    tl1Json.put("sessions", tl1Counters.sessions());
+    tl1Json.put("commandsPerSecond", Math.round(tl1Rate.sample(tl1Counters.commands()) * 1000) / 1000.0);
     Map<String, Object> json = new LinkedHashMap<>();
     json.put("snmp", snmp);
+    json.put("tl1", tl1Json);
     json.put("errors", errors);
     return json;
   }
 
   private Response metrics() {
     long[] counters = reports.counters();
-    String text = MetricsText.render(counters, rate.sample(counters[0]), devices.counts());
+    String text = MetricsText.render(counters, rate.sample(counters[0]), tl1.counters(), devices.counts());
     return new Response(200, MetricsText.CONTENT_TYPE, text.getBytes(StandardCharsets.UTF_8), Map.of());
   }
 

@@ -15,7 +15,7 @@ final class MetricsText {
 
   private MetricsText() {}
 
-  static String render(long[] counters, double requestsPerSecond,
+  static String render(long[] counters, double requestsPerSecond, Tl1Control.Counters tl1,
       Map<String, Map<String, EnumMap<AgentState, Integer>>> devices) {
     StringBuilder text = new StringBuilder();
     for (int i = 0; i < COUNTER_METRICS.size(); i++) {
@@ -29,6 +29,12 @@ final class MetricsText {
     text.append("# TYPE tessel_snmp_requests_per_second gauge\n");
     text.append("tessel_snmp_requests_per_second ").append(String.format(Locale.ROOT, "%.3f", requestsPerSecond))
         .append('\n');
+    text.append("# HELP tessel_tl1_sessions TL1 sessions open now.\n");
+    text.append("# TYPE tessel_tl1_sessions gauge\n");
+    text.append("tessel_tl1_sessions ").append(tl1.sessions()).append('\n');
+    text.append("# HELP tessel_tl1_commands_total TL1 commands answered.\n");
+    text.append("# TYPE tessel_tl1_commands_total counter\n");
+    text.append("tessel_tl1_commands_total ").append(tl1.commands()).append('\n');
     text.append("# HELP tessel_devices Devices per group and protocol whose agent is in the state.\n");
     text.append("# TYPE tessel_devices gauge\n");
     devices.forEach((group, protocols) -> protocols.forEach((protocol, states) -> states.forEach(

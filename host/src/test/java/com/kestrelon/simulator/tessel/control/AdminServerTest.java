@@ -57,6 +57,7 @@ class AdminServerTest {
   private final HttpClient client = HttpClient.newBuilder().connectTimeout(Duration.ofSeconds(5)).build();
   private final List<Integer> engineSwitch = Collections.synchronizedList(new ArrayList<>());
   private final Scrambling scrambling = new Scrambling(engineSwitch::add);
+  private final FakeTl1 tl1 = new FakeTl1();
   private AdminServer server;
 
   @TempDir
@@ -74,6 +75,47 @@ class AdminServerTest {
     @Override
     public List<RequestError> errors() {
       return List.of(new RequestError("127.0.0.9", 77, "v2c", "get", 2));
+    }
+  }
+
+  /** TL1 agents whose device 127.0.2.1 has {@code clients} clients and one command waiting. */
+  private static final class FakeTl1 implements Tl1Control {
+    final List<String> calls = Collections.synchronizedList(new ArrayList<>());
+    volatile int clients = 2;
+
+    @Override
+    public int sendMessages(Device device, List<Tl1Message> messages) {
+      calls.add(device.address() + " " + messages.stream().map(m -> m.severity().code() + " " + m.verb() + " "
+          + m.modifiers() + " " + m.lines().stream().map(l -> l.type().engineType() + ":" + l.text()).toList()).toList());
+      return clients;
+    }
+
+    @Override
+    public boolean setAtag(Device device, int atag) {
+      calls.add(device.address() + " atag " + atag);
+      return clients > 0;
+    }
+
+    @Override
+    public List<PendingCommand> pending(Device device) {
+      return List.of(new PendingCommand(7, 65537, 5, null, null, "ENT-X:NE1:A:1:ON=5;"));
+    }
+
+    @Override
+    public boolean runPending(Device device, int id) {
+      calls.add("run " + id);
+      return id == 7;
+    }
+
+    @Override
+    public boolean cancelPending(Device device, int id) {
+      calls.add("cancel " + id);
+      return id == 7;
+    }
+
+    @Override
+    public Counters counters() {
+      return new Counters(clients, 4_294_967_300L);
     }
   }
 
@@ -107,7 +149,8 @@ class AdminServerTest {
     for (Group group : network.groups()) {
       for (int i = 0; i < group.count(); i++) {
         AgentState state = group.address(i).equals(REFUSING) ? AgentState.FAILED : AgentState.RUNNING;
-        table.add(group.firstAddress() + i, i, group.deviceName(i), group.name(), Map.of("snmp", state));
+        Map<String, AgentState> protocols = group == optical && i == 0 ? Map.of("snmp", state, "tl1", state) : Map.of("snmp", state);
+        table.add(group.firstAddress() + i, i, group.deviceName(i), group.name(), protocols);
       }
     }
     ProtocolAgents agents = new ProtocolAgents() {
@@ -128,8 +171,8 @@ class AdminServerTest {
       return sendOutcome;
     };
     return AdminServer.start(new InetSocketAddress("127.0.0.1", 0), token, network,
-        table.build(Map.of("snmp", agents)), reports, new AdminServer.Notifications(sender, informs),
-        scrambling);
+        table.build(Map.of("snmp", agents, "tl1", agents)), reports, new AdminServer.Notifications(sender, informs),
+        scrambling, tl1);
   }
 
   private Answer send(String method, String path, String contentType, String body, String... headers)
@@ -314,6 +357,59 @@ class AdminServerTest {
     JsonObject listed = get("/api/informs").json().getAsJsonArray("informs").get(0).getAsJsonObject();
     assertEquals("acknowledged", listed.get("state").getAsString());
     assertEquals(2, listed.get("sends").getAsInt());
+  }
+
+  @Test
+  void tl1MessagesAtagsAndPendingCommandsReachTheDevicesAgent() throws Exception {
+    String base = "/api/devices/127.0.2.1/tl1/";
+    Answer sent = send("POST", base + "messages", "application/json", """
+        [{"severity": "non-alarm", "verb": "rept", "modifiers": ["evt"], "lines": [{"type": "plain", "text": "a b"}]},
+         {"severity": "critical", "verb": "REPT", "modifiers": ["ALM", "EQPT"],
+          "lines": [{"type": "quoted", "text": "SLOT-1:CR,LOS"}, {"type": "comment", "text": "x"}]}]""");
+    assertEquals(200, sent.status(), sent.body());
+    assertEquals(2, sent.json().get("clients").getAsInt());
+    assertEquals("127.0.2.1 [3 REPT [EVT] [1:a b], 0 REPT [ALM, EQPT] [0:SLOT-1:CR,LOS, 2:x]]", tl1.calls.get(0));
+
+    String[][] refused = {
+        {"{\"severity\": \"loud\", \"verb\": \"REPT\"}", "severity"},
+        {"{\"severity\": \"minor\", \"verb\": \"REPT\", \"modifiers\": [\"A\", \"B\", \"C\"]}", "two modifiers"},
+        {"{\"severity\": \"minor\", \"verb\": \"RE PT\"}", "TL1 word"},
+        {"{\"severity\": \"minor\", \"verb\": \"REPT\", \"lines\": [{\"type\": \"quoted\", \"text\": \"a\\\"b\"}]}",
+            "close it early"},
+        {"{\"severity\": \"minor\", \"verb\": \"REPT\", \"lines\": [{\"type\": \"plain\", \"text\": \"a\\r\\nb\"}]}",
+            "control characters"},
+        {"[]", "non-empty array"}};
+    for (String[] bad : refused) {
+      Answer answer = send("POST", base + "messages", "application/json", bad[0]);
+      assertEquals(400, answer.status(), bad[0]);
+      assertTrue(answer.json().get("error").getAsString().contains(bad[1]), answer.body());
+    }
+    String minor = "{\"severity\": \"minor\", \"verb\": \"REPT\"}";
+    assertEquals(422, send("POST", "/api/devices/127.0.1.1/tl1/messages", "application/json", minor).status());
+    assertEquals(200, send("POST", base.replace("tl1/", "stop"), "application/json", "{\"protocol\": \"tl1\"}").status());
+    assertEquals(422, send("POST", base + "messages", "application/json", minor).status());
+    send("POST", base.replace("tl1/", "start"), null, null);
+    assertEquals(1, tl1.calls.size());
+
+    Answer atag = send("POST", base + "atag", "application/json", "{\"atag\": 100}");
+    assertEquals("{\"atag\":100}", atag.body());
+    assertEquals(400, send("POST", base + "atag", "application/json", "{\"atag\": -1}").status());
+    tl1.clients = 0;
+    Answer nobody = send("POST", base + "messages", "application/json", minor);
+    assertEquals(409, nobody.status());
+    assertTrue(nobody.json().get("error").getAsString().contains("no client connected"), nobody.body());
+    assertEquals(409, send("POST", base + "atag", "application/json", "{\"atag\": 5}").status());
+
+    assertEquals("{\"pending\":[{\"id\":7,\"session\":65537,\"on\":5,\"date\":null,\"time\":null,"
+        + "\"command\":\"ENT-X:NE1:A:1:ON=5;\"}]}", get(base + "pending").body());
+    assertEquals("{\"id\":7,\"state\":\"ran\"}", send("POST", base + "pending/7/run", null, null).body());
+    assertEquals(404, send("DELETE", base + "pending/8", null, null).status());
+    assertEquals(200, send("DELETE", base + "pending/7", null, null).status());
+    assertEquals(List.of("run 7", "cancel 8", "cancel 7"), tl1.calls.subList(tl1.calls.size() - 3, tl1.calls.size()));
+
+    JsonObject stats = get("/api/stats").json().getAsJsonObject("tl1");
+    assertEquals(0, stats.get("sessions").getAsInt());
+    assertTrue(get("/metrics").body().contains("\ntessel_tl1_commands_total 4294967300\n"));
   }
 
   @Test
