@@ -43,7 +43,8 @@ import picocli.CommandLine.Spec;
 @Command(name = "./tessel ctl",
     description = "Shows and drives a running network through its control interface.",
     subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class, Ctl.Trap.class, Ctl.Inform.class,
-        Ctl.Informs.class, Ctl.Scramble.class})
+        Ctl.Informs.class, Ctl.Scramble.class, Ctl.Tl1Message.class, Ctl.Tl1Atag.class, Ctl.Tl1Pending.class,
+        Ctl.Tl1Run.class, Ctl.Tl1Cancel.class})
 public final class Ctl implements Runnable {
   static final int API_ERROR = 1;
   static final int UNREACHABLE = 3;
@@ -89,7 +90,8 @@ public final class Ctl implements Runnable {
   @Override
   public void run() {
     throw new ParameterException(spec.commandLine(),
-        "Missing command: devices, device, stop, start, restart, stats, trap, inform, informs or scramble");
+        "Missing command: devices, device, stop, start, restart, stats, trap, inform, informs, scramble, "
+            + "tl1-message, tl1-atag, tl1-pending, tl1-run or tl1-cancel");
   }
 
   /**
@@ -274,6 +276,11 @@ public final class Ctl implements Runnable {
         if (protocol.getValue().isJsonObject() && protocol.getValue().getAsJsonObject().has("counters")) {
           printProtocolStats(out, protocol.getKey(), protocol.getValue().getAsJsonObject());
         }
+      }
+      if (stats.has("tl1")) {
+        JsonObject tl1 = stats.getAsJsonObject("tl1");
+        out.println("tl1 sessions: " + tl1.get("sessions").getAsString() + ", commands per second: "
+            + tl1.get("commandsPerSecond").getAsString());
       }
       JsonArray errors = stats.has("errors") ? stats.getAsJsonArray("errors") : new JsonArray();
       out.println();
@@ -580,6 +587,127 @@ public final class Ctl implements Runnable {
   }
 
   /** ADDRESS NAME GROUP and one column per protocol any of the devices has ('-' where it has none). */
+  /**
+   * An autonomous message to every TL1 client of the device: the verb, up to two modifiers (the
+   * TL1 words right after it), then the lines: {@code "text"} a quoted line, {@code /*text*}{@code /}
+   * a comment, anything else a plain line.
+   */
+  @Command(name = "tl1-message",
+      description = "Sends an autonomous message to the device's TL1 clients; prints how many it reached.")
+  static final class Tl1Message extends ApiCommand {
+    private static final String WORD = "[A-Za-z][A-Za-z0-9]*";
+
+    @Parameters(index = "0", paramLabel = "ADDRESS", description = "the device's IPv4 address")
+    String address;
+
+    @Parameters(index = "1..*", arity = "1..*", paramLabel = "VERB [MOD1 [MOD2]] LINE...",
+        description = "the verb, its modifiers, then the lines: \"quoted\", /*comment*/ or plain")
+    List<String> words = new ArrayList<>();
+
+    @Option(names = "--severity", required = true, paramLabel = "S",
+        description = "critical, major, minor or non-alarm")
+    String severity;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonObject body = new JsonObject();
+      body.addProperty("severity", severity);
+      body.addProperty("verb", words.get(0));
+      JsonArray modifiers = new JsonArray();
+      int next = 1;
+      while (next < words.size() && modifiers.size() < 2 && words.get(next).matches(WORD)) {
+        modifiers.add(words.get(next++));
+      }
+      body.add("modifiers", modifiers);
+      JsonArray lines = new JsonArray();
+      for (String line : words.subList(next, words.size())) {
+        lines.add(line(line));
+      }
+      body.add("lines", lines);
+      JsonElement answer = client.post(tl1Path(address, "messages"), Optional.of(body));
+      out.println(json ? answer.toString() : "sent to " + answer.getAsJsonObject().get("clients").getAsString()
+          + " clients");
+    }
+
+    private static JsonObject line(String text) {
+      JsonObject line = new JsonObject();
+      boolean quoted = text.length() >= 2 && text.startsWith("\"") && text.endsWith("\"");
+      boolean comment = text.length() >= 4 && text.startsWith("/*") && text.endsWith("*/");
+      line.addProperty("type", quoted ? "quoted" : comment ? "comment" : "plain");
+      line.addProperty("text", quoted ? text.substring(1, text.length() - 1)
+          : comment ? text.substring(2, text.length() - 2) : text);
+      return line;
+    }
+  }
+
+  @Command(name = "tl1-atag", description = "Sets the ATAG of the device's next autonomous message.")
+  static final class Tl1Atag extends ApiCommand {
+    @Parameters(index = "0", paramLabel = "ADDRESS", description = "the device's IPv4 address")
+    String address;
+
+    @Parameters(index = "1", paramLabel = "N", description = "the ATAG, 0 to 999999999")
+    int atag;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonObject body = new JsonObject();
+      body.addProperty("atag", atag);
+      JsonElement answer = client.post(tl1Path(address, "atag"), Optional.of(body));
+      out.println(json ? answer.toString() : "next ATAG " + atag);
+    }
+  }
+
+  @Command(name = "tl1-pending", description = "Lists the device's TL1 commands waiting for their activation.")
+  static final class Tl1Pending extends ApiCommand {
+    @Parameters(paramLabel = "ADDRESS", description = "the device's IPv4 address")
+    String address;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = client.get(tl1Path(address, "pending"));
+      if (json) {
+        printJson(out, answer);
+      } else {
+        printObjects(out, answer.getAsJsonObject().getAsJsonArray("pending"));
+      }
+    }
+  }
+
+  /** tl1-run and tl1-cancel: one waiting command of a device, by its ID. */
+  abstract static class PendingCommand extends ApiCommand {
+    @Parameters(index = "0", paramLabel = "ADDRESS", description = "the device's IPv4 address")
+    String address;
+
+    @Parameters(index = "1", paramLabel = "ID", description = "the waiting command's ID (see tl1-pending)")
+    int id;
+
+    String path() {
+      return tl1Path(address, "pending/" + id);
+    }
+  }
+
+  @Command(name = "tl1-run", description = "Runs a waiting TL1 command now, on its session.")
+  static final class Tl1Run extends PendingCommand {
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = client.post(path() + "/run", Optional.empty());
+      out.println(json ? answer.toString() : "ran " + id);
+    }
+  }
+
+  @Command(name = "tl1-cancel", description = "Drops a waiting TL1 command without running it.")
+  static final class Tl1Cancel extends PendingCommand {
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = client.delete(path());
+      out.println(json ? answer.toString() : "cancelled " + id);
+    }
+  }
+
+  private static String tl1Path(String address, String rest) {
+    return "/api/devices/" + AdminClient.encode(address) + "/tl1/" + rest;
+  }
+
   private static void printDevices(PrintWriter out, JsonArray devices) {
     Set<String> protocols = new LinkedHashSet<>();
     for (JsonElement device : devices) {

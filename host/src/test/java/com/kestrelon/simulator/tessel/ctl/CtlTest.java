@@ -91,9 +91,18 @@ class CtlTest {
       reply(exchange, 200, exchange.getRequestMethod().equals("PUT")
           ? "{\"enabled\": true, \"devices\": [\"10.0.0.5\"], \"requests\": {}, \"responses\": {\"reqid\": 5, \"community\": \"x\"}}"
           : "{\"enabled\": false}");
+    } else if (uri.getPath().startsWith("/api/devices/10.0.0.5/tl1/")) {
+      String rest = uri.getPath().substring("/api/devices/10.0.0.5/tl1/".length());
+      reply(exchange, 200, switch (rest) {
+        case "messages" -> "{\"clients\": 2}";
+        case "atag" -> "{\"atag\": 100}";
+        case "pending" -> "{\"pending\": [{\"id\": 7, \"session\": 65537, \"on\": 5, \"date\": null,"
+            + " \"time\": null, \"command\": \"ENT-X:NE1:A:1:ON=5;\"}]}";
+        default -> "{\"id\": 7}";
+      });
     } else if (uri.getPath().equals("/api/stats")) {
       reply(exchange, 200, "{\"snmp\": {\"counters\": {\"snmpInPkts\": 12, \"snmpInBadVersions\": 0},"
-          + " \"requestsPerSecond\": 3.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
+          + " \"requestsPerSecond\": 3.5}, \"tl1\": {\"sessions\": 4, \"commandsPerSecond\": 1.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
     } else {
       reply(exchange, 404, "{\"error\": \"no device at 10.9.9.9\"}");
     }
@@ -199,6 +208,28 @@ class CtlTest {
   }
 
   @Test
+  void tl1CommandsSendMessagesAtagsAndDriveWaitingCommands() {
+    assertEquals(0, ctl("--admin", url, "tl1-message", "10.0.0.5", "--severity", "critical", "REPT", "ALM", "EQPT",
+        "\"SLOT-1:CR,LOS\"", "/*fan*/", "plain text"));
+    assertEquals("sent to 2 clients\n", out);
+    assertEquals("POST /api/devices/10.0.0.5/tl1/messages null {\"severity\":\"critical\",\"verb\":\"REPT\","
+        + "\"modifiers\":[\"ALM\",\"EQPT\"],\"lines\":[{\"type\":\"quoted\",\"text\":\"SLOT-1:CR,LOS\"},"
+        + "{\"type\":\"comment\",\"text\":\"fan\"},{\"type\":\"plain\",\"text\":\"plain text\"}]}", requests.get(0));
+    assertEquals(0, ctl("--admin", url, "tl1-message", "10.0.0.5", "--severity", "minor", "REPT", "EVT", "\"x\""));
+    assertTrue(requests.get(1).contains("\"modifiers\":[\"EVT\"],\"lines\":[{\"type\":\"quoted\""), requests.get(1));
+    assertEquals(0, ctl("--admin", url, "tl1-atag", "10.0.0.5", "100"));
+    assertEquals("POST /api/devices/10.0.0.5/tl1/atag null {\"atag\":100}", requests.get(2));
+    assertEquals(0, ctl("--admin", url, "tl1-pending", "10.0.0.5"));
+    assertTrue(out.lines().anyMatch(line -> line.matches("7 +65537 +5 +.*ENT-X:NE1:A:1:ON=5;")), out);
+    assertEquals(0, ctl("--admin", url, "tl1-run", "10.0.0.5", "7"));
+    assertEquals(0, ctl("--admin", url, "tl1-cancel", "10.0.0.5", "7"));
+    assertEquals(List.of("POST /api/devices/10.0.0.5/tl1/pending/7/run", "DELETE /api/devices/10.0.0.5/tl1/pending/7"),
+        requests.subList(4, 6).stream().map(r -> r.split(" null")[0]).toList());
+    assertEquals(2, ctl("--admin", url, "tl1-message", "10.0.0.5", "REPT"));
+    assertEquals(6, requests.size(), "a usage error sends nothing");
+  }
+
+  @Test
   void scrambleSetsShowsAndTurnsOff() {
     assertEquals(0, ctl("--admin", url, "scramble", "--devices", "10.0.0.5, 10.0.0.6", "--responses",
         "reqid=5,community=12,oid=1.3.6"));
@@ -221,6 +252,7 @@ class CtlTest {
   void statsShowsNonZeroCountersRateAndErrors() {
     assertEquals(0, ctl("stats", "--admin", url));
     assertTrue(out.contains("snmp requests per second: 3.5"), out);
+    assertTrue(out.contains("tl1 sessions: 4, commands per second: 1.5"), out);
     assertTrue(out.lines().anyMatch(line -> line.matches("snmpInPkts +12")), out);
     assertTrue(!out.contains("snmpInBadVersions"), out);
     assertTrue(out.lines().anyMatch(line -> line.matches("127\\.0\\.0\\.9 +2")), out);
