@@ -208,6 +208,8 @@ def test_dashboard_asks_for_the_token_then_shows_and_starts_a_stopped_device(net
         assert browser.evaluate(state) == "stopped"
         assert browser.evaluate('document.querySelector(\'tr[data-group="routers"] [data-state="stopped"]\')'
                                 '.textContent') == "1"
+        assert browser.evaluate('document.getElementById("tl1-value").textContent') == \
+            "TL1: 0 sessions, 0.0 commands/s"
         assert browser.evaluate(f'[...document.querySelectorAll(\'#informs tr[data-inform="{inform_id}"] td\')]'
                                 '.map((cell) => cell.textContent)') == [str(inform_id), "127.0.6.1", to, "pending", "1"]
         SCREENSHOT.unlink(missing_ok=True)
