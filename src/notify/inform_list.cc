@@ -62,6 +62,13 @@ InformList::Added InformList::Add(PendingInform inform, std::uint64_t now) {
   inform.sends = 1;
   inform.deadline = DeadlineAfter(now, inform.target.timeout);
   LOG_TRACE("Sending Inform ...\n");
+  if (informs_.size() >= kMaxPending) {
+    lock.unlock();
+    LOG_ERROR("The inform %u is dropped: %zu informs wait for their Response already\n",
+              inform.informId, kMaxPending);
+    dropped_(inform);
+    return {inform.informId, false};
+  }
   if (!sender_(inform)) {
     lock.unlock();
     LOG_ERROR("The inform %u cannot be sent: dropped\n", inform.informId);

@@ -85,8 +85,12 @@ class InformList {
 
   // An inform ID for an inform that is added later (one without an ID gets its own in Add).
   std::uint32_t ReserveInformId();
-  // Sends the inform and keeps it until now + timeout. An inform whose first send fails is
-  // reported dropped at once and not kept.
+  // The most informs kept waiting at once: a flood that raises informs (a sink that takes them
+  // and requests with a bad community, say) cannot grow the list without bound.
+  static constexpr std::size_t kMaxPending = 10000;
+
+  // Sends the inform and keeps it until now + timeout. An inform whose first send fails, or that
+  // finds kMaxPending informs waiting, is reported dropped at once and not kept.
   struct Added {
     std::uint32_t informId = 0;
     bool sent = false;

@@ -89,7 +89,7 @@ TEST(InformListTest, OnlyTheManagerItWasSentToAcknowledges) {
 }
 
 // An inform that cannot be sent is dropped at once, on its first send as on a retry.
-TEST(InformListTest, InformThatCannotBeSentIsDroppedAtOnce) {
+TEST(InformListTest, InformThatCannotBeSentOrKeptIsDroppedAtOnce) {
   Recorder recorder;
   recorder.refuse = true;
   EXPECT_FALSE(recorder.list.Add(Inform(1, 5, 3), 0).sent);
@@ -101,6 +101,14 @@ TEST(InformListTest, InformThatCannotBeSentIsDroppedAtOnce) {
   EXPECT_EQ(recorder.list.Expire(5000), std::nullopt);
   ASSERT_EQ(recorder.dropped.size(), 2u);
   EXPECT_EQ(recorder.dropped[1].sends, 2u);
+
+  recorder.refuse = false;
+  for (std::size_t i = 0; i < InformList::kMaxPending; ++i) recorder.list.Add(Inform(3, 5, 0), 0);
+  int sends = recorder.sends;
+  EXPECT_FALSE(recorder.list.Add(Inform(4, 5, 0), 0).sent);
+  EXPECT_EQ(recorder.sends, sends);
+  EXPECT_EQ(recorder.list.Pending(), InformList::kMaxPending);
+  EXPECT_EQ(recorder.dropped.back().requestId, 4);
 }
 
 // Senders, acknowledgers and the timer thread at once: every inform ends exactly once, answered
