@@ -204,19 +204,9 @@ public final class TL1Codes {
 
   private TL1Codes() {}
 
-  /** How many error codes there are; they are numbered 1 to this. */
-  public static int errorCount() {
-    return ERRORS.length;
-  }
-
   /** The number of an error code (1..176), 0 when it is not one. */
   public static int errorNumber(String code) {
     return NUMBERS.getOrDefault(code, 0);
-  }
-
-  /** The four-letter code of error {@code number} (1..176). */
-  public static String errorCode(int number) {
-    return ERRORS[number - 1][0];
   }
 
   /** The text of error {@code number} (1..176). */

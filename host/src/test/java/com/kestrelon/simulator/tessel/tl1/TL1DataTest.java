@@ -11,6 +11,7 @@ import com.kestrelon.simulator.tessel.tl1.TL1Data.LineType;
 import java.nio.file.Path;
 import java.util.List;
 import java.util.Optional;
+import java.util.stream.Stream;
 import org.junit.jupiter.api.Test;
 import org.junit.jupiter.params.ParameterizedTest;
 import org.junit.jupiter.params.provider.CsvSource;
@@ -21,7 +22,7 @@ class TL1DataTest {
       # an element
       [RTRV-ALM]
       COMPLD
-      "{AID}:CR,LOS,SA"
+      "{AID}:CR,LOS,SA"\r
       /*{SID} alarms*/
       ALARMS # OF {SID}
 
@@ -87,6 +88,13 @@ class TL1DataTest {
     DeviceDataException fault = assertThrows(DeviceDataException.class,
         () -> TL1Data.parse("bad.tl1", text.replace("\\n", "\n")));
     assertTrue(fault.getMessage().startsWith("bad.tl1:" + expected), fault.getMessage());
+  }
+
+  @Test
+  void errorCodesKeepTheEnginesNumbers() {
+    assertEquals(List.of(1, 51, 72, 87, 105, 168, 175, 176, 0), Stream.of("EANS", "IIAC", "PLNA", "SAAS", "SCNF",
+        "SWLD", "PIUI", "AIDT", "iiac").map(TL1Codes::errorNumber).toList());
+    assertEquals("INVALID DATE TIME", TL1Codes.errorText(176));
   }
 
   @Test
