@@ -2,12 +2,12 @@ package com.kestrelon.simulator.tessel;
 
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.data.ValueText;
+import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
 import com.kestrelon.simulator.tessel.network.Network.Tl1;
-import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.NetworkFile;
 import com.kestrelon.simulator.tessel.network.NetworkFileException;
 import com.kestrelon.simulator.tessel.tl1.TL1Data;
@@ -65,7 +65,8 @@ public final class LaunchOptions {
       description = "TL1 data file: the devices also answer TL1 (without SNMP unless an SNMP option is given)")
   Path tl1DataFile;
 
-  @Option(names = "--tl1-port", paramLabel = "P", description = "TCP port of every device's TL1 sessions (default 3083)")
+  @Option(names = "--tl1-port", paramLabel = "P",
+      description = "TCP port of every device's TL1 sessions (default 3083)")
   Integer tl1Port;
 
   @Option(names = "--tl1-keepalive", paramLabel = "S",
@@ -133,7 +134,8 @@ public final class LaunchOptions {
    */
   public Network network(Path defaultNetwork) throws UsageException, NetworkFileException {
     Object[][] paths = {{"--network", networkFile}, {"--snmp-data", dataFile}, {"--snmpv3", snmpV3File},
-        {"--tl1-data", tl1DataFile}, {"--log-file", logFile}, {"--admin-token-file", adminTokenFile}, {"--state-dir", stateDir}};
+        {"--tl1-data", tl1DataFile}, {"--log-file", logFile}, {"--admin-token-file", adminTokenFile},
+        {"--state-dir", stateDir}};
     for (Object[] path : paths) {
       if (path[1] != null && path[1].toString().isEmpty()) {
         throw new UsageException(path[0] + " needs a value");

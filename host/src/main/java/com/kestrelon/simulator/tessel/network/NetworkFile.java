@@ -208,7 +208,8 @@ public final class NetworkFile {
     for (int i = 0; i < users.size(); i++) {
       String user = users.get(i).user();
       if (users.subList(0, i).stream().anyMatch(earlier -> earlier.user().equals(user))) {
-        throw fault(((SequenceNode) keys.get("users").getValueNode()).getValue().get(i), "a second user '" + user + "'");
+        Node item = ((SequenceNode) keys.get("users").getValueNode()).getValue().get(i);
+        throw fault(item, "a second user '" + user + "'");
       }
     }
     boolean requireLogin = keys.containsKey("require-login") && flag(keys.get("require-login"));
