@@ -1,18 +1,22 @@
 package com.kestrelon.simulator.tessel;
 
+import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.Network.Tl1;
 import com.kestrelon.simulator.tessel.network.NetworkFile;
 import com.kestrelon.simulator.tessel.network.NetworkFileException;
+import com.kestrelon.simulator.tessel.tl1.TL1Data;
 import java.nio.ByteBuffer;
 import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.List;
 import java.util.Optional;
+import java.util.OptionalInt;
 import picocli.CommandLine;
 import picocli.CommandLine.Command;
 import picocli.CommandLine.Option;
@@ -56,6 +60,18 @@ public final class LaunchOptions {
   @Option(names = "--write-community", paramLabel = "C",
       description = "community for writes, also accepted for reads (default private)")
   String writeCommunity;
+
+  @Option(names = "--tl1-data", paramLabel = "FILE",
+      description = "TL1 data file: the devices also answer TL1 (without SNMP unless an SNMP option is given)")
+  Path tl1DataFile;
+
+  @Option(names = "--tl1-port", paramLabel = "P",
+      description = "TCP port of every device's TL1 sessions (default 3083)")
+  Integer tl1Port;
+
+  @Option(names = "--tl1-keepalive", paramLabel = "S",
+      description = "seconds a silent TL1 session stays open; 0 for ever (default 0)")
+  Integer tl1KeepAlive;
 
   @Option(names = "--log-level", paramLabel = "0..3", description = "detail of the engine's log; 0 writes none")
   Integer logLevel;
@@ -118,7 +134,8 @@ public final class LaunchOptions {
    */
   public Network network(Path defaultNetwork) throws UsageException, NetworkFileException {
     Object[][] paths = {{"--network", networkFile}, {"--snmp-data", dataFile}, {"--snmpv3", snmpV3File},
-        {"--log-file", logFile}, {"--admin-token-file", adminTokenFile}, {"--state-dir", stateDir}};
+        {"--tl1-data", tl1DataFile}, {"--log-file", logFile}, {"--admin-token-file", adminTokenFile},
+        {"--state-dir", stateDir}};
     for (Object[] path : paths) {
       if (path[1] != null && path[1].toString().isEmpty()) {
         throw new UsageException(path[0] + " needs a value");
@@ -136,10 +153,20 @@ public final class LaunchOptions {
   }
 
   private List<String> groupFlags() {
+    List<String> given = snmpFlags();
+    given.addAll(given(new Object[][] {{"--devices", devices}, {"--address", address}, {"--tl1-data", tl1DataFile},
+        {"--tl1-port", tl1Port}, {"--tl1-keepalive", tl1KeepAlive}}));
+    return given;
+  }
+
+  private List<String> snmpFlags() {
+    return given(new Object[][] {{"--snmp-data", dataFile}, {"--snmpv3", snmpV3File}, {"--snmp-port", port},
+        {"--read-community", readCommunity}, {"--write-community", writeCommunity}});
+  }
+
+  /** The names of the flags given, of {name, value} pairs. */
+  private static List<String> given(Object[][] flags) {
     List<String> given = new ArrayList<>();
-    Object[][] flags = {{"--snmp-data", dataFile}, {"--snmpv3", snmpV3File}, {"--devices", devices},
-        {"--address", address}, {"--snmp-port", port}, {"--read-community", readCommunity},
-        {"--write-community", writeCommunity}};
     for (Object[] flag : flags) {
       if (flag[1] != null) {
         given.add((String) flag[0]);
@@ -148,22 +175,51 @@ public final class LaunchOptions {
     return given;
   }
 
-  /** The one-group network of the device flags, named after its data file. */
-  private Network flagNetwork() throws UsageException {
+  /**
+   * The one-group network of the device flags, named after its SNMP data file, or its TL1 data
+   * file when it serves TL1 alone.
+   */
+  private Network flagNetwork() throws UsageException, NetworkFileException {
     int count = devices == null ? 100 : number("--devices", devices, 1, Integer.MAX_VALUE);
     long first = address == null ? 0x7F00_0101L : parseAddress(address);
     if (first + count - 1 > LAST_ADDRESS) {
       throw new UsageException(count + " devices from " + Network.dotted(first) + " run past 255.255.255.255");
     }
-    Path data = dataFile != null ? dataFile : Launcher.defaultData();
-    Snmp snmp = new Snmp(port == null ? 1161 : number("--snmp-port", port, 1, 65534), data,
+    Optional<Tl1> tl1 = tl1();
+    Optional<Snmp> snmp = tl1.isEmpty() || !snmpFlags().isEmpty() ? Optional.of(snmp()) : Optional.empty();
+    Path named = snmp.isPresent() ? snmp.get().data() : tl1DataFile;
+    String name = named.getFileName().toString().replaceFirst("\\.[^.]*$", "");
+    Group group = new Group(name.isEmpty() ? "devices" : name, count, first, "{address}", snmp, List.of(),
+        List.of(), tl1);
+    return new Network(new Log(0, Path.of("tessel.log")), Optional.of(new Admin("127.0.0.1", 8161)),
+        Path.of(System.getProperty("user.home"), ".local", "state", "tessel"), List.of(group));
+  }
+
+  private Snmp snmp() throws UsageException {
+    return new Snmp(port == null ? 1161 : number("--snmp-port", port, 1, 65534),
+        dataFile != null ? dataFile : Launcher.defaultData(),
         Optional.of(snmpV3File != null ? snmpV3File : Launcher.defaultSnmpV3()),
         community("--read-community", readCommunity, "public"),
         community("--write-community", writeCommunity, "private"));
-    String name = data.getFileName().toString().replaceFirst("\\.[^.]*$", "");
-    Group group = new Group(name.isEmpty() ? "devices" : name, count, first, "{address}", Optional.of(snmp));
-    return new Network(new Log(0, Path.of("tessel.log")), Optional.of(new Admin("127.0.0.1", 8161)),
-        Path.of(System.getProperty("user.home"), ".local", "state", "tessel"), List.of(group));
+  }
+
+  /** The TL1 agents of the flags: none without --tl1-data, which the other TL1 flags need. */
+  private Optional<Tl1> tl1() throws UsageException, NetworkFileException {
+    if (tl1DataFile == null) {
+      String orphan = tl1Port != null ? "--tl1-port" : tl1KeepAlive != null ? "--tl1-keepalive" : null;
+      if (orphan != null) {
+        throw new UsageException(orphan + " needs --tl1-data");
+      }
+      return Optional.empty();
+    }
+    int tl1PortNumber = tl1Port == null ? Tl1.DEFAULT_PORT : number("--tl1-port", tl1Port, 1, 65535);
+    int keepAlive = tl1KeepAlive == null ? 0 : number("--tl1-keepalive", tl1KeepAlive, 0, Integer.MAX_VALUE);
+    try {
+      return Optional.of(new Tl1(tl1PortNumber, OptionalInt.empty(), keepAlive, tl1DataFile,
+          TL1Data.load(tl1DataFile), List.of(), false, "--tl1-data"));
+    } catch (DeviceDataException e) {
+      throw new NetworkFileException(e.file(), e.line(), e.reason());
+    }
   }
 
   private Network overridden(Network network) throws UsageException {

@@ -144,6 +144,11 @@ public final class Launcher {
       err.println(e.getMessage());
       return 2;
     }
+    Optional<String> tl1 = tl1Section(network);
+    if (tl1.isPresent()) {
+      err.println(tl1.get() + ": tl1 is not available yet");
+      return 2;
+    }
     Optional<Control> control;
     try {
       control = control(network, options);
@@ -162,6 +167,11 @@ public final class Launcher {
       return 2;
     }
     return serve(network, snmp, control, out, err);
+  }
+
+  /** Where the first TL1 section is given: the engine does not serve TL1 yet. */
+  private static Optional<String> tl1Section(Network network) {
+    return network.groups().stream().flatMap(group -> group.tl1().stream()).map(Network.Tl1::where).findFirst();
   }
 
   /** Where the control interface listens, and its token. */

@@ -10,6 +10,7 @@ import static org.junit.jupiter.api.Assertions.fail;
 import com.kestrelon.simulator.tessel.control.AgentState;
 import com.kestrelon.simulator.tessel.control.Device;
 import com.kestrelon.simulator.tessel.control.DeviceTable;
+import com.kestrelon.simulator.tessel.network.Network;
 import java.io.ByteArrayOutputStream;
 import java.io.IOException;
 import java.io.PrintStream;
@@ -101,6 +102,9 @@ class LauncherTest {
       "--devices 0;                --devices takes a number from 1",
       "--snmp-data=;               --snmp-data needs a value",
       "--snmp-port 65535;          --snmp-port takes a number from 1 to 65534",
+      "--tl1-keepalive 5;          --tl1-keepalive needs --tl1-data",
+      "--tl1-data t.tl1 --tl1-port 65536; --tl1-port takes a number from 1 to 65535",
+      "--tl1-data=;                --tl1-data needs a value",
       "--address 127.0.1.256;      --address takes an IPv4 address such as 127.0.1.1, not '127.0.1.256'",
       "--read-community a,b;       --read-community takes a non-empty community without ','",
       "--admin 127.0.0.1;          --admin takes HOST:PORT",
@@ -136,6 +140,32 @@ class LauncherTest {
     err.reset();
     assertEquals(2, runToEnd("--network", network.toString()));
     assertTrue(err().startsWith(network + ":3: count takes a whole number from 1"), err());
+    Path tl1 = Files.writeString(dir.resolve("bad.tl1"), "[RTRV-HDR]\nCOMPLETE\n");
+    err.reset();
+    assertEquals(2, runToEnd("--tl1-data", tl1.toString()));
+    assertTrue(err().startsWith(tl1 + ":2: unknown completion code"), err());
+    assertEquals("", out());
+  }
+
+  @Test
+  void tl1FlagsDescribeTheOneGroupAndTl1IsRefusedAtLaunchForNow(@TempDir Path dir) throws Exception {
+    Path data = Files.writeString(dir.resolve("optical.tl1"), "[RTRV-HDR]\nCOMPLD\n");
+    Network.Group alone = LaunchOptions.parse(new String[] {"--tl1-data", data.toString(), "--tl1-port", "4000",
+        "--tl1-keepalive", "30"}).network(Path.of("unused.yaml")).groups().get(0);
+    assertEquals(List.of("optical", "false", "4000", "30", "[RTRV-HDR]"), List.of(alone.name(),
+        "" + alone.snmp().isPresent(), "" + alone.tl1().get().port(), "" + alone.tl1().get().keepAlive(),
+        "" + alone.tl1().get().data().codes()));
+    Network.Group both = LaunchOptions.parse(new String[] {"--tl1-data", data.toString(), "--snmp-port", "2161"})
+        .network(Path.of("unused.yaml")).groups().get(0);
+    assertEquals(List.of("router", "2161", "3083"),
+        List.of(both.name(), "" + both.snmp().get().port(), "" + both.tl1().get().port()));
+    assertEquals(2, runToEnd("--tl1-data", data.toString(), "--admin", "off"));
+    assertEquals("--tl1-data: tl1 is not available yet", err().strip());
+    Path network = Files.writeString(dir.resolve("network.yaml"),
+        "groups:\n  - name: a\n    count: 1\n    address: 127.0.9.1\n    tl1: {data: optical.tl1}\n");
+    err.reset();
+    assertEquals(2, runToEnd("--network", network.toString(), "--admin", "off"));
+    assertEquals(network + ":5: tl1 is not available yet", err().strip());
     assertEquals("", out());
   }
 

@@ -2,11 +2,14 @@ package com.kestrelon.simulator.tessel.network;
 
 import com.kestrelon.simulator.tessel.control.Notification;
 import com.kestrelon.simulator.tessel.data.ValueText;
+import com.kestrelon.simulator.tessel.tl1.TL1Data;
+import com.kestrelon.simulator.tessel.tl1.TL1User;
 import java.nio.ByteBuffer;
 import java.time.Duration;
 import java.nio.file.Path;
 import java.util.List;
 import java.util.Optional;
+import java.util.OptionalInt;
 import java.util.regex.Matcher;
 import java.util.regex.Pattern;
 
@@ -95,13 +98,20 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
    * @param snmp the group's SNMP agents; empty when the group serves no SNMP
    * @param trapSinks the managers that receive its devices' standard traps, besides the network's
    * @param notifications what every device of the group sends on a timer
+   * @param tl1 the group's TL1 agents; empty when the group serves no TL1
    */
   public record Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
-      List<TrapSink> trapSinks, List<Scheduled> notifications) {
+      List<TrapSink> trapSinks, List<Scheduled> notifications, Optional<Tl1> tl1) {
 
     public Group {
       trapSinks = List.copyOf(trapSinks);
       notifications = List.copyOf(notifications);
+    }
+
+    /** A group without TL1. */
+    public Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
+        List<TrapSink> trapSinks, List<Scheduled> notifications) {
+      this(name, count, firstAddress, deviceName, snmp, trapSinks, notifications, Optional.empty());
     }
 
     /** A group that sends nothing on a timer. */
@@ -153,6 +163,26 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
 
     public int notificationPort() {
       return port + 1;
+    }
+  }
+
+  /**
+   * The TL1 agent every device of a group runs; the device's name is its SID.
+   *
+   * @param port the TCP port of raw sessions
+   * @param telnetPort the TCP port of interactive (Telnet) sessions, if any
+   * @param keepAlive seconds a silent session stays open; 0 for ever
+   * @param data the answers to commands, read from {@code dataFile}
+   * @param users the users ACT-USER accepts
+   * @param requireLogin whether a session must log in before any other command
+   * @param where where the section was given: {@code FILE:LINE}, or the flag
+   */
+  public record Tl1(int port, OptionalInt telnetPort, int keepAlive, Path dataFile, TL1Data data,
+      List<TL1User> users, boolean requireLogin, String where) {
+    public static final int DEFAULT_PORT = 3083;
+
+    public Tl1 {
+      users = List.copyOf(users);
     }
   }
 

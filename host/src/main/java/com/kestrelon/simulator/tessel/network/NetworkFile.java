@@ -5,13 +5,17 @@ import com.google.gson.JsonElement;
 import com.google.gson.JsonObject;
 import com.google.gson.JsonPrimitive;
 import com.kestrelon.simulator.tessel.control.Notification;
+import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Scheduled;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.Network.Tl1;
 import com.kestrelon.simulator.tessel.network.Network.TrapSink;
+import com.kestrelon.simulator.tessel.tl1.TL1Data;
+import com.kestrelon.simulator.tessel.tl1.TL1User;
 import java.io.IOException;
 import java.io.Reader;
 import java.nio.ByteBuffer;
@@ -25,6 +29,7 @@ import java.util.LinkedHashMap;
 import java.util.List;
 import java.util.Map;
 import java.util.Optional;
+import java.util.OptionalInt;
 import java.util.regex.Matcher;
 import java.util.regex.Pattern;
 import org.yaml.snakeyaml.Yaml;
@@ -53,6 +58,8 @@ public final class NetworkFile {
   private static final List<String> SINK_KEYS =
       List.of("version", "address", "port", "community", "user", "context", "kind", "timeout", "retries");
   private static final List<String> SNMP_KEYS = List.of("port", "data", "v3", "read-community", "write-community");
+  private static final List<String> TL1_KEYS =
+      List.of("port", "data", "keepalive", "telnet-port", "users", "require-login");
   private static final List<String> SCHEDULED_KEYS = List.of("every", "to", "kind", "version", "oid",
       "enterprise", "generic", "specific", "varbinds", "community", "user", "context", "timeout", "retries");
   /** Keys a notification to the trap sinks takes from each sink instead. */
@@ -62,13 +69,15 @@ public final class NetworkFile {
   private static final Duration SHORTEST_PERIOD = Duration.ofMillis(100);
   private static final Duration LONGEST_PERIOD = Duration.ofDays(1);
   /** Protocol sections whose devices the host cannot serve yet. */
-  private static final List<String> LATER_PROTOCOLS = List.of("tl1", "cli");
+  private static final List<String> LATER_PROTOCOLS = List.of("cli");
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
 
   private final String name;
   private final Path folder;
   private final List<Group> groups = new ArrayList<>();
   private final List<PortUse> ports = new ArrayList<>();
+  /** TL1 data files read so far: groups that share one share what was read. */
+  private final Map<Path, TL1Data> tl1Data = new LinkedHashMap<>();
 
   /** A port a group's devices bind on each of their addresses, and what for. */
   private record PortUse(int number, String purpose, String group) {}
@@ -170,11 +179,71 @@ public final class NetworkFile {
     }
     String deviceName = keys.containsKey("device-name") ? deviceName(keys.get("device-name")) : "{address}";
     Optional<Snmp> snmp = keys.containsKey("snmp") ? Optional.of(snmp(keys.get("snmp"), groupName)) : Optional.empty();
-    if (snmp.isEmpty()) {
-      throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp)");
+    Optional<Tl1> tl1 = keys.containsKey("tl1") ? Optional.of(tl1(keys.get("tl1"))) : Optional.empty();
+    if (snmp.isEmpty() && tl1.isEmpty()) {
+      throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp, tl1)");
     }
     return new Group(groupName, count, first, deviceName, snmp, trapSinks(keys.get("trap-sinks")),
-        notifications(keys.get("notifications")));
+        notifications(keys.get("notifications")), tl1);
+  }
+
+  /**
+   * A {@code tl1} section. Its ports are TCP ports bound on each device's own address, so they
+   * clash with nothing of another group; the raw and the Telnet port of one device must differ.
+   */
+  private Tl1 tl1(NodeTuple entry) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(entry.getValueNode(), "tl1", TL1_KEYS);
+    int port = keys.containsKey("port") ? number(keys.get("port"), 1, 65535) : Tl1.DEFAULT_PORT;
+    OptionalInt telnetPort = OptionalInt.empty();
+    if (keys.containsKey("telnet-port")) {
+      telnetPort = OptionalInt.of(number(keys.get("telnet-port"), 1, 65535));
+      if (telnetPort.getAsInt() == port) {
+        throw fault(keys.get("telnet-port"), "telnet-port " + port + " is the raw TL1 port too; they need two ports");
+      }
+    }
+    int keepAlive = keys.containsKey("keepalive") ? number(keys.get("keepalive"), 0, Integer.MAX_VALUE) : 0;
+    Path dataFile = existingFile(required(keys, "data", entry.getKeyNode(), "tl1"));
+    TL1Data data = tl1Data(dataFile);
+    List<TL1User> users = list(keys.get("users"), "users", this::user);
+    for (int i = 0; i < users.size(); i++) {
+      String user = users.get(i).user();
+      if (users.subList(0, i).stream().anyMatch(earlier -> earlier.user().equals(user))) {
+        Node item = ((SequenceNode) keys.get("users").getValueNode()).getValue().get(i);
+        throw fault(item, "a second user '" + user + "'");
+      }
+    }
+    boolean requireLogin = keys.containsKey("require-login") && flag(keys.get("require-login"));
+    if (requireLogin && users.isEmpty()) {
+      throw fault(keys.get("require-login"), "require-login needs users: nobody could log in");
+    }
+    return new Tl1(port, telnetPort, keepAlive, dataFile, data, users, requireLogin,
+        name + ":" + (entry.getKeyNode().getStartMark().getLine() + 1));
+  }
+
+  /** A TL1 data file, read once however many groups use it; its faults name its own lines. */
+  private TL1Data tl1Data(Path file) throws NetworkFileException {
+    TL1Data data = tl1Data.get(file);
+    if (data == null) {
+      try {
+        data = TL1Data.load(file);
+      } catch (DeviceDataException e) {
+        throw new NetworkFileException(e.file(), e.line(), e.reason());
+      }
+      tl1Data.put(file, data);
+    }
+    return data;
+  }
+
+  private TL1User user(Node node) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(node, "a user", List.of("user", "password"));
+    return new TL1User(text(required(keys, "user", node, "a user")), text(required(keys, "password", node, "a user")));
+  }
+
+  private boolean flag(NodeTuple entry) throws NetworkFileException {
+    if (isWord(entry.getValueNode(), "true") || isWord(entry.getValueNode(), "false")) {
+      return isWord(entry.getValueNode(), "true");
+    }
+    throw fault(entry, key(entry) + " takes true or false");
   }
 
   /** A {@code notifications} list; none when the key is absent. */

@@ -1,6 +1,7 @@
 package com.kestrelon.simulator.tessel.network;
 
 import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertSame;
 import static org.junit.jupiter.api.Assertions.assertThrows;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
@@ -9,7 +10,9 @@ import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Scheduled;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
+import com.kestrelon.simulator.tessel.network.Network.Tl1;
 import com.kestrelon.simulator.tessel.network.Network.TrapSink;
+import com.kestrelon.simulator.tessel.tl1.TL1User;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.time.Duration;
@@ -33,6 +36,9 @@ class NetworkFileTest {
   /** A group whose notifications list starts on line 8. */
   private static final String TIMED =
       "  - name: b\n    count: 1\n    address: 127.0.2.1\n    snmp: {data: d.snmprec}\n    notifications:\n";
+
+  /** A group whose tl1 section starts on line 6. */
+  private static final String TL1 = "  - name: b\n    count: 1\n    address: 127.0.2.1\n    tl1: ";
 
   @TempDir
   Path dir;
@@ -75,8 +81,21 @@ class NetworkFileTest {
             "4: SNMP port 1162 clashes with the notification port of group a"),
         fault("  - {name: b, count: 1, address: 127.0.2.1, snmp: {data: d.snmprec, port: 1160}}\n",
             "3: notification port 1161 clashes with the SNMP port of group a"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    tl1: {port: 3083}\n",
-            "6: tl1 is not available yet"),
+        fault(TL1 + "{data: d.tl1, pot: 1}\n", "6: unknown key 'pot' in tl1"),
+        fault(TL1 + "{port: 3083}\n", "6: tl1 needs 'data'"),
+        fault(TL1 + "{data: gone.tl1}\n", "6: data file "),
+        fault(TL1 + "{data: d.tl1, port: 0}\n", "6: port takes a whole number from 1 to 65535, not '0'"),
+        fault(TL1 + "{data: d.tl1, port: 3083,\n           telnet-port: 3083}\n",
+            "7: telnet-port 3083 is the raw TL1 port too"),
+        fault(TL1 + "{data: d.tl1, telnet-port: 65536}\n", "6: telnet-port takes a whole number from 1 to 65535"),
+        fault(TL1 + "{data: d.tl1, keepalive: -1}\n", "6: keepalive takes a whole number from 0"),
+        fault(TL1 + "{data: d.tl1, require-login: yes, users: [{user: a, password: b}]}\n",
+            "6: require-login takes true or false"),
+        fault(TL1 + "{data: d.tl1, require-login: true}\n", "6: require-login needs users"),
+        fault(TL1 + "{data: d.tl1, users: {user: a}}\n", "6: users takes a list of users"),
+        fault(TL1 + "\n      data: d.tl1\n      users:\n        - {user: a, password: b}\n        - {user: a, password: c}\n",
+            "10: a second user 'a'"),
+        fault(TL1 + "{data: d.tl1, users: [{user: a}]}\n", "6: a user needs 'password'"),
         fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    cli: {port: 2323}\n",
             "6: cli is not available yet"),
         fault("trap-sinks: [127.0.0.1:162]\n", "3: a trap sink takes a mapping of version"),
@@ -111,6 +130,34 @@ class NetworkFileTest {
         fault("log: {level: 4}\n", "3: level takes a whole number from 0 to 3"),
         fault("admin: {listen: 127.0.0.1}\n", "3: listen takes HOST:PORT"),
         fault("state-dir: [a\n", "4: "));
+  }
+
+  @Test
+  void readsTl1SectionsWithTheirDefaultsAndAGroupWithoutSnmp() throws Exception {
+    Path file = write(FIRST_GROUP.replace("d.snmprec}}", "d.snmprec}, tl1: {data: d.tl1}}")
+        + "  - name: b\n    count: 2\n    address: 127.0.2.1\n    tl1: {data: d.tl1, port: 4000, telnet-port: 4023,\n"
+        + "          keepalive: 60, require-login: true, users: [{user: admin, password: 'p w'}, {user: u, password: v}]}\n");
+    List<Group> groups = NetworkFile.read(file).groups();
+    Tl1 plain = groups.get(0).tl1().orElseThrow();
+    assertEquals(List.of("3083", "", "0", "[]", "false", file + ":2"), List.of("" + plain.port(),
+        plain.telnetPort().isPresent() ? "x" : "", "" + plain.keepAlive(), "" + plain.users(), "" + plain.requireLogin(),
+        plain.where()));
+    Tl1 full = groups.get(1).tl1().orElseThrow();
+    assertEquals(Optional.empty(), groups.get(1).snmp());
+    assertEquals(List.of(4000, 4023, 60), List.of(full.port(), full.telnetPort().getAsInt(), full.keepAlive()));
+    assertEquals(List.of(new TL1User("admin", "p w"), new TL1User("u", "v")), full.users());
+    assertTrue(full.requireLogin());
+    assertEquals(dir.resolve("d.tl1"), full.dataFile());
+    assertSame(plain.data(), full.data(), "a data file is read once");
+    assertEquals(List.of("RTRV-HDR"), full.data().codes());
+  }
+
+  @Test
+  void faultsOfATl1DataFileNameItsOwnLine() throws Exception {
+    Path file = write("groups:\n" + TL1 + "{data: d.tl1}\n");
+    Files.writeString(dir.resolve("d.tl1"), "[RTRV-HDR]\nCOMPLD\n\n[RTRV-ALM]\nDENY XXXX\n");
+    NetworkFileException fault = assertThrows(NetworkFileException.class, () -> NetworkFile.read(file));
+    assertTrue(fault.getMessage().startsWith(dir.resolve("d.tl1") + ":5: DENY takes one code"), fault.getMessage());
   }
 
   @Test
@@ -208,6 +255,7 @@ class NetworkFileTest {
 
   private Path write(String yaml) throws Exception {
     Files.writeString(dir.resolve("d.snmprec"), "1.3.6.1.2.1.1.5.0|4|x\n");
+    Files.writeString(dir.resolve("d.tl1"), "[RTRV-HDR]\nCOMPLD\n");
     return Files.writeString(dir.resolve("network.yaml"), yaml);
   }
 }
