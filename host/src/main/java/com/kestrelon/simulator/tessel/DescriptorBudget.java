@@ -34,10 +34,17 @@ record DescriptorBudget(long softLimit, long hardLimit, long open) {
 
   /** The one line that says why only {@link #allowedAgents} of {@code requested} start. */
   String shortfall(int requested) {
-    int allowed = allowedAgents();
-    return "tessel: the open-file limit allows " + allowed + " agents, not " + requested + ": it is "
+    return shortfall(requested, allowedAgents());
+  }
+
+  /**
+   * The one line that says why only {@link #allowedAgents} of {@code requested} agents open, and
+   * how many devices start with them (a device of several protocols holds several).
+   */
+  String shortfall(int requested, long devices) {
+    return "tessel: the open-file limit allows " + allowedAgents() + " agents, not " + requested + ": it is "
         + softLimit + " (hard limit " + hardLimit + "), " + open + " descriptors are open and "
-        + RESERVE + " are kept for the engine and the JVM; starting " + allowed + " devices (more"
+        + RESERVE + " are kept for the engine and the JVM; starting " + devices + " devices (more"
         + " need a higher `ulimit -Hn`, or root with CAP_SYS_RESOURCE)";
   }
 

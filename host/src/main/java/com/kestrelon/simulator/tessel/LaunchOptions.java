@@ -32,6 +32,8 @@ import picocli.CommandLine.ParameterException;
         "a one-group network the device flags describe, or without either profiles/network.yaml."})
 public final class LaunchOptions {
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
+  /** The names of the devices of the flags when they answer TL1. */
+  static final String TL1_DEVICE_NAME = "NE{n}";
 
   @Option(names = "--network", paramLabel = "FILE", description = "the network file (YAML) to start")
   Path networkFile;
@@ -189,7 +191,10 @@ public final class LaunchOptions {
     Optional<Snmp> snmp = tl1.isEmpty() || !snmpFlags().isEmpty() ? Optional.of(snmp()) : Optional.empty();
     Path named = snmp.isPresent() ? snmp.get().data() : tl1DataFile;
     String name = named.getFileName().toString().replaceFirst("\\.[^.]*$", "");
-    Group group = new Group(name.isEmpty() ? "devices" : name, count, first, "{address}", snmp, List.of(),
+    // A TL1 device answers with its name as SID, which a TID must match: NE1, NE2, ... rather than
+    // an address, whose dots no TID may hold.
+    String deviceName = tl1.isPresent() ? TL1_DEVICE_NAME : "{address}";
+    Group group = new Group(name.isEmpty() ? "devices" : name, count, first, deviceName, snmp, List.of(),
         List.of(), tl1);
     return new Network(new Log(0, Path.of("tessel.log")), Optional.of(new Admin("127.0.0.1", 8161)),
         Path.of(System.getProperty("user.home"), ".local", "state", "tessel"), List.of(group));

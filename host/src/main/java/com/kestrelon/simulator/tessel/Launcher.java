@@ -7,6 +7,7 @@ import com.kestrelon.simulator.tessel.control.AgentState;
 import com.kestrelon.simulator.tessel.control.DeviceTable;
 import com.kestrelon.simulator.tessel.control.InformLog;
 import com.kestrelon.simulator.tessel.control.NativeNotifications;
+import com.kestrelon.simulator.tessel.control.NativeTl1Control;
 import com.kestrelon.simulator.tessel.control.NotificationSchedule;
 import com.kestrelon.simulator.tessel.control.NativeReports;
 import com.kestrelon.simulator.tessel.control.Scrambling;
@@ -19,12 +20,18 @@ import com.kestrelon.simulator.tessel.network.NetworkFileException;
 import com.kestrelon.simulator.tessel.snmp.SnmpHandler;
 import com.kestrelon.simulator.tessel.snmp.SnmpNetwork;
 import com.kestrelon.simulator.tessel.snmp.SnmpV3ConfigException;
+import com.kestrelon.simulator.tessel.tl1.TL1Handler;
+import com.kestrelon.simulator.tessel.tl1.TL1Register;
+import com.kestrelon.simulator.tessel.tl1.Tl1Network;
 import java.io.IOException;
 import java.io.PrintStream;
 import java.net.Inet6Address;
 import java.net.InetSocketAddress;
 import java.nio.file.Files;
 import java.nio.file.Path;
+import java.util.ArrayList;
+import java.util.LinkedHashMap;
+import java.util.List;
 import java.util.Map;
 import java.util.Optional;
 import java.util.function.Function;
@@ -33,7 +40,8 @@ import java.util.function.Supplier;
 /**
  * {@code ./tessel run}: reads the network (a network file, or the one group the device flags
  * describe), loads every group's device data and SNMPv3 configuration, registers the objects, the
- * SNMPv3 rows and the devices with the engine, and serves them on the calling thread until
+ * SNMPv3 rows, the TL1 command codes and the devices with the engine, and serves them on the
+ * calling thread until
  * {@link #requestStop()} (SIGINT or SIGTERM when started from {@link #main}).
  *
  * <p>Exit statuses: 0 after a stop, 1 when the engine refuses the network or no device starts,
@@ -61,6 +69,7 @@ public final class Launcher {
   private static final String DEFAULT_PROFILE = "router.snmprec";
   private static final String DEFAULT_SNMPV3 = "snmpv3.conf";
   private static final String SNMP = "snmp";
+  private static final String TL1 = "tl1";
   private static final int MAX_LOG_FILE_SIZE = 100 << 20;
   /** What {@link #start} returns when the network is up. */
   private static final int SERVING = -1;
@@ -174,6 +183,7 @@ public final class Launcher {
     return network.groups().stream().flatMap(group -> group.tl1().stream()).map(Network.Tl1::where).findFirst();
   }
 
+
   /** Where the control interface listens, and its token. */
   private record Control(InetSocketAddress listen, Optional<String> token) {}
 
@@ -236,9 +246,10 @@ public final class Launcher {
       PrintStream err) {
     // Status lines go to the output stream only: the launcher never reads them back.
     NetworkSimulator simulator = engines.apply(out);
-    int status = start(simulator, network, snmp, err);
+    Tl1Network tl1 = new Tl1Network(network, new TL1Handler(), new TL1Register());
+    int status = start(simulator, network, snmp, tl1, err);
     if (status == SERVING && control.isPresent()) {
-      status = listen(network, control.get(), err);
+      status = listen(network, control.get(), tl1.isEmpty() ? Tl1Control.NONE : new NativeTl1Control(), err);
     }
     if (status == SERVING) {
       err.println(StartReport.summary(devices)); // last: once it shows, everything serves
@@ -256,7 +267,8 @@ public final class Launcher {
    * a stop is seen between steps. Returns {@link #SERVING} when the network runs, 0 when a stop
    * came first, else the exit status of the failure; it never stops the engine itself.
    */
-  private int start(NetworkSimulator simulator, Network network, SnmpNetwork snmp, PrintStream err) {
+  private int start(NetworkSimulator simulator, Network network, SnmpNetwork snmp, Tl1Network tl1,
+      PrintStream err) {
     SnmpHandler handler = snmp.handler();
     synchronized (lifecycle) {
       if (stopRequested) {
@@ -284,16 +296,19 @@ public final class Launcher {
         err.println(e.getMessage());
         return 2;
       }
+      if (!tl1.isEmpty()) {
+        tl1.register();
+      }
     }
     DeviceTable.Builder table = new DeviceTable.Builder();
-    if (!startGroups(snmp, devicesThatFit(snmp.devices(), err), table, err)) {
+    if (!startGroups(network, snmp, tl1, table, err)) {
       return 0;
     }
     synchronized (lifecycle) {
       if (stopRequested) {
         return 0;
       }
-      devices = table.build(Map.of(SNMP, snmp));
+      devices = table.build(Map.of(SNMP, snmp, TL1, tl1));
       if (devices.running() == 0) {
         return fail(err, "no device started");
       }
@@ -308,29 +323,34 @@ public final class Launcher {
   }
 
   /**
-   * Registers and opens the devices of every group, the first {@code allowed} of them; the others
-   * are listed as failed. False when a stop came first.
+   * Registers and opens the agents of every group's devices, in file order, as many devices as the
+   * open-file limit leaves room for; the others are listed as failed. False when a stop came first.
    */
-  private boolean startGroups(SnmpNetwork snmp, int allowed, DeviceTable.Builder table, PrintStream err) {
-    StartReport report = new StartReport(err, Boolean.getBoolean("tessel.progress"), snmp.devices());
-    int done = 0;
+  private boolean startGroups(Network network, SnmpNetwork snmp, Tl1Network tl1, DeviceTable.Builder table,
+      PrintStream err) {
+    long descriptorsLeft = descriptorsThatFit(network, err);
+    StartReport report = new StartReport(err, Boolean.getBoolean("tessel.progress"), network.devices());
+    long done = 0;
+    int snmpGroup = -1;
     try {
-      for (int g = 0; g < snmp.groups().size(); g++) {
-        Group group = snmp.groups().get(g);
+      for (Group group : network.groups()) {
+        snmpGroup += group.snmp().isPresent() ? 1 : 0;
+        int perDevice = descriptorsPerDevice(group);
         for (int first = 0; first < group.count(); first += AGENTS_PER_CALL) {
           int count = Math.min(AGENTS_PER_CALL, group.count() - first);
-          int starting = Math.max(0, Math.min(count, allowed - done));
-          boolean[] opened;
+          int starting = (int) Math.min(count, descriptorsLeft / perDevice);
+          // The first devices that fit start, and none after them.
+          descriptorsLeft = starting < count ? 0 : descriptorsLeft - (long) starting * perDevice;
+          List<Map<String, AgentState>> states;
           synchronized (lifecycle) {
             if (stopRequested) {
               return false;
             }
-            opened = starting > 0 ? snmp.startAgents(g, first, starting) : new boolean[0];
+            states = startAgents(group, snmpGroup, first, count, starting, snmp, tl1);
           }
           for (int i = 0; i < count; i++) {
-            AgentState state = i < opened.length && opened[i] ? AgentState.RUNNING : AgentState.FAILED;
-            table.add(group.firstAddress() + first + i, snmp.firstAgentId(g) + first + i,
-                group.deviceName(first + i), group.name(), Map.of(SNMP, state));
+            table.add(group.firstAddress() + first + i, network.firstAgentId(group) + first + i,
+                group.deviceName(first + i), group.name(), states.get(i));
           }
           done += count;
           report.progress(done);
@@ -342,15 +362,44 @@ public final class Launcher {
     }
   }
 
+  /**
+   * Opens every protocol's agents of devices [first, first + starting) of a group; devices up to
+   * first + count that did not fit are failed. The state of each device's agents, by protocol.
+   */
+  private static List<Map<String, AgentState>> startAgents(Group group, int snmpGroup, int first, int count,
+      int starting, SnmpNetwork snmp, Tl1Network tl1) {
+    boolean[] snmpOpened = group.snmp().isPresent() && starting > 0 ? snmp.startAgents(snmpGroup, first, starting)
+        : new boolean[0];
+    List<Optional<String>> tl1Opened = group.tl1().isPresent() && starting > 0
+        ? tl1.startAgents(group, first, starting) : List.of();
+    List<Map<String, AgentState>> states = new ArrayList<>(count);
+    for (int i = 0; i < count; i++) {
+      Map<String, AgentState> device = new LinkedHashMap<>();
+      if (group.snmp().isPresent()) {
+        device.put(SNMP, i < snmpOpened.length && snmpOpened[i] ? AgentState.RUNNING : AgentState.FAILED);
+      }
+      if (group.tl1().isPresent()) {
+        device.put(TL1, i < tl1Opened.size() && tl1Opened.get(i).isEmpty() ? AgentState.RUNNING : AgentState.FAILED);
+      }
+      states.add(device);
+    }
+    return states;
+  }
+
+  /** The sockets one device of the group holds: its SNMP agent, its TL1 listener and Telnet listener. */
+  private static int descriptorsPerDevice(Group group) {
+    return (group.snmp().isPresent() ? 1 : 0) + group.tl1().map(tl1 -> tl1.telnetPort().isPresent() ? 2 : 1).orElse(0);
+  }
+
   /** Opens the control interface on the running network; returns SERVING or the exit status. */
-  private int listen(Network network, Control control, PrintStream err) {
+  private int listen(Network network, Control control, Tl1Control tl1, PrintStream err) {
     synchronized (lifecycle) {
       if (stopRequested) {
         return 0;
       }
       try {
         admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports(),
-            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling, Tl1Control.NONE);
+            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling, tl1);
       } catch (IOException e) {
         return fail(err, "the control interface cannot listen on " + control.listen() + ": " + e.getMessage());
       }
@@ -371,13 +420,30 @@ public final class Launcher {
     }
   }
 
-  /** The devices to start: all asked for, or as many as the descriptor limit leaves room for. */
-  private int devicesThatFit(int requested, PrintStream err) {
-    Optional<DescriptorBudget> budget = descriptorBudget.get();
-    if (budget.isEmpty() || budget.get().allowedAgents() >= requested) {
-      return requested;
+  /**
+   * The sockets the devices may open: all they need, or as many as the descriptor limit leaves
+   * room for (then one line says how many devices start).
+   */
+  private long descriptorsThatFit(Network network, PrintStream err) {
+    long needed = 0;
+    for (Group group : network.groups()) {
+      needed += (long) group.count() * descriptorsPerDevice(group);
     }
-    err.println(budget.get().shortfall(requested));
+    Optional<DescriptorBudget> budget = descriptorBudget.get();
+    if (budget.isEmpty() || budget.get().allowedAgents() >= needed) {
+      return needed;
+    }
+    long allowed = budget.get().allowedAgents();
+    long devicesStarting = 0;
+    for (Group group : network.groups()) {
+      long fit = Math.min(group.count(), allowed / descriptorsPerDevice(group));
+      devicesStarting += fit;
+      allowed -= fit * descriptorsPerDevice(group);
+      if (fit < group.count()) {
+        break;
+      }
+    }
+    err.println(budget.get().shortfall((int) Math.min(Integer.MAX_VALUE, needed), devicesStarting));
     return budget.get().allowedAgents();
   }
 

@@ -152,9 +152,9 @@ class LauncherTest {
     Path data = Files.writeString(dir.resolve("optical.tl1"), "[RTRV-HDR]\nCOMPLD\n");
     Network.Group alone = LaunchOptions.parse(new String[] {"--tl1-data", data.toString(), "--tl1-port", "4000",
         "--tl1-keepalive", "30"}).network(Path.of("unused.yaml")).groups().get(0);
-    assertEquals(List.of("optical", "false", "4000", "30", "[RTRV-HDR]"), List.of(alone.name(),
+    assertEquals(List.of("optical", "false", "4000", "30", "[RTRV-HDR]", "NE2"), List.of(alone.name(),
         "" + alone.snmp().isPresent(), "" + alone.tl1().get().port(), "" + alone.tl1().get().keepAlive(),
-        "" + alone.tl1().get().data().codes()));
+        "" + alone.tl1().get().data().codes(), alone.deviceName(1)));
     Network.Group both = LaunchOptions.parse(new String[] {"--tl1-data", data.toString(), "--snmp-port", "2161"})
         .network(Path.of("unused.yaml")).groups().get(0);
     assertEquals(List.of("router", "2161", "3083"),

@@ -225,11 +225,20 @@ public final class AdminServer implements AutoCloseable {
     return new Response(200, "text/html; charset=utf-8", page, Map.of());
   }
 
+  /** A group's TL1 listeners: the raw port, and the Telnet port when there is one. */
+  private static Map<String, Object> tl1Json(Network.Tl1 tl1) {
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("port", tl1.port());
+    tl1.telnetPort().ifPresent(port -> json.put("telnetPort", port));
+    return json;
+  }
+
   private Map<String, Object> networkJson() {
     List<Map<String, Object>> groups = new ArrayList<>();
     for (Network.Group group : network.groups()) {
       Map<String, Object> protocols = new LinkedHashMap<>();
       group.snmp().ifPresent(snmp -> protocols.put("snmp", Map.of("port", snmp.port())));
+      group.tl1().ifPresent(tl1 -> protocols.put("tl1", tl1Json(tl1)));
       Map<String, Object> json = new LinkedHashMap<>();
       json.put("name", group.name());
       json.put("count", group.count());

@@ -60,6 +60,21 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
     return groups.stream().mapToLong(Group::count).sum();
   }
 
+  /**
+   * The agent id of device 0 of {@code group}: ids run through the groups in file order, one per
+   * device, shared by every protocol the device serves.
+   */
+  public int firstAgentId(Group group) {
+    int first = 0;
+    for (Group each : groups) {
+      if (each == group) {
+        return first;
+      }
+      first += each.count();
+    }
+    throw new IllegalArgumentException("group " + group.name() + " is not in this network");
+  }
+
   /** The engine's log: level 0 (no log) to 3 (every operation), and its file. */
   public record Log(int level, Path file) {}
 

@@ -23,9 +23,9 @@ import java.util.Optional;
 /**
  * The SNMP agents of a network: the device data and SNMPv3 rows its groups use, loaded and checked
  * before the engine starts, then registered with the engine, and the agents opened group by group
- * and later one device at a time. Agent ids run through the groups in file order: device i of a
- * group is agent {@code firstAgentId(group) + i}. Groups that share a data file share its values
- * (each agent still keeps its own Sets).
+ * and later one device at a time. Device i of a group is agent {@code firstAgentId(group) + i},
+ * the id the network gives the device for all its protocols. Groups that share a data file share
+ * its values (each agent still keeps its own Sets).
  */
 public final class SnmpNetwork implements ProtocolAgents {
   /** The engine boots every agent starts with. */
@@ -49,19 +49,16 @@ public final class SnmpNetwork implements ProtocolAgents {
     }
   }
 
-  private SnmpNetwork(List<Group> groups, Map<Path, DeviceData> data, List<SnmpV3Config> snmpV3,
-      List<TrapSink> networkSinks) throws DeviceDataException {
+  private SnmpNetwork(List<Group> groups, int[] firstAgentIds, Map<Path, DeviceData> data,
+      List<SnmpV3Config> snmpV3, List<TrapSink> networkSinks) throws DeviceDataException {
     this.groups = groups;
     this.networkSinks = networkSinks;
     this.snmpV3 = snmpV3;
-    firstAgentIds = new int[groups.size()];
+    this.firstAgentIds = firstAgentIds;
     stores = new DeviceStore[groups.size()];
     Map<Path, DeviceStore> storeByFile = new LinkedHashMap<>();
-    int next = 0;
     for (int g = 0; g < groups.size(); g++) {
       Snmp snmp = groups.get(g).snmp().orElseThrow();
-      firstAgentIds[g] = next;
-      next += groups.get(g).count();
       stores[g] = storeByFile.computeIfAbsent(snmp.data(), file -> new DeviceStore(data.get(file)));
       portByGroup.put(groups.get(g).name(), snmp.port());
     }
@@ -86,7 +83,8 @@ public final class SnmpNetwork implements ProtocolAgents {
         snmpV3.put(v3.get(), read(v3.get(), () -> SnmpV3Config.load(v3.get())));
       }
     }
-    return new SnmpNetwork(groups, data, List.copyOf(snmpV3.values()), network.trapSinks());
+    int[] firstAgentIds = groups.stream().mapToInt(network::firstAgentId).toArray();
+    return new SnmpNetwork(groups, firstAgentIds, data, List.copyOf(snmpV3.values()), network.trapSinks());
   }
 
   private interface Reader<T> {

@@ -29,6 +29,7 @@ import java.util.Collections;
 import java.util.List;
 import java.util.Map;
 import java.util.Optional;
+import java.util.OptionalInt;
 import java.util.concurrent.TimeUnit;
 import java.util.concurrent.atomic.AtomicLong;
 import org.junit.jupiter.api.AfterEach;
@@ -142,7 +143,8 @@ class AdminServerTest {
   private AdminServer start(Optional<String> token) throws IOException {
     Snmp snmp = new Snmp(1161, dir.resolve("d.snmprec"), Optional.empty(), "public", "private");
     Group routers = new Group("routers", 3, 0x7F000101L, "R{n}", Optional.of(snmp));
-    Group optical = new Group(OPTICAL, 2, 0x7F000201L, "O{n}", Optional.of(snmp));
+    Group optical = new Group(OPTICAL, 2, 0x7F000201L, "O{n}", Optional.of(snmp), List.of(), List.of(),
+        Optional.of(new Network.Tl1(3083, OptionalInt.of(3023), 0, dir.resolve("o.tl1"), null, List.of(), false, "")));
     Network network = new Network(new Network.Log(0, dir.resolve("log")), Optional.empty(), dir,
         List.of(routers, optical));
     DeviceTable.Builder table = new DeviceTable.Builder();
@@ -215,6 +217,8 @@ class AdminServerTest {
     assertEquals("127.0.1.1", routers.get("first").getAsString());
     assertEquals("127.0.1.3", routers.get("last").getAsString());
     assertEquals(1161, routers.getAsJsonObject("protocols").getAsJsonObject("snmp").get("port").getAsInt());
+    assertEquals("{\"snmp\":{\"port\":1161},\"tl1\":{\"port\":3083,\"telnetPort\":3023}}",
+        network.getAsJsonArray("groups").get(1).getAsJsonObject().get("protocols").toString());
     assertEquals(5, network.get("devices").getAsInt());
     assertEquals(4, network.get("running").getAsInt());
 
