@@ -42,6 +42,7 @@ struct LoadOptions {
   std::vector<std::string> devices;  // address texts, device i has agent ID i + 1
   std::uint16_t port = 11241;
   std::size_t senders = 0;  // 0: every device
+  std::size_t firstSender = 0;
   std::string managerAddress;
   std::uint16_t managerPort = 0;
   bool informs = false;
@@ -147,7 +148,8 @@ struct LoadCounts {
 // The next device's notification; the engine's outcome.
 NotifyOutcome SendFrom(NotificationRequest& request, const LoadOptions& options,
                        std::uint64_t index) {
-  const std::size_t device = static_cast<std::size_t>(index % options.senders);
+  const std::size_t device =
+      options.firstSender + static_cast<std::size_t>(index % options.senders);
   request.agentId = static_cast<std::int32_t>(device + 1);
   request.agentText = options.devices[device];
   return SendNotification(request);
@@ -210,9 +212,10 @@ int Run(const LoadOptions& options) {
   } else if (!options.informs) {
     const LoadCounts counts = SendTraps(options);
     std::printf(
-        "RESULT kind=trap devices=%zu senders=%zu sent=%llu not_sent=%llu seconds=%.3f "
-        "rate=%.0f start_s=%.2f\n",
-        options.devices.size(), options.senders, static_cast<unsigned long long>(counts.sent),
+        "RESULT kind=trap devices=%zu senders=%zu first_sender=%zu sent=%llu not_sent=%llu "
+        "seconds=%.3f rate=%.0f start_s=%.2f\n",
+        options.devices.size(), options.senders, options.firstSender,
+        static_cast<unsigned long long>(counts.sent),
         static_cast<unsigned long long>(counts.notSent), counts.seconds,
         static_cast<double>(counts.sent) / counts.seconds, startSeconds);
   } else {
@@ -247,11 +250,12 @@ int Run(const LoadOptions& options) {
 
 const char kUsage[] =
     "usage: tessel_notify_load --to A:P [--devices N] [--address A] [--port P] [--senders N]\n"
-    "                          [--informs [--outstanding N] [--timeout S]] [--duration S]\n"
-    "                          [--count N] [--cpu N]\n"
+    "                          [--first-sender I] [--informs [--outstanding N] [--timeout S]]\n"
+    "                          [--duration S] [--count N] [--cpu N]\n"
     "  starts N devices (10000) from A (127.0.1.1) on port P (11241) and sends v2c linkDown\n"
-    "  traps, or informs, round robin from the first --senders of them to the manager A:P,\n"
-    "  for S seconds (10, at most 600) or N notifications (1000000); loopback only\n";
+    "  traps, or informs, round robin from --senders of them (all but the first I), device I\n"
+    "  (0) the first, to the manager A:P, for S seconds (10, at most 600) or N notifications\n"
+    "  (1000000); loopback only\n";
 
 bool ParseManager(const std::string& text, LoadOptions* options) {
   const std::size_t colon = text.rfind(':');
@@ -282,6 +286,7 @@ bool ParseArguments(int argc, char** argv, LoadOptions* options) {
   std::string first = "127.0.1.1";
   int devices = 10000;
   int senders = 0;
+  int firstSender = 0;
   int count = 1000000;
   while (args.Next(&name)) {
     if (name == "--informs") {
@@ -300,6 +305,8 @@ bool ParseArguments(int argc, char** argv, LoadOptions* options) {
       ok = ParsePort(value, &options->port);
     } else if (name == "--senders") {
       ok = ParseInt(value, 1, 100000, &senders);
+    } else if (name == "--first-sender") {
+      ok = ParseInt(value, 0, 99999, &firstSender);
     } else if (name == "--outstanding") {
       ok = ParseInt(value, 1, 100000, &options->outstanding);
     } else if (name == "--timeout") {
@@ -316,8 +323,10 @@ bool ParseArguments(int argc, char** argv, LoadOptions* options) {
     if (!ok) return false;
   }
   options->count = count;
-  options->senders = static_cast<std::size_t>(senders == 0 ? devices : senders);
-  return options->managerPort != 0 && options->senders <= static_cast<std::size_t>(devices) &&
+  options->senders = static_cast<std::size_t>(senders == 0 ? devices - firstSender : senders);
+  options->firstSender = static_cast<std::size_t>(firstSender);
+  return options->managerPort != 0 && firstSender < devices &&
+         options->firstSender + options->senders <= static_cast<std::size_t>(devices) &&
          DeviceAddresses(first, devices, &options->devices);
 }
 
