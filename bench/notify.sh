@@ -78,11 +78,11 @@ wait_for_file_line() {
   done
 }
 
-# start_sink [--answer-informs]: the counting sink, stopping by itself one second after the last
+# start_sink [--answer-informs]: the counting sink, stopping by itself two seconds after the last
 # datagram; sets SINK_GROUP.
 start_sink() {
   : >"$WORK/sink.log"
-  start_server sink "$SINK" --address 127.0.0.1 --port "$SINK_PORT" --idle 1 \
+  start_server sink "$SINK" --address 127.0.0.1 --port "$SINK_PORT" --idle 2 \
     --duration $((DURATION + SNMPTRAP_SECONDS + 60)) "$@"
   SINK_GROUP=$SERVER_GROUP
   wait_for_file_line "$WORK/sink.log" '^READY' 10 "$SINK_GROUP" || { log "the sink did not start"; exit 1; }
