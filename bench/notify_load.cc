@@ -1,8 +1,8 @@
 // tessel_notify_load: the engine's notification path under load. It starts the engine as the host
 // does (parameters, registry, N agents on consecutive loopback addresses, the SNMP service) with
 // the in-memory host, then asks the engine for v2c notifications through SendNotification, the
-// operation behind the host's sendNotification, from one thread, round robin over the first
-// --senders devices. Each leaves from its device's own address and SNMP port.
+// operation behind the host's sendNotification, from one thread, round robin over --senders
+// devices from --first-sender on. Each leaves from its device's own address and SNMP port.
 //   traps:   as fast as the engine takes them;
 //   informs: --outstanding at a time, a new one for each the engine reports acknowledged or
 //            dropped to the host; afterwards it waits for every inform still out and checks
@@ -41,8 +41,8 @@ double SecondsSince(Clock::time_point start) {
 struct LoadOptions {
   std::vector<std::string> devices;  // address texts, device i has agent ID i + 1
   std::uint16_t port = 11241;
-  std::size_t senders = 0;  // 0: every device
-  std::size_t firstSender = 0;
+  std::size_t senders = 1;
+  std::size_t firstSender = 0;  // devices firstSender .. firstSender + senders - 1 send
   std::string managerAddress;
   std::uint16_t managerPort = 0;
   bool informs = false;
