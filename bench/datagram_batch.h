@@ -19,6 +19,7 @@ class DatagramBatch {
   int Receive(int fd);
   std::uint8_t* Data(int i) { return static_cast<std::uint8_t*>(vectors_[i].iov_base); }
   std::size_t Length(int i) const { return headers_[i].msg_len; }
+  const sockaddr_in& Sender(int i) const { return peers_[i]; }
   // Marks received datagram i (its bytes as they are now) to go back to its sender.
   void Return(int i);
   // Sends every datagram marked since the last Receive; a full send buffer drops the rest, as a

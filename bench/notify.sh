@@ -3,7 +3,8 @@
 # tessel_notify_load starts the engine in-process with BENCH_NOTIFY_DEVICES agents (as the host
 # does, with the in-memory host) and asks it for v2c linkDown traps through the operation behind
 # the host's sendNotification, from the first device alone and round robin over all of them, to
-#   - tessel_trap_sink, a receiver that only counts (recvmmsg, one thread), and
+#   - tessel_trap_sink, a receiver that only counts (recvmmsg, one thread), and checks that each
+#     notification came from its device's address and SNMP port, and
 #   - net-snmp's snmptrapd with a configuration of its own, logging each trap as one line to a
 #     file; what it logged is what it received.
 # Beside them, net-snmp's snmptrap in a loop (one process per trap) to the same counting sink.
@@ -78,7 +79,7 @@ wait_for_file_line() {
   done
 }
 
-# start_sink [--answer-informs]: the counting sink, stopping by itself two seconds after the last
+# start_sink [OPTIONS...]: the counting sink, stopping by itself two seconds after the last
 # datagram; sets SINK_GROUP.
 start_sink() {
   : >"$WORK/sink.log"
@@ -90,10 +91,18 @@ start_sink() {
 
 # finish_sink: waits (bounded) until the sink has stopped by itself; sets SINK_RESULT.
 finish_sink() {
+  local strangers
   wait_for_file_line "$WORK/sink.log" '^SINK ' 30 "$SINK_GROUP" || true
   finish_server "$SINK_GROUP"
   SINK_RESULT=$(grep '^SINK ' "$WORK/sink.log" || true)
+  strangers=$(field "$SINK_RESULT" wrong_source)
+  if [ -n "$strangers" ] && [ "$strangers" != 0 ]; then
+    NOTES+=("$strangers notifications reached the sink from another address or port than their device's")
+  fi
 }
+
+# Every notification of the engine must come from its device's address and SNMP port.
+from_devices() { echo --senders "$ADDRESS+$DEVICES" --sender-port "$PORT"; }
 
 # load SENDERS FIRST [OPTIONS...]: runs the engine's notification load, SENDERS devices from
 # device FIRST (0-based) on sending; sets LOAD_RESULT.
@@ -137,7 +146,8 @@ per_second() {
 # traps_to_sink SENDERS [FIRST]
 traps_to_sink() {
   local senders=$1 first=${2:-0}
-  start_sink
+  # shellcheck disable=SC2046  # from_devices gives four words on purpose
+  start_sink $(from_devices)
   load "$senders" "$first" --to "127.0.0.1:$SINK_PORT"
   finish_sink
   trap_row tessel_trap_sink "$(senders_text "$senders" "$first")" \
@@ -214,7 +224,8 @@ snmptrap_loop() {
 INFORM_ROWS=()
 informs_to_sink() {
   local senders=$1 check
-  start_sink --answer-informs
+  # shellcheck disable=SC2046
+  start_sink --answer-informs $(from_devices)
   load "$senders" 0 --to "127.0.0.1:$SINK_PORT" --informs --outstanding "$OUTSTANDING" \
     --timeout "$INFORM_TIMEOUT"
   finish_sink

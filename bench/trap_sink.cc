@@ -3,7 +3,9 @@
 // recvmmsg batches. With --answer-informs it acknowledges every v1/v2c InformRequest at once with
 // its Response (the same message, PDU type changed), sent back in one sendmmsg per batch.
 // It stops after --duration seconds, after --idle seconds without a datagram once one came, or on
-// SIGTERM/SIGINT, and prints what it received.
+// SIGTERM/SIGINT, and prints what it received. Given the senders' addresses and port, it also
+// counts the datagrams that came from elsewhere.
+#include <arpa/inet.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <sched.h>
@@ -43,12 +45,14 @@ struct SinkOptions {
   double idleSeconds = 0;  // 0: never stop for silence
   bool answerInforms = false;
   int cpu = -1;
+  std::vector<sockaddr_in> senders;  // empty: any sender is expected
 };
 
 struct SinkCounts {
   std::uint64_t received = 0;
   std::uint64_t informs = 0;
   std::uint64_t answered = 0;
+  std::uint64_t wrongSource = 0;
   double first = 0;  // arrival of the first and of the last datagram
   double last = 0;
 };
@@ -60,8 +64,9 @@ class TrapSink {
 
  private:
   // Reads until the socket is empty.
-  void ReceiveAll(bool answerInforms);
+  void ReceiveAll(const SinkOptions& options);
   void Answer(int received);
+  void CheckSenders(int received, const std::vector<sockaddr_in>& senders);
 
   int fd_ = -1;
   tessel::bench::DatagramBatch batch_;
@@ -86,7 +91,19 @@ void TrapSink::Answer(int received) {
   counts_.answered += static_cast<std::uint64_t>(batch_.SendReturned(fd_));
 }
 
-void TrapSink::ReceiveAll(bool answerInforms) {
+// The senders are consecutive addresses on one port: a range check, whatever their number.
+void TrapSink::CheckSenders(int received, const std::vector<sockaddr_in>& senders) {
+  if (senders.empty()) return;
+  const std::uint32_t first = ntohl(senders.front().sin_addr.s_addr);
+  for (int i = 0; i < received; ++i) {
+    const sockaddr_in& from = batch_.Sender(i);
+    const std::uint32_t offset = ntohl(from.sin_addr.s_addr) - first;
+    if (from.sin_port != senders.front().sin_port || offset >= senders.size())
+      ++counts_.wrongSource;
+  }
+}
+
+void TrapSink::ReceiveAll(const SinkOptions& options) {
   for (;;) {
     const int received = batch_.Receive(fd_);
     if (received == 0) return;
@@ -94,7 +111,8 @@ void TrapSink::ReceiveAll(bool answerInforms) {
     if (counts_.received == 0) counts_.first = now;
     counts_.last = now;
     counts_.received += static_cast<std::uint64_t>(received);
-    if (answerInforms) Answer(received);
+    CheckSenders(received, options.senders);
+    if (options.answerInforms) Answer(received);
     if (received < tessel::bench::DatagramBatch::kSize) return;
   }
 }
@@ -112,7 +130,7 @@ SinkCounts TrapSink::Serve(const SinkOptions& options) {
     }
     pollfd ready{fd_, POLLIN, 0};
     const double wait = std::min(end - now, 0.1);
-    if (poll(&ready, 1, static_cast<int>(wait * 1000) + 1) == 1) ReceiveAll(options.answerInforms);
+    if (poll(&ready, 1, static_cast<int>(wait * 1000) + 1) == 1) ReceiveAll(options);
   }
   close(fd_);
   return counts_;
@@ -120,9 +138,10 @@ SinkCounts TrapSink::Serve(const SinkOptions& options) {
 
 const char kUsage[] =
     "usage: tessel_trap_sink --address A --port P [--duration S] [--idle S] [--answer-informs]\n"
-    "                        [--cpu N]\n"
+    "                        [--senders B+N --sender-port Q] [--cpu N]\n"
     "  counts the datagrams that reach A:P for S seconds (60, at most 3600), or until S idle\n"
-    "  seconds pass after the first; A must be loopback (127.0.0.0/8)\n";
+    "  seconds pass after the first, and those not from Q on one of the N addresses from B;\n"
+    "  addresses must be loopback (127.0.0.0/8)\n";
 
 bool ParseArguments(int argc, char** argv, SinkOptions* options) {
   tessel::bench::ArgumentReader args(argc, argv);
@@ -130,6 +149,8 @@ bool ParseArguments(int argc, char** argv, SinkOptions* options) {
   std::string value;
   std::string address = "127.0.0.1";
   std::uint16_t port = 0;
+  std::string senders;
+  std::uint16_t senderPort = 0;
   while (args.Next(&name)) {
     if (name == "--answer-informs") {
       options->answerInforms = true;
@@ -141,6 +162,10 @@ bool ParseArguments(int argc, char** argv, SinkOptions* options) {
       address = value;
     } else if (name == "--port") {
       ok = tessel::bench::ParsePort(value, &port);
+    } else if (name == "--senders") {
+      senders = value;
+    } else if (name == "--sender-port") {
+      ok = tessel::bench::ParsePort(value, &senderPort);
     } else if (name == "--duration") {
       ok = tessel::bench::ParseSeconds(value, 0.001, 3600, &options->seconds);
     } else if (name == "--idle") {
@@ -158,7 +183,9 @@ bool ParseArguments(int argc, char** argv, SinkOptions* options) {
     return false;
   }
   options->address = addresses[0];
-  return true;
+  if (senders.empty() != (senderPort == 0)) return false;
+  return senders.empty() || (senders.find(',') == std::string::npos &&
+                             tessel::bench::ParseTargets(senders, senderPort, &options->senders));
 }
 
 }  // namespace
@@ -185,10 +212,13 @@ int main(int argc, char** argv) {
   }
   const SinkCounts counts = sink.Serve(options);
   const double span = counts.last - counts.first;
-  std::printf("SINK received=%llu informs=%llu answered=%llu seconds=%.3f rate=%.0f\n",
-              static_cast<unsigned long long>(counts.received),
-              static_cast<unsigned long long>(counts.informs),
-              static_cast<unsigned long long>(counts.answered), span,
-              span > 0 ? static_cast<double>(counts.received) / span : 0.0);
+  std::printf(
+      "SINK received=%llu informs=%llu answered=%llu wrong_source=%llu seconds=%.3f "
+      "rate=%.0f\n",
+      static_cast<unsigned long long>(counts.received),
+      static_cast<unsigned long long>(counts.informs),
+      static_cast<unsigned long long>(counts.answered),
+      static_cast<unsigned long long>(counts.wrongSource), span,
+      span > 0 ? static_cast<double>(counts.received) / span : 0.0);
   return 0;
 }
