@@ -86,8 +86,10 @@ bool EnableOption(int socket, int level, int name) {
   return false;
 }
 
-// A non-blocking listening socket on address:port, or -1 with *error set.
-int OpenListeningSocket(const std::string& address, std::uint16_t port, int* error) {
+// A non-blocking listening socket on address:port, or -1 with *error set. Accepted sockets
+// inherit its send buffer size.
+int OpenListeningSocket(const std::string& address, std::uint16_t port, int sendBuffer,
+                        int* error) {
   sockaddr_storage local;
   socklen_t length = 0;
   if (!ParseAddress(address, port, &local, &length)) {
@@ -103,7 +105,9 @@ int OpenListeningSocket(const std::string& address, std::uint16_t port, int* err
     return -1;
   }
   if (!EnableOption(socket, SOL_SOCKET, SO_REUSEADDR) ||
-      (ipv6 && !EnableOption(socket, IPPROTO_IPV6, IPV6_V6ONLY))) {
+      (ipv6 && !EnableOption(socket, IPPROTO_IPV6, IPV6_V6ONLY)) ||
+      (sendBuffer > 0 &&
+       setsockopt(socket, SOL_SOCKET, SO_SNDBUF, &sendBuffer, sizeof sendBuffer) != 0)) {
     *error = errno;
     ::close(socket);
     return -1;
@@ -210,7 +214,7 @@ bool TcpServer::Listen(std::uint32_t tag, const std::string& address, std::uint1
     failure = EAGAIN;
     return false;
   }
-  int socket = OpenListeningSocket(address, port, &failure);
+  int socket = OpenListeningSocket(address, port, options_.sendBuffer, &failure);
   if (socket < 0) return false;
   try {
     auto listener = std::make_unique<Listener>(socket, tag, keepAliveSeconds);

@@ -58,6 +58,9 @@ struct TcpServerOptions {
   // Output a session may have queued and not yet written; more closes the session, so a client
   // that stops reading cannot grow the engine's memory without bound.
   std::size_t outputCap = std::size_t{1} << 20;
+  // The kernel's send buffer of each session in bytes (0: the system's, which grows on demand);
+  // what it does not take waits in the session's output.
+  int sendBuffer = 0;
   // How long accepting stays paused on a listener after the process ran out of descriptors,
   // unless a session closes first.
   std::chrono::milliseconds acceptRetry{1000};
