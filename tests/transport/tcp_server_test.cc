@@ -359,7 +359,7 @@ TEST(TcpServerDescriptorsTest, AcceptingPausesWhileTheProcessHasNoDescriptorLeft
   double busy = ProcessCpuSeconds() - before;
   for (int filler : fillers) close(filler);
   setrlimit(RLIMIT_NOFILE, &saved);
-  EXPECT_LT(busy, 0.1);
+  EXPECT_LT(busy, 0.02);  // about 1 ms when idle; a spinning loop takes far more on a busy machine
   EXPECT_TRUE(events.WaitForAccepts(1));
   close(client);
 }
