@@ -3,10 +3,10 @@
 // with no input, output or keep-alive due it costs nothing. The server knows no protocol: it hands
 // the bytes it reads to a TcpSessionEvents and writes what it is given; it never logs payload.
 //
-// Threads: Listen, CloseListeners, Send, Close, SessionsOf and SessionCount are safe from any
-// thread, callbacks included. The callbacks run on the loop thread, one at a time, without the
-// server's lock held, so a callback may call Send, Close or CloseListeners; it must not call Stop
-// or destroy the server. For one session OnAccepted comes first, OnClosed last.
+// Threads: every operation is safe from any thread. The callbacks run on the loop thread, one at
+// a time, without the server's lock held, so a callback may call Send, Close, CloseListeners,
+// SessionsOf and SessionCount; it must not call Listen or Stop (they wait for the loop) nor destroy
+// the server. For one session OnAccepted comes first, OnClosed last, and no OnBytes follows it.
 #pragma once
 
 #include <atomic>
@@ -95,7 +95,7 @@ class TcpServer {
   std::vector<TcpSessionId> SessionsOf(std::uint32_t tag) const;
   std::size_t SessionCount() const;
   // Closes every listener and session and ends the loop thread once their OnClosed calls are
-  // made. The server may listen again afterwards. Not from a callback.
+  // made. The server may listen again afterwards.
   void Stop();
 
  private:
