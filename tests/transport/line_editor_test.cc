@@ -12,8 +12,9 @@ const std::string kUp = "\x1b[A", kDown = "\x1b[B", kRight = "\x1b[C", kLeft = "
 const std::vector<std::string> kCommands = {"RTRV-HDR", "RTRV-ALM-ALL", "RTRV-ALM-EQPT",
                                             "ACT-USER"};
 
-// The registered commands a prefix starts, letters compared without case.
+// The registered commands the first word of a prefix starts, letters compared without case.
 std::vector<std::string> CompleteCommand(std::string_view prefix) {
+  prefix = prefix.substr(0, prefix.find(' '));
   std::vector<std::string> matches;
   for (const std::string& command : kCommands) {
     auto same = [](char a, char b) { return std::toupper(a) == std::toupper(b); };
@@ -174,7 +175,7 @@ TEST(LineEditorTest, WithoutEchoLinesAreStillEdited) {
 }
 
 TEST(LineEditorTest, LineReachingTheLimitIsDroppedWithItsRest) {
-  std::string longest(LineEditor::kLineLimit - 1, 'a');
+  std::string longest(4093, 'a');
   ExpectTyping({
       {"the longest line", longest + "\r", longest + "\r\n", {longest}},
       {"one more", longest + "aa\rx\r", longest + "\r\nTL1>>x\r\n", {"x"}},
