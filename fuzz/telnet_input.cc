@@ -2,8 +2,8 @@
 // session, once at once and once in small reads, and checks that the split changes nothing,
 // that every answer is a well-formed option command, that a repeated request is not answered
 // again, and that no completed line holds a line end or reaches the line limit.
-#include <algorithm>
-#include <cctype>
+#include <strings.h>
+
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -18,14 +18,10 @@ namespace tessel {
 namespace {
 
 std::vector<std::string> CompleteCommand(std::string_view prefix) {
-  static const char* const kCommands[] = {"RTRV-HDR", "RTRV-ALM-ALL", "ACT-USER", "CANC-USER"};
+  std::string word(prefix);
   std::vector<std::string> matches;
-  for (std::string_view command : kCommands) {
-    auto same = [](char a, char b) { return std::toupper(a) == std::toupper(b); };
-    if (command.size() >= prefix.size() &&
-        std::equal(prefix.begin(), prefix.end(), command.begin(), same))
-      matches.emplace_back(command);
-  }
+  for (const char* command : {"RTRV-HDR", "RTRV-ALM-ALL", "ACT-USER", "CANC-USER"})
+    if (strncasecmp(command, word.c_str(), word.size()) == 0) matches.push_back(command);
   return matches;
 }
 
