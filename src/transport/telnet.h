@@ -1,7 +1,9 @@
 // Telnet for interactive sessions: the server's opening offer (it will echo and suppress
 // go-ahead) and a reader that strips commands from the client's stream and answers its option
 // requests without ever entering a negotiation loop. A pure state machine: one per connection,
-// used by one thread at a time; no sockets.
+// used by one thread at a time; no sockets. A session sends Open() when it accepts, passes each
+// read through Feed (replies back to the client, data on to its LineEditor) and sets the
+// editor's echo from ServerEchoes() after each read.
 #pragma once
 
 #include <array>
