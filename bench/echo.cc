@@ -19,12 +19,10 @@
 #include <string>
 #include <vector>
 
+#include "datagram_batch.h"
 #include "options.h"
 
 namespace {
-
-constexpr int kBatch = 64;
-constexpr std::size_t kDatagramSize = 65536;
 
 volatile sig_atomic_t stopRequested = 0;
 void OnStopSignal(int) { stopRequested = 1; }
@@ -52,10 +50,7 @@ class EchoServer {
 
   int epoll_ = -1;
   std::vector<int> fds_;
-  mmsghdr headers_[kBatch]{};
-  iovec vectors_[kBatch]{};
-  sockaddr_in peers_[kBatch]{};
-  std::vector<std::uint8_t> buffers_ = std::vector<std::uint8_t>(kDatagramSize * kBatch);
+  tessel::bench::DatagramBatch batch_;
   std::uint64_t echoed_ = 0;
 };
 
@@ -81,25 +76,11 @@ bool EchoServer::Open(const std::vector<sockaddr_in>& addresses) {
 // Reads until the socket is empty, answering each batch before reading the next one.
 void EchoServer::EchoAll(int fd) {
   for (;;) {
-    for (int i = 0; i < kBatch; ++i) {
-      vectors_[i] = {buffers_.data() + static_cast<std::size_t>(i) * kDatagramSize, kDatagramSize};
-      headers_[i].msg_hdr = {};
-      headers_[i].msg_hdr.msg_name = &peers_[i];
-      headers_[i].msg_hdr.msg_namelen = sizeof peers_[i];
-      headers_[i].msg_hdr.msg_iov = &vectors_[i];
-      headers_[i].msg_hdr.msg_iovlen = 1;
-    }
-    const int received = recvmmsg(fd, headers_, kBatch, 0, nullptr);
-    if (received <= 0) return;
-    for (int i = 0; i < received; ++i) vectors_[i].iov_len = headers_[i].msg_len;
-    int done = 0;
-    while (done < received) {
-      const int sent = sendmmsg(fd, headers_ + done, static_cast<unsigned>(received - done), 0);
-      if (sent <= 0) break;  // a full send buffer drops the rest, as a busy server would
-      done += sent;
-    }
-    echoed_ += static_cast<std::uint64_t>(done);
-    if (received < kBatch) return;
+    const int received = batch_.Receive(fd);
+    if (received == 0) return;
+    for (int i = 0; i < received; ++i) batch_.Return(i);
+    echoed_ += static_cast<std::uint64_t>(batch_.SendReturned(fd));
+    if (received < tessel::bench::DatagramBatch::kSize) return;
   }
 }
 

@@ -62,15 +62,28 @@ bool DecodePdu(const std::uint8_t* data, std::size_t length, ReplySummary* out) 
   return true;
 }
 
-bool DecodeReply(const std::uint8_t* data, std::size_t length, ReplySummary* out) {
+bool FindCommunityPdu(const std::uint8_t* data, std::size_t length, std::size_t* pduOffset) {
   Reader datagram{data, length};
   Reader message{nullptr, 0};
   Reader community{nullptr, 0};
   std::int64_t version = 0;
   if (!datagram.Expect(0x30, &message)) return false;
   if (!message.NextInteger(&version) || (version != 0 && version != 1)) return false;
-  if (!message.Expect(0x04, &community)) return false;
-  return DecodePdu(message.data + message.position, message.length - message.position, out);
+  if (!message.Expect(0x04, &community) || message.AtEnd()) return false;
+  *pduOffset = static_cast<std::size_t>(message.data - data) + message.position;
+  return true;
+}
+
+bool AnswerInform(std::uint8_t* datagram, std::size_t length) {
+  std::size_t pdu = 0;
+  if (!FindCommunityPdu(datagram, length, &pdu) || datagram[pdu] != kPduInform) return false;
+  datagram[pdu] = kPduResponse;
+  return true;
+}
+
+bool DecodeReply(const std::uint8_t* data, std::size_t length, ReplySummary* out) {
+  std::size_t pdu = 0;
+  return FindCommunityPdu(data, length, &pdu) && DecodePdu(data + pdu, length - pdu, out);
 }
 
 bool ParseOid(const std::string& text, std::vector<std::uint32_t>* oid) {

@@ -15,6 +15,7 @@ inline constexpr std::uint8_t kPduGet = 0xA0;
 inline constexpr std::uint8_t kPduGetNext = 0xA1;
 inline constexpr std::uint8_t kPduResponse = 0xA2;
 inline constexpr std::uint8_t kPduGetBulk = 0xA5;
+inline constexpr std::uint8_t kPduInform = 0xA6;
 inline constexpr std::uint8_t kPduReport = 0xA8;
 // A request must fit one unfragmented loopback datagram on any MTU in use.
 inline constexpr std::size_t kMaxRequestSize = 1472;
@@ -46,6 +47,14 @@ struct ReplySummary {
 
 // A PDU (its first TLV) up to its error-status; false when malformed.
 bool DecodePdu(const std::uint8_t* data, std::size_t length, ReplySummary* out);
+
+// Where the PDU of a v1/v2c message starts (its type octet); false when the datagram is not
+// such a message up to the PDU.
+bool FindCommunityPdu(const std::uint8_t* data, std::size_t length, std::size_t* pduOffset);
+
+// Turns a v1/v2c InformRequest in place into the Response that acknowledges it: the same message
+// with the PDU type changed. False, and nothing changed, for any other datagram.
+bool AnswerInform(std::uint8_t* datagram, std::size_t length);
 
 // False when the datagram is not a well-formed v1/v2c message up to its error-status.
 bool DecodeReply(const std::uint8_t* data, std::size_t length, ReplySummary* out);

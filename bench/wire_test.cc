@@ -1,12 +1,15 @@
 // Checks the load generator's own codec against the engine's parser (so a wrong request-id
 // offset or length shows up here, not as "all lost" in a benchmark), its SNMPv3 keys and
-// messages against published key values and libcrypto directly, and its latency histogram.
+// messages against published key values and libcrypto directly, and its latency histogram; the
+// trap sink's answer to the engine's informs, and the inform load's books.
 #include <gtest/gtest.h>
 #include <openssl/evp.h>
 
 #include <algorithm>
 
+#include "inform_tally.h"
 #include "latency_histogram.h"
+#include "notify/trap_pdu.h"
 #include "options.h"
 #include "snmp/message.h"
 #include "snmp/pdu.h"
@@ -200,6 +203,60 @@ TEST(LatencyHistogram, PercentilesWithinOneBucket) {
   Histogram small;
   small.Record(7);
   EXPECT_EQ(small.Percentile(0.5), 7u);
+}
+
+// The sink acknowledges the engine's own InformRequest (a community long enough for the long
+// length form) with a Response the engine takes for its answer; anything else it leaves alone.
+TEST(TrapSinkWire, AnswersOnlyInforms) {
+  SnmpPdu inform =
+      BuildV2Notification(kInformRequest, 1234, Oid({1, 3, 6, 1, 6, 3, 1, 1, 5, 3}), {});
+  inform.version = kSnmpV2c;
+  inform.community = std::string(150, 'p');
+  inform.requestId = 0x12345;
+  std::vector<std::uint8_t> message = EncodeNotification(inform);
+  ASSERT_FALSE(message.empty());
+  ASSERT_TRUE(AnswerInform(message.data(), message.size()));
+  SnmpPdu response = ParseWithEngine(message);
+  EXPECT_EQ(response.type, kGetResponse);
+  EXPECT_EQ(response.requestId, 0x12345);
+  EXPECT_EQ(response.community, inform.community);
+  EXPECT_EQ(response.requestVarBinds.size(), 2u);
+
+  SnmpPdu trap = inform;
+  trap.type = kTrapV2;
+  std::vector<std::uint8_t> trapMessage = EncodeNotification(trap);
+  const std::vector<std::uint8_t> original = trapMessage;
+  EXPECT_FALSE(AnswerInform(trapMessage.data(), trapMessage.size()));
+  EXPECT_EQ(trapMessage, original);
+  EXPECT_FALSE(AnswerInform(message.data(), 3));  // cut short
+}
+
+// Reports are judged only at the end, whatever order they came in: one arriving before its send
+// was recorded is no stranger.
+TEST(InformTally, CountsEachInformOnce) {
+  InformTally tally;
+  tally.Acknowledged(1);
+  for (std::uint32_t id : {1, 2, 3, 4, 5}) tally.Sent(id);
+  tally.Acknowledged(2);
+  tally.Acknowledged(2);
+  tally.Dropped(3);
+  tally.Acknowledged(4);
+  tally.Dropped(4);
+  tally.Acknowledged(9);
+  InformSummary summary = tally.Summary();
+  EXPECT_EQ(summary.sent, 5u);
+  EXPECT_EQ(summary.acknowledged, 2u);
+  EXPECT_EQ(summary.duplicates, 1u);
+  EXPECT_EQ(summary.dropped, 1u);
+  EXPECT_EQ(summary.both, 1u);
+  EXPECT_EQ(summary.unanswered, 1u);
+  EXPECT_EQ(summary.unknown, 1u);
+  EXPECT_FALSE(summary.Clean());
+
+  InformTally clean;
+  clean.Sent(7);
+  clean.Acknowledged(7);
+  EXPECT_TRUE(clean.Summary().Clean());
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <memory>
 #include <mutex>
@@ -22,10 +23,15 @@ namespace {
 
 // One mutex guards the ordered session list and the address table. The transport's opener and
 // closer run under it, so they must not call back into the registry.
+// Two indexes into the list keep lookups by endpoint and by agentId constant in the number of
+// agents (a notification looks its device up twice); each holds the sessions of one key in
+// registration order.
 struct Registry {
   std::mutex mutex;
   std::vector<std::unique_ptr<AgentSession>> sessions;  // registration order
   std::unordered_map<std::string, AgentSession> addressTable;
+  std::unordered_map<std::string, std::vector<AgentSession*>> byEndpoint;
+  std::unordered_map<std::int32_t, std::vector<AgentSession*>> byAgentId;
   SessionOpener opener;
   SessionCloser closer;
 };
@@ -62,6 +68,48 @@ void HoldSocket(AgentSession& session, std::int64_t socket) {
   session.agentInfo->started = socket != kNoSocket ? 1 : 0;
 }
 
+std::string EndpointKey(const std::string& address, std::uint16_t storedPort) {
+  return address + '/' + std::to_string(storedPort);
+}
+
+std::string EndpointKey(const AgentSession& session) {
+  return EndpointKey(session.transport.localAddress, session.transport.configuredPortMinusOne);
+}
+
+// Makes room for one more session in the list and its indexes: the one step of keeping a
+// session that can throw (an index may be left with an empty entry).
+void ReserveSessionLocked(Registry& registry, const AgentSession& session) {
+  registry.sessions.reserve(registry.sessions.size() + 1);
+  std::vector<AgentSession*>& endpoint = registry.byEndpoint[EndpointKey(session)];
+  endpoint.reserve(endpoint.size() + 1);
+  std::vector<AgentSession*>& agentId = registry.byAgentId[session.agentInfo->agentId];
+  agentId.reserve(agentId.size() + 1);
+}
+
+// Appends a session to the list and its indexes; cannot throw after ReserveSessionLocked.
+void KeepSessionLocked(Registry& registry, std::unique_ptr<AgentSession> session) {
+  registry.byEndpoint.find(EndpointKey(*session))->second.push_back(session.get());
+  registry.byAgentId.find(session->agentInfo->agentId)->second.push_back(session.get());
+  registry.sessions.push_back(std::move(session));
+}
+
+template <typename Index, typename Key>
+void Unindex(Index& index, const Key& key, const AgentSession* session) {
+  auto entry = index.find(key);
+  if (entry == index.end()) return;
+  std::erase(entry->second, session);
+  if (entry->second.empty()) index.erase(entry);
+}
+
+// Removes a session from the list and its indexes.
+void EraseSessionLocked(Registry& registry, const AgentSession* session) {
+  Unindex(registry.byEndpoint, EndpointKey(*session), session);
+  Unindex(registry.byAgentId, session->agentInfo->agentId, session);
+  std::erase_if(registry.sessions, [session](const std::unique_ptr<AgentSession>& kept) {
+    return kept.get() == session;
+  });
+}
+
 // Drops the address entry of a session that leaves the registry, if the entry is its own: the
 // latest remaining registration on that address takes it over, else it goes.
 void ForgetAddressLocked(Registry& registry, const AgentSession& leaving) {
@@ -77,16 +125,11 @@ void ForgetAddressLocked(Registry& registry, const AgentSession& leaving) {
   registry.addressTable.erase(entry);
 }
 
-std::vector<std::unique_ptr<AgentSession>>::iterator FindSessionLocked(Registry& registry,
-                                                                       const std::string& address,
-                                                                       std::int32_t port) {
-  std::uint16_t storedPort = StoredPort(port);
-  for (auto it = registry.sessions.begin(); it != registry.sessions.end(); ++it) {
-    const TransportDomainInfo& transport = (*it)->transport;
-    if (transport.localAddress == address && transport.configuredPortMinusOne == storedPort)
-      return it;
-  }
-  return registry.sessions.end();
+// The first registered agent with this address and configured port; nullptr when none.
+AgentSession* FindSessionLocked(Registry& registry, const std::string& address, std::int32_t port) {
+  auto entry = registry.byEndpoint.find(EndpointKey(address, StoredPort(port)));
+  return entry == registry.byEndpoint.end() || entry->second.empty() ? nullptr
+                                                                     : entry->second.front();
 }
 
 // The records shared by both ways of registering an agent; communities are left to the caller.
@@ -138,14 +181,14 @@ std::int64_t OpenAndKeepLocked(Registry& registry, std::unique_ptr<AgentSession>
   if (socket == kNoSocket) return kNoSocket;
   HoldSocket(*session, socket);
   try {
-    registry.sessions.reserve(registry.sessions.size() + 1);
+    ReserveSessionLocked(registry, *session);
     registry.addressTable.insert_or_assign(session->transport.localAddress,
                                            CopyAgentSession(*session));
   } catch (const std::bad_alloc&) {
     CloseSocketLocked(registry, socket);  // the agent is not kept: neither is its socket
     throw;
   }
-  registry.sessions.push_back(std::move(session));  // room reserved: cannot throw
+  KeepSessionLocked(registry, std::move(session));
   return socket;
 }
 
@@ -202,8 +245,9 @@ std::int32_t RegisterAgentInfo(const AgentRegistration& registration) {
     AppendEach(session->agentInfo->writeCommunities, registration.writeCommunities);
     Registry& registry = TheRegistry();
     std::lock_guard<std::mutex> lock(registry.mutex);
+    ReserveSessionLocked(registry, *session);
     registry.addressTable.insert_or_assign(registration.address, CopyAgentSession(*session));
-    registry.sessions.push_back(std::move(session));
+    KeepSessionLocked(registry, std::move(session));
   } catch (const std::bad_alloc&) {
     LOG_ERROR("Memory allocation failure ...\n");
     return -1;
@@ -215,10 +259,9 @@ namespace {
 
 // The agent a start or stop names; applies the trap-port rule on the way, as every start and
 // stop does. registry.sessions.end() when there is none.
-std::vector<std::unique_ptr<AgentSession>>::iterator FindForStartOrStop(Registry& registry,
-                                                                        const std::string& address,
-                                                                        std::int32_t port) {
-  if (registry.sessions.empty()) return registry.sessions.end();
+AgentSession* FindForStartOrStop(Registry& registry, const std::string& address,
+                                 std::int32_t port) {
+  if (registry.sessions.empty()) return nullptr;
   ApplyTrapPortRule(static_cast<std::uint16_t>(port));
   return FindSessionLocked(registry, address, port);
 }
@@ -230,12 +273,12 @@ bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t eng
   Registry& registry = TheRegistry();
   {
     std::unique_lock<std::mutex> lock(registry.mutex);
-    auto found = FindForStartOrStop(registry, address, port);
-    if (found == registry.sessions.end()) {
+    AgentSession* found = FindForStartOrStop(registry, address, port);
+    if (found == nullptr) {
       LOG_TRACE("The td Info cannot be obtained for %s\n", address.c_str());
       return false;
     }
-    AgentSession& session = **found;
+    AgentSession& session = *found;
     // A running agent stays on its socket: a second bind of its port could only fail.
     bool wasRunning = session.agentInfo->started.load() != 0;
     if (!wasRunning) HoldSocket(session, OpenSessionLocked(registry, session));
@@ -248,7 +291,7 @@ bool StartAgent(const std::string& address, std::int32_t port, std::uint32_t eng
       return true;
     }
     ForgetAddressLocked(registry, session);
-    registry.sessions.erase(found);
+    EraseSessionLocked(registry, found);
   }
   PrintStatus(NotStartedText(port, address));
   return false;
@@ -258,15 +301,15 @@ bool StopAgent(const std::string& address, std::int32_t port) {
   LOG_TRACE("\n\t@@@@@ Inside StopAgent() @@@@@ \n");
   Registry& registry = TheRegistry();
   std::lock_guard<std::mutex> lock(registry.mutex);
-  auto found = FindForStartOrStop(registry, address, port);
-  if (found == registry.sessions.end()) {
+  AgentSession* found = FindForStartOrStop(registry, address, port);
+  if (found == nullptr) {
     LOG_ERROR("The tdInfo cannot be obtained for %s while stop agent\n", address.c_str());
     return false;
   }
-  if ((*found)->agentInfo->started.load()) {
-    CloseSocketLocked(registry, (*found)->socket);
-    HoldSocket(**found, kNoSocket);
-    registry.sessions.erase(found);
+  if (found->agentInfo->started.load()) {
+    CloseSocketLocked(registry, found->socket);
+    HoldSocket(*found, kNoSocket);
+    EraseSessionLocked(registry, found);
   }
   registry.addressTable.erase(address);
   return true;
@@ -317,17 +360,18 @@ std::optional<AgentSession> LookupAgentByAddress(const std::string& address) {
 std::optional<AgentSession> FindAgentSession(const std::string& address, std::int32_t port) {
   Registry& registry = TheRegistry();
   std::lock_guard<std::mutex> lock(registry.mutex);
-  auto found = FindSessionLocked(registry, address, port);
-  if (found == registry.sessions.end()) return std::nullopt;
-  return CopyAgentSession(**found);
+  AgentSession* found = FindSessionLocked(registry, address, port);
+  if (found == nullptr) return std::nullopt;
+  return CopyAgentSession(*found);
 }
 
 std::optional<AgentSession> FindStartedAgentById(std::int32_t agentId) {
   Registry& registry = TheRegistry();
   std::lock_guard<std::mutex> lock(registry.mutex);
-  for (const std::unique_ptr<AgentSession>& session : registry.sessions) {
-    if (session->agentInfo->agentId == agentId && session->socket != kNoSocket)
-      return CopyAgentSession(*session);
+  auto entry = registry.byAgentId.find(agentId);
+  if (entry == registry.byAgentId.end()) return std::nullopt;
+  for (const AgentSession* session : entry->second) {
+    if (session->socket != kNoSocket) return CopyAgentSession(*session);
   }
   return std::nullopt;
 }
@@ -372,6 +416,8 @@ void FreeSimulatorResources() {
     }
   }
   registry.sessions.clear();
+  registry.byEndpoint.clear();
+  registry.byAgentId.clear();
   registry.addressTable.clear();
 }
 

@@ -49,6 +49,10 @@ bool SetOption(int socket, int level, int name) {
 
 bool ConfigureSocket(int socket, bool ipv6, const UdpBindOptions& options) {
   if (ipv6 && !SetOption(socket, IPPROTO_IPV6, IPV6_V6ONLY)) return false;
+  // Best effort: a smaller queue only drops more of a burst.
+  int queue = kUdpSocketReceiveQueue;
+  if (setsockopt(socket, SOL_SOCKET, SO_RCVBUF, &queue, sizeof queue) != 0)
+    LOG_TRACE("The receive queue stays at the system's default: errno %d\n", errno);
   if (options.shareWithOwnSockets && !SetOption(socket, SOL_SOCKET, SO_REUSEADDR)) return false;
   if (options.wantDestination) {
     if (!SetOption(socket, ipv6 ? IPPROTO_IPV6 : IPPROTO_IP, ipv6 ? IPV6_RECVPKTINFO : IP_PKTINFO))

@@ -15,6 +15,9 @@
 namespace tessel {
 
 inline constexpr std::size_t kUdpReceiveBuffer = 20000;
+// The kernel receive queue every socket asks for (the system's net.core.rmem_max may cap it):
+// room for a manager's burst, or for the Responses to a thousand informs a device has out.
+inline constexpr int kUdpSocketReceiveQueue = 1 << 20;
 
 struct UdpBindOptions {
   bool shareWithOwnSockets = false;  // SO_REUSEADDR: the engine's own wildcard sockets only
