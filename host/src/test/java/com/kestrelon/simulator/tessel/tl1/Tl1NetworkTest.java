@@ -3,8 +3,6 @@ package com.kestrelon.simulator.tessel.tl1;
 import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
-import com.kestrelon.simulator.tessel.control.AgentState;
-import com.kestrelon.simulator.tessel.control.Device;
 import com.kestrelon.simulator.tessel.network.Network;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
@@ -13,7 +11,6 @@ import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.Arrays;
 import java.util.List;
-import java.util.Map;
 import java.util.Optional;
 import java.util.OptionalInt;
 import java.util.Set;
@@ -137,14 +134,5 @@ class Tl1NetworkTest {
     assertTrue(outcomes.get(1).orElseThrow().contains("TCP port 3023 on 127.0.2.2"), outcomes.toString());
     assertEquals(List.of("login 4 true", "telnet 127.0.2.2:3023 4", "stop 127.0.2.2:3083"),
         engine.calls.subList(2, engine.calls.size()), "the raw listener of a device whose Telnet port failed closes");
-  }
-
-  @Test
-  void aDeviceStopsAndStartsAlone() {
-    Device second = new Device("127.0.2.2", 0x7F000202L, 4, "2-OPTICAL", "optical", Map.of("tl1", AgentState.RUNNING));
-    tl1.stop(second);
-    assertEquals(Optional.empty(), tl1.start(second));
-    assertEquals(List.of("stop 127.0.2.2:3083", "keepalive 30", "start optical [4] [127.0.2.2] [3083] [2-OPTICAL]",
-        "login 4 true", "telnet 127.0.2.2:3023 4"), engine.calls);
   }
 }
