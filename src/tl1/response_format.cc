@@ -308,6 +308,17 @@ std::vector<std::string> OutputFormattor(std::string_view sid, const std::tm& no
       FormatHeader(sid, now) + FormatResponseIdentification(ctag, completionCode), elements);
 }
 
+std::vector<std::string> FormatAutonomousMessage(std::string_view sid, const std::tm& now,
+                                                 std::uint8_t alarmCode, std::uint32_t atag,
+                                                 std::string_view verb,
+                                                 const std::optional<std::string>& modifier1,
+                                                 const std::optional<std::string>& modifier2,
+                                                 const std::vector<Tl1TextElement>& elements) {
+  return FormatTextBlocks(FormatHeader(sid, now) + FormatAutonomousIdentification(
+                                                       alarmCode, atag, verb, modifier1, modifier2),
+                          elements);
+}
+
 std::string AckFormatter(int ackCode, std::string_view ctag) {
   const char* word = AckCodeWord(ackCode);
   std::string text = word ? word : "NA";

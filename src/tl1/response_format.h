@@ -81,6 +81,14 @@ std::vector<std::string> OutputFormattor(std::string_view sid, const std::tm& no
                                          const std::optional<std::string>& ctag, int completionCode,
                                          const std::vector<Tl1TextElement>& elements);
 
+// A whole autonomous message: header, autonomous identification, text block(s).
+std::vector<std::string> FormatAutonomousMessage(std::string_view sid, const std::tm& now,
+                                                 std::uint8_t alarmCode, std::uint32_t atag,
+                                                 std::string_view verb,
+                                                 const std::optional<std::string>& modifier1,
+                                                 const std::optional<std::string>& modifier2,
+                                                 const std::vector<Tl1TextElement>& elements);
+
 // "IP 15\r\n<"
 std::string AckFormatter(int ackCode, std::string_view ctag);
 

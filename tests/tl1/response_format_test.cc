@@ -51,8 +51,9 @@ TEST(Tl1FormatTest, ResponsesAcknowledgmentsAndIdentificationsAreExactBytes) {
   EXPECT_EQ(AckFormatter(kAckInProgress, "15"), "IP 15\r\n<");
   EXPECT_EQ(AckFormatter(kAckNotGranted, "15"), "NG 15\r\n<");
   EXPECT_EQ(AckFormatter(3, "0"), "NA 0\r\n<");
-  EXPECT_EQ(FormatAutonomousIdentification(0, 17, "REPT", "ALM", "EQPT"),
-            "\r\n*C 17 REPT ALM EQPT");
+  EXPECT_EQ(FormatAutonomousMessage("NE1", kNow, 0, 17, "REPT", "ALM", "EQPT",
+                                    {{kTl1QuotedLine, "SLOT-1:CR,LOS"}})[0],
+            "\r\n\n   NE1 24-06-30 14:05:09\r\n*C 17 REPT ALM EQPT\r\n   \"SLOT-1:CR,LOS\"\r\n;");
   EXPECT_EQ(FormatAutonomousIdentification(3, 5, "REPT", std::nullopt, std::nullopt),
             "\r\nA  5 REPT");
   EXPECT_EQ(FormatAutonomousIdentification(2, 0, "REPT", "EVT", std::nullopt), "\r\n*  0 REPT EVT");
