@@ -354,7 +354,9 @@ bool CmdParser(Tl1InputCmd* cmd, std::string_view field, int* errorNumber) {
 
 bool TIDParser(Tl1InputCmd* cmd, std::string_view field, int* errorNumber) {
   bool valid;
-  if (field[0] == '"') {
+  if (field.empty()) {
+    valid = false;
+  } else if (field[0] == '"') {
     std::size_t close = field.find('"', 1);
     valid = close != std::string_view::npos && close <= kMaxTidLength && close + 1 == field.size();
   } else {
@@ -377,12 +379,14 @@ bool AIDParser(Tl1InputCmd* cmd, std::string_view field, int* errorNumber) {
   } else {
     cmd->aidParts.emplace_back(field);
   }
+  // Separators with nothing around them ("&-", ",") name no entity.
+  valid = valid && !cmd->aidParts.empty();
   return valid || Fail(errorNumber, kErrorIiac);
 }
 
 bool CtagParser(Tl1InputCmd* cmd, std::string_view field, int* errorNumber) {
   bool decimalPrefix = field.starts_with("D'");
-  bool valid = field.size() <= kMaxCtagLength;
+  bool valid = !field.empty() && field.size() <= kMaxCtagLength;
   if (valid && IsLetter(field[0]) && !decimalPrefix) {
     valid = std::all_of(field.begin(), field.end(), IsLetterOrDigit);
   } else if (valid) {

@@ -89,6 +89,7 @@ TEST(Tl1InputParserTest, FieldsParseOrFailWithTheirErrorNumber) {
       {"A::1&&-2&&-3:1", nullptr, 51},
       {"A::A&B-C:1", nullptr, 51},
       {"A::ALL:1", "A aid=[ALL] ctag=1"},
+      {"A::&-:1", nullptr, 51},
       // General block.
       {"A:::1:ON=5", "A ctag=1 on=5"},
       {"A:::1:ON=X", nullptr, 47},
