@@ -87,6 +87,24 @@ struct ScrambleChanges {
 // A host's answer: a String[] whose elements may be null, or null altogether.
 using HostAnswer = std::optional<std::vector<std::optional<std::string>>>;
 
+// The arguments of a TL1 command the host answers, in the order the host methods take them.
+// getAck takes all but agentAddress and agentPort.
+struct Tl1HostQuery {
+  std::string verb;
+  std::optional<std::string> modifier1;
+  std::optional<std::string> modifier2;
+  std::optional<std::string> aidText;
+  std::optional<std::vector<std::optional<std::string>>> parameters;  // the first payload block
+  std::int32_t agentId = 0;
+  std::int32_t reserved = 0;  // always 0
+  std::string agentAddress;
+  std::int32_t agentPort = 0;
+  std::optional<std::string> hostText1;  // both null unless both are non-empty
+  std::optional<std::string> hostText2;
+  std::string hostText3;
+  std::string hostText2Again;  // the agent's hostText2 as it is
+};
+
 class HostBridge {
  public:
   virtual ~HostBridge() = default;
@@ -112,6 +130,12 @@ class HostBridge {
   virtual std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& /*query*/) {
     return std::nullopt;
   }
+
+  // TL1: the acknowledgment to send before the response (0 none, 1..6 IP, PF, NA, RL, OK, NG),
+  // and the response block ([completion code, "T TEXT"...] or ["ErrorCode", code, text]). A host
+  // without TL1 acknowledges nothing and answers null (DENY).
+  virtual std::int32_t Tl1GetAck(const Tl1HostQuery& /*query*/) { return 0; }
+  virtual HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& /*query*/) { return std::nullopt; }
 };
 
 // The installed host, or nullptr. Installing is not synchronised with calls in flight: install

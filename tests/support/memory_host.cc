@@ -156,4 +156,38 @@ std::optional<ScrambleChanges> MemoryHost::ScramblePDU(const ScrambleQuery& quer
   return scrambler_ ? scrambler_(query) : std::nullopt;
 }
 
+namespace {
+
+std::string Tl1CodeOf(const Tl1HostQuery& query) {
+  std::string code = query.verb;
+  if (query.modifier1) code += "-" + *query.modifier1;
+  if (query.modifier2) code += "-" + *query.modifier2;
+  return code;
+}
+
+}  // namespace
+
+void MemoryHost::SetTl1Reply(const std::string& commandCode, Tl1Reply reply) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  tl1Replies_[commandCode] = std::move(reply);
+}
+
+std::vector<Tl1HostQuery> MemoryHost::Tl1Queries() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return tl1Queries_;
+}
+
+std::int32_t MemoryHost::Tl1GetAck(const Tl1HostQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  auto found = tl1Replies_.find(Tl1CodeOf(query));
+  return found == tl1Replies_.end() ? 0 : found->second.ack;
+}
+
+HostAnswer MemoryHost::Tl1GetResponseBlock(const Tl1HostQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  tl1Queries_.push_back(query);
+  auto found = tl1Replies_.find(Tl1CodeOf(query));
+  return found == tl1Replies_.end() ? std::nullopt : found->second.response;
+}
+
 }  // namespace tessel

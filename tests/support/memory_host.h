@@ -39,6 +39,16 @@ class MemoryHost : public HostBridge {
   void SetScrambler(Scrambler scrambler);
   std::vector<ScrambleQuery> ScrambleQueries() const;
 
+  // What a TL1 command answers, by its code as the engine passes it (VERB, VERB-MOD1 or
+  // VERB-MOD1-MOD2); a code without a reply acknowledges nothing and answers null. The queries
+  // of the response-block calls are kept in order.
+  struct Tl1Reply {
+    std::int32_t ack = 0;
+    HostAnswer response;
+  };
+  void SetTl1Reply(const std::string& commandCode, Tl1Reply reply);
+  std::vector<Tl1HostQuery> Tl1Queries() const;
+
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
   HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) override;
@@ -49,6 +59,8 @@ class MemoryHost : public HostBridge {
   void LogResponseMessage(const InformReport& report) override;
   void StoreDroppedInformMessage(const InformReport& report) override;
   std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& query) override;
+  std::int32_t Tl1GetAck(const Tl1HostQuery& query) override;
+  HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& query) override;
 
  private:
   struct Entry {
@@ -72,6 +84,8 @@ class MemoryHost : public HostBridge {
   bool recordReads_ = false;
   Scrambler scrambler_;
   std::vector<ScrambleQuery> scrambleQueries_;
+  std::map<std::string, Tl1Reply> tl1Replies_;
+  std::vector<Tl1HostQuery> tl1Queries_;
 };
 
 // The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community
