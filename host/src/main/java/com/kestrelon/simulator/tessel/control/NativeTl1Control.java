@@ -64,11 +64,17 @@ public final class NativeTl1Control implements Tl1Control {
     for (String entry : entries == null ? new String[0] : entries) {
       String[] fields = entry.split("\t", PENDING_FIELDS);
       if (fields.length == PENDING_FIELDS) {
-        pending.add(new PendingCommand(Integer.parseInt(fields[0]), Long.parseLong(fields[1]),
-            fields[2].isEmpty() ? null : Integer.valueOf(fields[2]), orNull(fields[3]), orNull(fields[4]), fields[5]));
+        pending.add(new PendingCommand(Integer.parseInt(fields[0]), Long.parseLong(fields[1]), on(fields[2]),
+            orNull(fields[3]), orNull(fields[4]), fields[5]));
       }
     }
     return pending;
+  }
+
+  /** The ON a command gave; the engine lists a negative number (or nothing) for none. */
+  private static Integer on(String field) {
+    int on = field.isEmpty() ? -1 : Integer.parseInt(field);
+    return on < 0 ? null : on;
   }
 
   private static String orNull(String field) {

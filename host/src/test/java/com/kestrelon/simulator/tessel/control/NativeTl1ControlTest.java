@@ -43,7 +43,7 @@ class NativeTl1ControlTest {
     @Override
     public String[] listPending(int agentId) {
       return new String[] {"7\t180388626433\t5\t\t\tENT-X:NE1:A:1:ON=5;",
-          "8\t180388626434\t\t26-12-07\t01-30-00\tED-EQPT::SLOT-5:2::DATE=26-12-07,TIME=01-30-00;"};
+          "8\t180388626434\t-1\t26-12-07\t01-30-00\tED-EQPT::SLOT-5:2::DATE=26-12-07,TIME=01-30-00;"};
     }
   };
 
