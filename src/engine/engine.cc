@@ -15,6 +15,7 @@
 #include "snmp/service.h"
 #include "snmpv3/engine_id.h"
 #include "snmpv3/v3_config.h"
+#include "tl1/tl1_service.h"
 
 namespace tessel {
 namespace {
@@ -135,6 +136,15 @@ bool StartAgentAndService(const std::string& address, std::int32_t port,
   return true;
 }
 
+Tl1Service& TheTl1Service() {
+  static auto* service = [] {
+    Tl1ServiceOptions options;
+    options.status = [](const std::string& text) { PrintStatus(text); };
+    return new Tl1Service(std::move(options));
+  }();
+  return *service;
+}
+
 void BaseLoop() {
   LOG_TRACE("\n\t@@@@@ Inside BaseLoop() @@@@@ \n");
   TheLifecycle().baseLoopStop.Wait();
@@ -165,6 +175,7 @@ bool AdapterJniStopSnmp() {
 bool AdapterJniStopNetwork() {
   LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopNetwork() @@@@@ \n");
   Lifecycle& lifecycle = TheLifecycle();
+  TheTl1Service().Stop();
   StopSnmpAndReport(lifecycle, "Network resources cleared Successfully");
   std::lock_guard<std::mutex> lock(lifecycle.mutex);
   CloseEngineLog();

@@ -12,6 +12,8 @@
 
 namespace tessel {
 
+class Tl1Service;
+
 struct EngineParams {
   bool consoleMode = false;
   std::uint8_t debugLevel = 0;
@@ -32,6 +34,9 @@ bool InitSnmpThread();
 std::vector<std::int64_t> StartSnmpNetwork(const std::vector<AgentRegistration>& agents);
 // Opens a registered agent, then starts the SNMP service if it was not started.
 bool StartAgentAndService(const std::string& address, std::int32_t port, std::uint32_t engineBoots);
+// The engine's TL1 service, created on first use and never destroyed.
+Tl1Service& TheTl1Service();
+
 // Blocks the calling thread until AdapterJniStopNetwork.
 void BaseLoop();
 // Stops the SNMP service and releases its agents and MIB tree.

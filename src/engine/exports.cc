@@ -24,27 +24,6 @@ namespace {
 constexpr std::size_t kMaxAgentsPerCall = 32767;
 constexpr std::size_t kMaxStringArray = 65535;
 
-template <typename Result, typename Body>
-Result Guarded(Result failure, Body body) noexcept {
-  try {
-    return body();
-  } catch (const std::bad_alloc&) {
-    LOG_ERROR("unable to alloc memory \n");
-  } catch (...) {
-    LOG_ERROR("unexpected failure in a host call\n");
-  }
-  return failure;
-}
-
-template <typename Body>
-void GuardedVoid(Body body) noexcept {
-  Guarded(0, [&] {
-    body();
-    return 0;
-  });
-}
-
-jboolean ToJboolean(bool value) { return value ? JNI_TRUE : JNI_FALSE; }
 
 // A null text arrives as the empty text.
 std::string Text(JNIEnv* env, jstring text) {

@@ -294,6 +294,17 @@ constexpr MethodName kScrambleMethod = {
     "(JLjava/lang/String;[Ljava/lang/String;[Ljava/lang/String;JBJJLjava/lang/String;IILjava/lang/"
     "String;ILjava/lang/String;Z)Ljava/util/Hashtable;"};
 
+// The TL1 handler's methods: the acknowledgment and the response block of a command.
+constexpr MethodName kTl1GetAck = {
+    "getAck",
+    "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;[Ljava/lang/"
+    "String;IILjava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;)I"};
+constexpr MethodName kTl1GetResponseBlock = {
+    "getResponseBlock",
+    "(Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;[Ljava/lang/"
+    "String;IILjava/lang/String;ILjava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/"
+    "lang/String;)[Ljava/lang/String;"};
+
 // Status methods the handler must have although the engine does not call them.
 constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"},
                                          {"setProgressValue", "(I)V"}};
@@ -316,6 +327,14 @@ struct HandlerBinding {
   jmethodID methods[kValueMethodCount] = {};
   jmethodID informMethods[kInformMethodCount] = {};
   jmethodID scramble = nullptr;
+};
+
+struct Tl1HandlerBinding {
+  Tl1HandlerBinding(JavaVM* vm, JNIEnv* env, jobject handler) : vm(vm), object(vm, env, handler) {}
+  JavaVM* vm;
+  GlobalRef object;
+  jmethodID getAck = nullptr;
+  jmethodID getResponseBlock = nullptr;
 };
 
 // The arguments of one value call, converted in the caller's local frame.
@@ -543,6 +562,29 @@ bool JniHost::BindSnmpHandler(JNIEnv* env, jobject handler) {
   return true;
 }
 
+bool JniHost::BindTl1Handler(JNIEnv* env, jobject handler) {
+  JavaVM* vm = nullptr;
+  if (handler == nullptr || env->GetJavaVM(&vm) != JNI_OK) return false;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return false;
+  jclass type = env->GetObjectClass(handler);
+  auto binding = std::make_shared<Tl1HandlerBinding>(vm, env, handler);
+  binding->getAck = LookUpMethod(env, type, kTl1GetAck.name, kTl1GetAck.signature);
+  binding->getResponseBlock =
+      LookUpMethod(env, type, kTl1GetResponseBlock.name, kTl1GetResponseBlock.signature);
+  if (binding->getAck == nullptr || binding->getResponseBlock == nullptr ||
+      LoadJavaStrings(env) == nullptr)
+    return false;
+  std::lock_guard<std::mutex> lock(mutex_);
+  tl1Handler_ = std::move(binding);
+  return true;
+}
+
+std::shared_ptr<const Tl1HandlerBinding> JniHost::Tl1Handler() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return tl1Handler_;
+}
+
 std::shared_ptr<const SimulatorBinding> JniHost::Simulator() const {
   std::lock_guard<std::mutex> lock(mutex_);
   return simulator_;
@@ -587,26 +629,41 @@ void JniHost::PrintStatus(const std::string& text) {
   ClearException(env, "printStatus");
 }
 
-template <typename Fill>
-HostAnswer JniHost::CallValueMethod(int method, Fill fill) {
-  std::shared_ptr<const HandlerBinding> handler = Handler();
-  if (!handler) return std::nullopt;
-  JNIEnv* env = AttachedEnv(handler->vm);
-  if (env == nullptr) return std::nullopt;
+namespace {
+
+// Runs call(env, arguments) in a local frame of the calling thread, attached to the binding's
+// JVM; failure when there is no binding, no environment or no memory, or when the arguments
+// could not all be converted.
+template <typename Binding, typename Result, typename Fill, typename Call>
+Result CallHost(const std::shared_ptr<const Binding>& binding, Result failure, Fill fill,
+                Call call) {
+  if (!binding) return failure;
+  JNIEnv* env = AttachedEnv(binding->vm);
+  if (env == nullptr) return failure;
   LocalFrame frame(env);
-  if (!frame.Pushed()) return std::nullopt;
+  if (!frame.Pushed()) return failure;
   try {
     JavaArguments arguments(env);
     fill(arguments);
-    if (arguments.Failed()) return std::nullopt;
-    jobject answer =
-        env->CallObjectMethodA(handler->object.Get(), handler->methods[method], arguments.Values());
-    if (ClearException(env, kValueMethods[method].name)) return std::nullopt;
-    return AnswerFromJava(env, static_cast<jobjectArray>(answer));
+    if (arguments.Failed()) return failure;
+    return call(env, arguments.Values());
   } catch (const std::bad_alloc&) {
     LOG_ERROR("unable to alloc memory \n");
-    return std::nullopt;
+    return failure;
   }
+}
+
+}  // namespace
+
+template <typename Fill>
+HostAnswer JniHost::CallValueMethod(int method, Fill fill) {
+  std::shared_ptr<const HandlerBinding> handler = Handler();
+  return CallHost(handler, HostAnswer{}, fill, [&](JNIEnv* env, const jvalue* values) {
+    jobject answer =
+        env->CallObjectMethodA(handler->object.Get(), handler->methods[method], values);
+    if (ClearException(env, kValueMethods[method].name)) return HostAnswer{};
+    return AnswerFromJava(env, static_cast<jobjectArray>(answer));
+  });
 }
 
 HostAnswer JniHost::AnswerFromJava(JNIEnv* env, jobjectArray answer) {
@@ -743,6 +800,53 @@ std::optional<ScrambleChanges> JniHost::ScramblePDU(const ScrambleQuery& query) 
     LOG_ERROR("unable to alloc memory \n");
     return std::nullopt;
   }
+}
+
+namespace {
+
+// The command's fields every TL1 method begins with.
+void FillTl1Command(JavaArguments& a, const Tl1HostQuery& query) {
+  a.Constant(query.verb).Constant(query.modifier1).Constant(query.modifier2).Text(query.aidText);
+  if (query.parameters) {
+    a.Texts(*query.parameters);
+  } else {
+    a.Null();
+  }
+  a.Int(query.agentId).Int(query.reserved);
+}
+
+void FillTl1HostTexts(JavaArguments& a, const Tl1HostQuery& query) {
+  a.Constant(query.hostText1).Constant(query.hostText2).Constant(query.hostText3);
+  a.Constant(query.hostText2Again);
+}
+
+}  // namespace
+
+std::int32_t JniHost::Tl1GetAck(const Tl1HostQuery& query) {
+  std::shared_ptr<const Tl1HandlerBinding> handler = Tl1Handler();
+  auto fill = [&](JavaArguments& a) {
+    FillTl1Command(a, query);
+    FillTl1HostTexts(a, query);
+  };
+  return CallHost(handler, std::int32_t{0}, fill, [&](JNIEnv* env, const jvalue* values) {
+    jint ack = env->CallIntMethodA(handler->object.Get(), handler->getAck, values);
+    return ClearException(env, kTl1GetAck.name) ? 0 : ack;
+  });
+}
+
+HostAnswer JniHost::Tl1GetResponseBlock(const Tl1HostQuery& query) {
+  std::shared_ptr<const Tl1HandlerBinding> handler = Tl1Handler();
+  auto fill = [&](JavaArguments& a) {
+    FillTl1Command(a, query);
+    a.Constant(query.agentAddress).Int(query.agentPort);
+    FillTl1HostTexts(a, query);
+  };
+  return CallHost(handler, HostAnswer{}, fill, [&](JNIEnv* env, const jvalue* values) {
+    jobject answer =
+        env->CallObjectMethodA(handler->object.Get(), handler->getResponseBlock, values);
+    if (ClearException(env, kTl1GetResponseBlock.name)) return HostAnswer{};
+    return AnswerFromJava(env, static_cast<jobjectArray>(answer));
+  });
 }
 
 namespace {

@@ -24,6 +24,7 @@ JNIEnv* AttachedEnv(JavaVM* vm);
 
 struct SimulatorBinding;
 struct HandlerBinding;
+struct Tl1HandlerBinding;
 class JavaArguments;
 
 class JniHost final : public HostBridge {
@@ -36,6 +37,9 @@ class JniHost final : public HostBridge {
   bool BindNetworkSimulator(JNIEnv* env, jobject simulator);
   // Binds the SNMP handler object (value calls). False when one of its methods is missing.
   bool BindSnmpHandler(JNIEnv* env, jobject handler);
+  // Binds the TL1 handler object (acknowledgments and responses). False when one of its methods
+  // is missing.
+  bool BindTl1Handler(JNIEnv* env, jobject handler);
 
   // Java text to C++ bytes (UTF-8, through the simulator's getBytes when bound); nothing for
   // null or when the host fails.
@@ -51,6 +55,8 @@ class JniHost final : public HostBridge {
   void LogResponseMessage(const InformReport& report) override;
   void StoreDroppedInformMessage(const InformReport& report) override;
   std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& query) override;
+  std::int32_t Tl1GetAck(const Tl1HostQuery& query) override;
+  HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& query) override;
 
  private:
   // Calls the handler's inform method (kLogResponse or kStoreDropped) with what fill adds.
@@ -58,6 +64,7 @@ class JniHost final : public HostBridge {
   void CallInformMethod(int method, Fill fill);
   std::shared_ptr<const SimulatorBinding> Simulator() const;
   std::shared_ptr<const HandlerBinding> Handler() const;
+  std::shared_ptr<const Tl1HandlerBinding> Tl1Handler() const;
   // Calls value method number method with the arguments fill adds.
   template <typename Fill>
   HostAnswer CallValueMethod(int method, Fill fill);
@@ -65,9 +72,10 @@ class JniHost final : public HostBridge {
   // The fields a scrambler's Hashtable replaces; nothing when it cannot be read whole.
   std::optional<ScrambleChanges> ChangesFromJava(JNIEnv* env, jobject table);
 
-  mutable std::mutex mutex_;  // guards the two bindings; calls work on their own copies
+  mutable std::mutex mutex_;  // guards the bindings; calls work on their own copies
   std::shared_ptr<const SimulatorBinding> simulator_;
   std::shared_ptr<const HandlerBinding> handler_;
+  std::shared_ptr<const Tl1HandlerBinding> tl1Handler_;
 };
 
 // C++ bytes to a Java String (local reference), decoded as UTF-8; bytes that are not plain

@@ -451,6 +451,10 @@ TcpServer::AcceptResult TcpServer::AcceptOne(Listener& listener, std::vector<Ses
   TcpSessionId id = NextSessionId(listener.tag);
   auto session = std::make_unique<Session>(id, socket, listener.keepAliveSeconds, nextSerial_++);
   session->peer = PeerOf(peer);
+  sockaddr_storage local{};
+  length = sizeof local;
+  if (getsockname(socket, reinterpret_cast<sockaddr*>(&local), &length) == 0)
+    session->peer.localPort = PeerOf(local).port;
   if (!Register(epoll_, EPOLL_CTL_ADD, socket, id, EPOLLIN)) {
     LOG_ERROR("TCP server: epoll_ctl failed for fd %d (errno %d)", socket, errno);
     return AcceptResult::kAccepted;

@@ -40,6 +40,7 @@ inline constexpr std::uint32_t TcpClientNumberOf(TcpSessionId id) {
 struct TcpPeer {
   std::string address;  // numeric text
   std::uint16_t port = 0;
+  std::uint16_t localPort = 0;  // the port of the listener that accepted the session
 };
 
 // Implemented by the protocol service that owns the sessions; called on the loop thread.

@@ -176,5 +176,52 @@ TEST_F(JniHostTest, ScramblerGetsEveryArgumentInOrderAndItsTableIsReadWholeOrNot
   EXPECT_FALSE(env_->ExceptionCheck());
 }
 
+TEST_F(JniHostTest, Tl1HandlerAnswersAcknowledgmentAndResponseBlock) {
+  ASSERT_EQ(env_->PushLocalFrame(64), 0);
+  JniHost& host = JniHost::Instance();
+  EXPECT_FALSE(host.BindTl1Handler(env_, simulator_)) << "an object without the TL1 methods";
+  jobject handler = NewObject("com/kestrelon/simulator/tessel/tl1/TL1Handler");
+  jclass dataType = env_->FindClass("com/kestrelon/simulator/tessel/tl1/TL1Data");
+  jobject data = env_->CallStaticObjectMethod(
+      dataType,
+      env_->GetStaticMethodID(dataType, "parse",
+                              "(Ljava/lang/String;Ljava/lang/String;)Lcom/kestrelon/simulator/"
+                              "tessel/tl1/TL1Data;"),
+      env_->NewStringUTF("probe"),
+      env_->NewStringUTF("[ENT-EQPT]\nack IP\nCOMPLD\n\"{SID}:{AID}:{P1}:{CTAG}\"\n/*@{P2}*/\n"));
+  ASSERT_FALSE(env_->ExceptionCheck());
+  jclass listType = env_->FindClass("java/util/List");
+  jobject users = env_->CallStaticObjectMethod(
+      listType, env_->GetStaticMethodID(listType, "of", "()Ljava/util/List;"));
+  ASSERT_FALSE(env_->ExceptionCheck());
+  jclass handlerType = env_->GetObjectClass(handler);
+  env_->CallVoidMethod(handler,
+                       env_->GetMethodID(handlerType, "addDevice",
+                                         "(ILjava/lang/String;Ljava/lang/String;Lcom/kestrelon/"
+                                         "simulator/tessel/tl1/TL1Data;Ljava/util/List;)V"),
+                       7, env_->NewStringUTF("NE1"), env_->NewStringUTF("g"), data, users);
+  ASSERT_FALSE(env_->ExceptionCheck());
+  ASSERT_TRUE(host.BindTl1Handler(env_, handler));
+
+  Tl1HostQuery query;
+  query.verb = "ENT";
+  query.modifier1 = "EQPT";
+  query.aidText = "SLOT-1";
+  query.parameters = Texts{"x\xc3\xa9", std::nullopt};
+  query.agentId = 7;
+  query.agentAddress = "127.0.1.7";
+  query.agentPort = 3083;
+  query.hostText3 = "mode";
+  EXPECT_EQ(host.Tl1GetAck(query), 1);
+  EXPECT_EQ(host.Tl1GetResponseBlock(query), (Texts{"1", "0|NE1:SLOT-1:x\xc3\xa9:{CTAG}", "2|@"}));
+  query.verb = "DLT";
+  EXPECT_EQ(host.Tl1GetAck(query), 0);
+  EXPECT_EQ(host.Tl1GetResponseBlock(query), (Texts{"ErrorCode", "SCNF", "COMMAND NOT FOUND"}));
+  query.agentId = 8;
+  EXPECT_EQ(host.Tl1GetResponseBlock(query), std::nullopt) << "a device the host does not serve";
+  EXPECT_FALSE(env_->ExceptionCheck());
+  env_->PopLocalFrame(nullptr);
+}
+
 }  // namespace
 }  // namespace tessel
