@@ -153,11 +153,6 @@ public final class Launcher {
       err.println(e.getMessage());
       return 2;
     }
-    Optional<String> tl1 = tl1Section(network);
-    if (tl1.isPresent()) {
-      err.println(tl1.get() + ": tl1 is not available yet");
-      return 2;
-    }
     Optional<Control> control;
     try {
       control = control(network, options);
@@ -176,11 +171,6 @@ public final class Launcher {
       return 2;
     }
     return serve(network, snmp, control, out, err);
-  }
-
-  /** Where the first TL1 section is given: the engine does not serve TL1 yet. */
-  private static Optional<String> tl1Section(Network network) {
-    return network.groups().stream().flatMap(group -> group.tl1().stream()).map(Network.Tl1::where).findFirst();
   }
 
 

@@ -15,7 +15,10 @@ import java.io.ByteArrayOutputStream;
 import java.io.IOException;
 import java.io.PrintStream;
 import java.net.DatagramSocket;
+import java.net.InetAddress;
 import java.net.InetSocketAddress;
+import java.net.ServerSocket;
+import java.net.Socket;
 import java.net.URI;
 import java.net.http.HttpClient;
 import java.net.http.HttpRequest;
@@ -148,7 +151,7 @@ class LauncherTest {
   }
 
   @Test
-  void tl1FlagsDescribeTheOneGroupAndTl1IsRefusedAtLaunchForNow(@TempDir Path dir) throws Exception {
+  void tl1FlagsDescribeTheOneGroupNamedForItsSids(@TempDir Path dir) throws Exception {
     Path data = Files.writeString(dir.resolve("optical.tl1"), "[RTRV-HDR]\nCOMPLD\n");
     Network.Group alone = LaunchOptions.parse(new String[] {"--tl1-data", data.toString(), "--tl1-port", "4000",
         "--tl1-keepalive", "30"}).network(Path.of("unused.yaml")).groups().get(0);
@@ -159,14 +162,42 @@ class LauncherTest {
         .network(Path.of("unused.yaml")).groups().get(0);
     assertEquals(List.of("router", "2161", "3083"),
         List.of(both.name(), "" + both.snmp().get().port(), "" + both.tl1().get().port()));
-    assertEquals(2, runToEnd("--tl1-data", data.toString(), "--admin", "off"));
-    assertEquals("--tl1-data: tl1 is not available yet", err().strip());
-    Path network = Files.writeString(dir.resolve("network.yaml"),
-        "groups:\n  - name: a\n    count: 1\n    address: 127.0.9.1\n    tl1: {data: optical.tl1}\n");
-    err.reset();
-    assertEquals(2, runToEnd("--network", network.toString(), "--admin", "off"));
-    assertEquals(network + ":5: tl1 is not available yet", err().strip());
-    assertEquals("", out());
+  }
+
+  @Test
+  void aTl1GroupServesBesideAnSnmpGroupAndADeviceWhosePortIsTakenIsFailedForTl1(@TempDir Path dir)
+      throws Exception {
+    Path data = Files.writeString(dir.resolve("optical.tl1"), "[RTRV-HDR]\nCOMPLD\n");
+    Path network = Files.writeString(dir.resolve("network.yaml"), String.join("\n", "admin: off", "groups:",
+        "  - {name: routers, count: 1, address: 127.0.9.1, snmp: {port: 28171, data: "
+            + Launcher.defaultData().toAbsolutePath() + "}}",
+        "  - {name: optical, count: 2, address: 127.0.9.11, device-name: 'NE{n}', tl1: {port: 28175, data: " + data
+            + "}}", ""));
+    ServerSocket squatter = new ServerSocket(28175, 1, InetAddress.getByName("127.0.9.12"));
+    Launcher launcher = new Launcher();
+    AtomicInteger status = new AtomicInteger(-1);
+    Thread running = startNetwork(launcher, status, "--network", network.toString());
+    try {
+      awaitServing(running);
+      assertEquals("2 devices running: routers 1/1, optical 1/2 (1 failed)", err().strip());
+      DeviceTable devices = launcher.devices();
+      // Agent ids run through the groups: the router is 0, the optical devices 1 and 2.
+      Device first = devices.find("127.0.9.11").orElseThrow();
+      Device second = devices.find("127.0.9.12").orElseThrow();
+      assertEquals("NE1 optical {tl1=RUNNING} 1", describe(first) + " " + first.agentId());
+      assertEquals("NE2 optical {tl1=FAILED} 2", describe(second) + " " + second.agentId());
+      assertTrue(out().contains("TL1 Agent started at Port : 28175, IpAddress : 127.0.9.11"), out());
+      squatter.close();
+      assertEquals(Optional.empty(), devices.start("127.0.9.12", Optional.of("tl1")).orElseThrow().failure());
+      try (Socket client = new Socket("127.0.9.12", 28175)) {
+        assertTrue(client.isConnected(), "a device started again listens");
+      }
+    } finally {
+      squatter.close();
+      launcher.requestStop();
+      running.join(5000);
+    }
+    assertEquals(0, status.get());
   }
 
   @Test

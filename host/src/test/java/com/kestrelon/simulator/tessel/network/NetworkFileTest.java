@@ -243,12 +243,20 @@ class NetworkFileTest {
   }
 
   @Test
-  void shippedDefaultNetworkIsTheHundredRouters() throws Exception {
+  void shippedDefaultNetworkIsTheHundredRoutersAndTwentyOpticalElements() throws Exception {
     Path profiles = Path.of(System.getProperty("tessel.profiles.dir", "profiles")).toAbsolutePath().normalize();
     Network network = NetworkFile.read(profiles.resolve("network.yaml"));
     Snmp snmp = new Snmp(1161, profiles.resolve("router.snmprec"), Optional.of(profiles.resolve("snmpv3.conf")),
         "public", "private");
-    assertEquals(List.of(new Group("routers", 100, 0x7F00_0101L, "R{n}", Optional.of(snmp))), network.groups());
+    assertEquals(2, network.groups().size());
+    assertEquals(new Group("routers", 100, 0x7F00_0101L, "R{n}", Optional.of(snmp)), network.groups().get(0));
+    Group optical = network.groups().get(1);
+    Tl1 tl1 = optical.tl1().orElseThrow();
+    assertEquals(List.of("optical", "20", "127.0.2.1", "NE20", "false", "3083", "OptionalInt[3023]", "0", "false",
+        profiles.resolve("optical.tl1").toString()), List.of(optical.name(), "" + optical.count(), optical.address(0),
+        optical.deviceName(19), "" + optical.snmp().isPresent(), "" + tl1.port(), "" + tl1.telnetPort(),
+        "" + tl1.keepAlive(), "" + tl1.requireLogin(), tl1.dataFile().toString()));
+    assertEquals(List.of(new TL1User("admin", "admin")), tl1.users());
     assertEquals(Optional.of(new Admin("127.0.0.1", 8161)), network.admin());
     assertEquals(Path.of(System.getProperty("user.home"), ".local/state/tessel"), network.stateDir());
   }
