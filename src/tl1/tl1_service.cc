@@ -60,6 +60,8 @@ std::vector<std::string> Tl1Service::Complete(std::string_view prefix) const {
 
 void Tl1Service::RegisterAgent(const Tl1Agent& agent, std::int32_t hostInt) {
   std::lock_guard<std::mutex> lock(mutex_);
+  ForgetAgentLocked(agent.agentId);
+  agentAt_[{agent.ipAddress, agent.port}] = agent.agentId;
   Agent& record = agents_[agent.agentId];
   record.info = std::make_shared<const Tl1Agent>(agent);
   record.hostInt = hostInt;
@@ -69,10 +71,19 @@ void Tl1Service::RegisterAgent(const Tl1Agent& agent, std::int32_t hostInt) {
 // The caller holds mutex_.
 const Tl1Service::Agent* Tl1Service::FindAgentLocked(const std::string& address,
                                                      std::uint16_t port) const {
-  for (const auto& [id, agent] : agents_) {
-    if (agent.info->ipAddress == address && agent.info->port == port) return &agent;
-  }
-  return nullptr;
+  auto at = agentAt_.find({address, port});
+  if (at == agentAt_.end()) return nullptr;
+  auto found = agents_.find(at->second);
+  return found == agents_.end() ? nullptr : &found->second;
+}
+
+// The caller holds mutex_.
+void Tl1Service::ForgetAgentLocked(std::int32_t agentId) {
+  auto found = agents_.find(agentId);
+  if (found == agents_.end()) return;
+  auto at = agentAt_.find({found->second.info->ipAddress, found->second.info->port});
+  if (at != agentAt_.end() && at->second == agentId) agentAt_.erase(at);
+  agents_.erase(found);
 }
 
 bool Tl1Service::StartAgent(const std::string& address, std::uint16_t port) {
@@ -93,7 +104,7 @@ bool Tl1Service::StartAgent(const std::string& address, std::uint16_t port) {
     LOG_ERROR("%s (errno %d)\n", status, error);
     if (agentId) {
       std::lock_guard<std::mutex> lock(mutex_);
-      agents_.erase(*agentId);
+      ForgetAgentLocked(*agentId);
     }
   }
   if (options_.status) {
@@ -135,7 +146,7 @@ bool Tl1Service::StopAgent(const std::string& address, std::uint16_t port) {
     const Agent* agent = FindAgentLocked(address, port);
     if (agent == nullptr) return false;
     agentId = agent->info->agentId;
-    agents_.erase(agentId);
+    ForgetAgentLocked(agentId);
   }
   tcp_.CloseListeners(static_cast<std::uint32_t>(agentId));
   return true;
@@ -210,6 +221,7 @@ void Tl1Service::Stop() {
   for (const Tl1PendingEntry& entry : pending_.List()) pending_.Cancel(entry.id);
   std::lock_guard<std::mutex> lock(mutex_);
   agents_.clear();
+  agentAt_.clear();
   loginRequired_.clear();
   sessions_.clear();
   registry_.Clear();

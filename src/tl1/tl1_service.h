@@ -22,6 +22,7 @@
 #include <set>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "engine/host_bridge.h"
@@ -129,6 +130,7 @@ class Tl1Service final : private TcpSessionEvents {
   HostBridge* Host() const;
   std::vector<std::string> Complete(std::string_view prefix) const;
   const Agent* FindAgentLocked(const std::string& address, std::uint16_t port) const;
+  void ForgetAgentLocked(std::int32_t agentId);
   void StartThreadsLocked();
   void Enqueue(const std::shared_ptr<Session>& session, std::vector<Work> work);
   void Deliver(Tl1PendingEntry entry);
@@ -155,6 +157,8 @@ class Tl1Service final : private TcpSessionEvents {
   // Guards the agents, the sessions and their ATAGs.
   mutable std::mutex mutex_;
   std::map<std::int32_t, Agent> agents_;
+  // The agent on each address and port, so that a start or stop by endpoint does not walk them.
+  std::map<std::pair<std::string, std::uint16_t>, std::int32_t> agentAt_;
   std::map<std::int32_t, bool> loginRequired_;
   std::map<TcpSessionId, std::shared_ptr<Session>> sessions_;
 
