@@ -8,6 +8,7 @@
 
 #include "base/log.h"
 #include "support/memory_host.h"
+#include "tl1/noon.h"
 
 namespace tessel {
 namespace {
@@ -15,15 +16,6 @@ namespace {
 using Answer = std::vector<std::optional<std::string>>;
 constexpr auto kAck = Tl1OutputKind::kAcknowledgment;
 constexpr auto kResponse = Tl1OutputKind::kResponse;
-
-std::tm Noon() {
-  std::tm time{};
-  time.tm_year = 124;
-  time.tm_mon = 5;
-  time.tm_mday = 30;
-  time.tm_hour = 12;
-  return time;
-}
 
 // A response of NE1 at the fixed time: identification, then the lines as they are written.
 Tl1Output Response(const std::string& ctag, const std::string& word,

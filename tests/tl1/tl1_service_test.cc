@@ -11,6 +11,7 @@
 #include <thread>
 
 #include "support/memory_host.h"
+#include "tl1/noon.h"
 
 namespace tessel {
 namespace {
@@ -25,15 +26,6 @@ const std::uint16_t kOtherPort = kPort + 2;
 const std::string kAddress = "127.87.0.1";
 constexpr std::int32_t kAgentId = 7;
 constexpr const char* kPrompt = "\r\nTL1>>";
-
-std::tm Noon() {
-  std::tm time{};
-  time.tm_year = 124;
-  time.tm_mon = 5;
-  time.tm_mday = 30;
-  time.tm_hour = 12;
-  return time;
-}
 
 std::string Response(const std::string& ctag, const std::string& word) {
   return "\r\n\n   NE1 24-06-30 12:00:00\r\nM  " + ctag + " " + word + "\r\n;" + kPrompt;
