@@ -21,39 +21,9 @@
 #include <thread>
 #include <vector>
 
+#include "transport/stream_server.h"
+
 namespace tessel {
-
-// A session's id: its listener's tag in the upper 32 bits and the server's running client number
-// (from 1) in the lower ones, so ids of different tags never meet.
-using TcpSessionId = std::uint64_t;
-
-inline constexpr TcpSessionId MakeTcpSessionId(std::uint32_t tag, std::uint32_t clientNumber) {
-  return static_cast<TcpSessionId>(tag) << 32 | clientNumber;
-}
-inline constexpr std::uint32_t TcpListenerTagOf(TcpSessionId id) {
-  return static_cast<std::uint32_t>(id >> 32);
-}
-inline constexpr std::uint32_t TcpClientNumberOf(TcpSessionId id) {
-  return static_cast<std::uint32_t>(id);
-}
-
-struct TcpPeer {
-  std::string address;  // numeric text
-  std::uint16_t port = 0;
-  std::uint16_t localPort = 0;  // the port of the listener that accepted the session
-};
-
-// Implemented by the protocol service that owns the sessions; called on the loop thread.
-class TcpSessionEvents {
- public:
-  virtual ~TcpSessionEvents() = default;
-  virtual void OnAccepted(TcpSessionId session, std::uint32_t listenerTag, const TcpPeer& peer) = 0;
-  // The bytes of one read; a protocol message may span several reads or share one.
-  virtual void OnBytes(TcpSessionId session, std::string_view bytes) = 0;
-  // The session is gone (peer close or reset, read or write error, keep-alive expiry, output
-  // past the cap, Close, CloseListeners or Stop); Send to it returns false from now on.
-  virtual void OnClosed(TcpSessionId session) = 0;
-};
 
 struct TcpServerOptions {
   // Output a session may have queued and not yet written; more closes the session, so a client
@@ -67,10 +37,10 @@ struct TcpServerOptions {
   std::chrono::milliseconds acceptRetry{1000};
 };
 
-class TcpServer {
+class TcpServer final : public StreamServer {
  public:
   explicit TcpServer(TcpSessionEvents* events, TcpServerOptions options = {});
-  ~TcpServer();  // Stop
+  ~TcpServer() override;  // Stop
   TcpServer(const TcpServer&) = delete;
   TcpServer& operator=(const TcpServer&) = delete;
 
@@ -81,23 +51,23 @@ class TcpServer {
   // listener starts the loop thread. False with *error (when given) set to the errno of the
   // failing step; EINVAL for an address that is not numeric.
   bool Listen(std::uint32_t tag, const std::string& address, std::uint16_t port,
-              std::uint32_t keepAliveSeconds, int* error = nullptr);
+              std::uint32_t keepAliveSeconds, int* error = nullptr) override;
   // Closes every listener of tag at once (its port is free on return) and every session of tag
   // (their OnClosed follow on the loop thread). When no listener is left, client numbers start
   // again at 1.
-  void CloseListeners(std::uint32_t tag);
+  void CloseListeners(std::uint32_t tag) override;
   // Queues bytes for the session (written at once as far as the socket takes them). False when
   // the session is gone or closing, or when its queued output would pass the cap, which closes it.
-  bool Send(TcpSessionId session, std::string bytes);
+  bool Send(TcpSessionId session, std::string bytes) override;
   // Closes the session; with afterPendingOutput once its queued output is written. Further Send
   // calls return false either way.
-  void Close(TcpSessionId session, bool afterPendingOutput);
+  void Close(TcpSessionId session, bool afterPendingOutput) override;
   // The open sessions of tag in accept order.
-  std::vector<TcpSessionId> SessionsOf(std::uint32_t tag) const;
-  std::size_t SessionCount() const;
+  std::vector<TcpSessionId> SessionsOf(std::uint32_t tag) const override;
+  std::size_t SessionCount() const override;
   // Closes every listener and session and ends the loop thread once their OnClosed calls are
   // made. The server may listen again afterwards.
-  void Stop();
+  void Stop() override;
 
  private:
   struct Listener;
