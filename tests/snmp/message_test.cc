@@ -16,16 +16,8 @@ namespace {
 
 class MessageTest : public SnmpAgentTest {};
 
-Request GetOf(const std::string& oid) {
-  Request request;
-  request.bindings = {{O(oid), VarValue::Empty(kAsnNull)}};
-  return request;
-}
-
-std::uint32_t Count(SnmpCounter counter) { return SnmpCount(counter); }
-
 TEST_F(MessageTest, GetIsAnsweredWithTheFixedHeaderForm) {
-  ASSERT_TRUE(Send(GetOf("1.3.6.1.2.1.1.5.0")));
+  ASSERT_TRUE(Send(GetOf({"1.3.6.1.2.1.1.5.0"})));
   // Response 42 with sysName.0 = "r1", every SEQUENCE length in four octets.
   const std::vector<std::uint8_t> expected = {
       0x30, 0x82, 0x00, 0x2E, 0x02, 0x01, 0x01, 0x04, 0x06, 'p',  'u',  'b',  'l',
@@ -33,15 +25,15 @@ TEST_F(MessageTest, GetIsAnsweredWithTheFixedHeaderForm) {
       0x01, 0x00, 0x30, 0x82, 0x00, 0x12, 0x30, 0x82, 0x00, 0x0E, 0x06, 0x08, 0x2B,
       0x06, 0x01, 0x02, 0x01, 0x01, 0x05, 0x00, 0x04, 0x02, 'r',  '1'};
   EXPECT_EQ(lastReply_, expected);
-  EXPECT_EQ(Count(SnmpCounter::kInMessages), 1u);
-  EXPECT_EQ(Count(SnmpCounter::kV2GetRequests), 1u);
-  EXPECT_EQ(Count(SnmpCounter::kOutResponses), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kInMessages), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kV2GetRequests), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kOutResponses), 1u);
 }
 
 TEST_F(MessageTest, TrafficLogDumpsRequestAndResponseFromLevelOne) {
   const std::string path = ::testing::TempDir() + "traffic.log";
   ASSERT_TRUE(OpenEngineLog({1, path, 0}));
-  ASSERT_TRUE(Send(GetOf("1.3.6.1.2.1.1.5.0")));
+  ASSERT_TRUE(Send(GetOf({"1.3.6.1.2.1.1.5.0"})));
   OpenEngineLog({0, "", 0});
   std::stringstream log;
   log << std::ifstream(path).rdbuf();
@@ -57,42 +49,42 @@ TEST_F(MessageTest, TrafficLogDumpsRequestAndResponseFromLevelOne) {
 }
 
 TEST_F(MessageTest, RefusedMessagesAreDroppedAndCounted) {
-  Request wrongCommunity = GetOf("1.3.6.1.2.1.1.5.0");
+  Request wrongCommunity = GetOf({"1.3.6.1.2.1.1.5.0"});
   wrongCommunity.community = "private";  // a write community is not a read community
   EXPECT_FALSE(Send(wrongCommunity));
-  EXPECT_EQ(Count(SnmpCounter::kBadCommunityNames), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kBadCommunityNames), 1u);
 
-  Request trap = GetOf("1.3.6.1.2.1.1.5.0");
+  Request trap = GetOf({"1.3.6.1.2.1.1.5.0"});
   trap.type = kTrapV2;
   EXPECT_FALSE(Send(trap));
-  EXPECT_EQ(Count(SnmpCounter::kInTraps), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kInTraps), 1u);
 
-  Request bulkInV1 = GetOf("1.3.6.1.2.1.1");
+  Request bulkInV1 = GetOf({"1.3.6.1.2.1.1"});
   bulkInV1.version = kSnmpV1;
   bulkInV1.type = kGetBulkRequest;
   EXPECT_FALSE(Send(bulkInV1));
-  Request strayResponse = GetOf("1.3.6.1.2.1.1.5.0");
+  Request strayResponse = GetOf({"1.3.6.1.2.1.1.5.0"});
   strayResponse.type = kGetResponse;
   EXPECT_FALSE(Send(strayResponse));
 
-  Request v3 = GetOf("1.3.6.1.2.1.1.5.0");
+  Request v3 = GetOf({"1.3.6.1.2.1.1.5.0"});
   v3.version = kSnmpV3;
   EXPECT_FALSE(Send(v3));
-  EXPECT_EQ(Count(SnmpCounter::kBadVersions), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kBadVersions), 1u);
 
   gv_processV2Only = 1;
-  Request v1 = GetOf("1.3.6.1.2.1.1.5.0");
+  Request v1 = GetOf({"1.3.6.1.2.1.1.5.0"});
   v1.version = kSnmpV1;
   EXPECT_FALSE(Send(v1));
   gv_processV2Only = 0;
   EXPECT_TRUE(Send(v1));
-  EXPECT_EQ(Count(SnmpCounter::kBadVersions), 2u);
-  EXPECT_EQ(Count(SnmpCounter::kDroppedRequests), 6u);
-  EXPECT_EQ(Count(SnmpCounter::kV1Requests), 2u);  // the GetBulk and the Get
+  EXPECT_EQ(SnmpCount(SnmpCounter::kBadVersions), 2u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kDroppedRequests), 6u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kV1Requests), 2u);  // the GetBulk and the Get
 }
 
 TEST_F(MessageTest, SizeLimitAndMalformedInput) {
-  Request big = GetOf("1.3.6.1.2.1.1.5.0");
+  Request big = GetOf({"1.3.6.1.2.1.1.5.0"});
   big.type = kSetRequest;
   big.community = "private";
   big.bindings[0].second = VarValue::Octets(kAsnOctetString, std::string(19989 - 50, 'x'));
@@ -104,7 +96,7 @@ TEST_F(MessageTest, SizeLimitAndMalformedInput) {
   EXPECT_TRUE(Exchange(datagram));
   big.bindings[0].second.octets.push_back('x');
   EXPECT_FALSE(Send(big));
-  EXPECT_EQ(Count(SnmpCounter::kInTooBigs), 1u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kInTooBigs), 1u);
 
   // A name of 129 sub-identifiers: 1.3 then 127 times 1.
   std::vector<std::uint8_t> binding(3 + 131 + 2, 0x01);
@@ -115,21 +107,15 @@ TEST_F(MessageTest, SizeLimitAndMalformedInput) {
   Request longName;
   longName.rawBindings = {binding};
   EXPECT_FALSE(Send(longName));
-  // The last sub-identifier 2^32 - 1 is 8F FF FF FF 7F (then the NULL value 05 00); 9F in its
-  // first octet makes it exceed 32 bits.
-  std::vector<std::uint8_t> bad = EncodeRequest(GetOf("1.3.6.1.2.1.1.5.0.4294967295"));
-  ASSERT_EQ(bad[bad.size() - 7], 0x8F);
-  bad[bad.size() - 7] = 0x9F;
-  EXPECT_FALSE(Exchange(bad));
-  EXPECT_EQ(Count(SnmpCounter::kAsnParseErrors), 2u);
-  std::vector<std::uint8_t> valid = EncodeRequest(GetOf("1.3.6.1.2.1.1.5.0"));
+  EXPECT_EQ(SnmpCount(SnmpCounter::kAsnParseErrors), 1u);  // sub-identifier limits: ber_test.cc
+  std::vector<std::uint8_t> valid = EncodeRequest(GetOf({"1.3.6.1.2.1.1.5.0"}));
   std::vector<std::uint8_t> truncated(valid.begin(), valid.end() - 3);
   EXPECT_FALSE(Exchange(truncated));
-  EXPECT_EQ(Count(SnmpCounter::kAsnParseErrors), 3u);
+  EXPECT_EQ(SnmpCount(SnmpCounter::kAsnParseErrors), 2u);
 }
 
 TEST_F(MessageTest, InformIsAcknowledgedWithItsOwnOctets) {
-  Request inform = GetOf("1.3.6.1.2.1.1.3.0");
+  Request inform = GetOf({"1.3.6.1.2.1.1.3.0"});
   inform.type = kInformRequest;
   inform.bindings[0].second = VarValue::Unsigned(kAsnTimeTicks, 5);
   std::vector<std::uint8_t> datagram = EncodeRequest(inform);

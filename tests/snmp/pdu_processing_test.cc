@@ -9,16 +9,6 @@ namespace {
 
 class PduProcessingTest : public SnmpAgentTest {
  protected:
-  // A request of the given type that names each OID with a NULL value.
-  static Request Of(std::uint8_t type, std::vector<std::string> oids,
-                    std::int32_t version = kSnmpV2c) {
-    Request request;
-    request.version = version;
-    request.type = type;
-    for (const std::string& oid : oids)
-      request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
-    return request;
-  }
   // Error status and index of a reply; {-1, -1} when there was none.
   static std::pair<std::int32_t, std::int32_t> Status(const std::optional<SnmpPdu>& reply) {
     return reply ? std::pair(reply->errorStatus, reply->errorIndex) : std::pair(-1, -1);
@@ -34,7 +24,7 @@ class PduProcessingTest : public SnmpAgentTest {
   std::vector<std::string> Walk(std::int32_t version, std::string from) {
     std::vector<std::string> names;
     for (int step = 0; step < 100; ++step) {
-      auto reply = Send(Of(kGetNextRequest, {from}, version));
+      auto reply = Send(GetOf({from}, kGetNextRequest, version));
       if (!reply || reply->errorStatus != 0) break;
       if (reply->requestVarBinds.at(0).value.type == kEndOfMibView) break;
       names.push_back(from = Names(*reply).at(0));
@@ -53,7 +43,7 @@ class PduProcessingTest : public SnmpAgentTest {
 
   SnmpPdu Bulk(std::int32_t nonRepeaters, std::int32_t maxRepetitions,
                std::vector<std::string> oids) {
-    Request request = Of(kGetBulkRequest, oids);
+    Request request = GetOf(oids, kGetBulkRequest);
     request.field1 = nonRepeaters;
     request.field2 = maxRepetitions;
     auto reply = Send(request);
@@ -84,7 +74,7 @@ TEST_F(PduProcessingTest, WalkVisitsEveryObjectInOrderAcrossCellsAndColumns) {
 }
 
 TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
-  Request request = Of(kGetNextRequest, {"1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.31.1.1.1.6.2"});
+  Request request = GetOf({"1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.31.1.1.1.6.2"}, kGetNextRequest);
   auto v2 = Send(request);
   ASSERT_TRUE(v2);
   EXPECT_EQ(v2->errorStatus, 0);
@@ -96,8 +86,8 @@ TEST_F(PduProcessingTest, EndOfTheMibPerVersion) {
 }
 
 TEST_F(PduProcessingTest, GetAnswersValuesAndExceptionsPerVersion) {
-  Request request = Of(kGetRequest, {"1.3.6.1.2.1.1.3.0", "1.3.6.1.2.1.1.9.0",
-                                     "1.3.6.1.2.1.2.2.1.2.7", "1.3.6.1.2.1.31.1.1.1.6.1"});
+  Request request = GetOf({"1.3.6.1.2.1.1.3.0", "1.3.6.1.2.1.1.9.0", "1.3.6.1.2.1.2.2.1.2.7",
+                           "1.3.6.1.2.1.31.1.1.1.6.1"});
   auto v2 = Send(request);
   ASSERT_TRUE(v2);
   ASSERT_EQ(v2->requestVarBinds.size(), 4u);
@@ -115,7 +105,7 @@ TEST_F(PduProcessingTest, AccessRulesAndHostErrors) {
   StoreTreeCellsRefInArray();
   host_.SetValue("1.3.6.1.4.1.5.1.0", "1");
   host_.SetValue("1.3.6.1.4.1.5.2.0", "2");
-  Request get = Of(kGetRequest, {"1.3.6.1.4.1.5.1.0"});
+  Request get = GetOf({"1.3.6.1.4.1.5.1.0"});
   EXPECT_EQ(Status(Send(get)), std::pair(kNoAccess, 1));
   get.version = kSnmpV1;
   EXPECT_EQ(Status(Send(get)), std::pair(kNoSuchName, 1));

@@ -2,18 +2,13 @@
 
 #include <gtest/gtest.h>
 
+#include <tuple>
+
 #include "snmp/message.h"
 #include "support/snmp_agent_fixture.h"
 
 namespace tessel {
 namespace {
-
-Request GetOf(std::vector<std::string> oids) {
-  Request request;
-  for (const std::string& oid : oids)
-    request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
-  return request;
-}
 
 class ScramblerTest : public SnmpAgentTest {
  protected:
@@ -36,21 +31,35 @@ class ScramblerTest : public SnmpAgentTest {
   }
 };
 
-TEST_F(ScramblerTest, OffMeansNoHostCallAndAnEmptyAnswerChangesNothing) {
+// Off, the host is never asked; an empty or null answer, or one whose OID is no OID, leaves the
+// whole reply as it was.
+TEST_F(ScramblerTest, RepliesTheHostDoesNotChangeStayAsTheyWere) {
   std::optional<std::vector<std::uint8_t>> plain = ReplyToGet();
   ASSERT_TRUE(plain);
   EXPECT_TRUE(host_.ScrambleQueries().empty());
-
   ScrambleReplies(ScrambleChanges{});
   EXPECT_EQ(ReplyToGet(), plain);
   host_.SetScrambler(nullptr);  // the host answers null: the PDU goes on as it was
   EXPECT_EQ(ReplyToGet(), plain);
   EXPECT_EQ(host_.ScrambleQueries().size(), 4u);
+  ScrambleChanges notAnOid;
+  notAnOid.requestId = 5;
+  notAnOid.oidField = "1.3.x";
+  ScrambleReplies(notAnOid);
+  EXPECT_EQ(ReplyToGet(), plain);
 }
 
-TEST_F(ScramblerTest, TheHostSeesTheRequestThenTheReplyOfItsAgent) {
-  ScrambleReplies(ScrambleChanges{});
-  ASSERT_TRUE(ReplyToGet());
+// The host sees the request, then the reply of its agent to the request as the host changed it.
+TEST_F(ScramblerTest, TheHostSeesTheRequestThenTheReplyToWhatItMadeOfIt) {
+  gv_scramblePdu = 1;
+  host_.SetScrambler([](const ScrambleQuery& query) -> std::optional<ScrambleChanges> {
+    ScrambleChanges changes;
+    if (!query.isResponse) changes.requestId = 77;
+    return changes;
+  });
+  std::optional<SnmpPdu> answer = Send(GetOf({"1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.1.4.0"}));
+  ASSERT_TRUE(answer);
+  EXPECT_EQ(answer->requestId, 77);
   std::vector<ScrambleQuery> queries = host_.ScrambleQueries();
   ASSERT_EQ(queries.size(), 2u);
   const ScrambleQuery& received = queries[0];
@@ -65,28 +74,24 @@ TEST_F(ScramblerTest, TheHostSeesTheRequestThenTheReplyOfItsAgent) {
   const ScrambleQuery& reply = queries[1];
   EXPECT_TRUE(reply.isResponse);
   EXPECT_EQ(reply.pduType, kGetResponse);
+  EXPECT_EQ(reply.requestId, 77);
   ASSERT_EQ(reply.values.size(), 2u);
   EXPECT_EQ(reply.values[0], "r1");
 }
 
+// Changed header fields reach the wire; with only the request-id changed the bindings stay.
 TEST_F(ScramblerTest, ReplacedHeaderFieldsReachTheWireAndTheBindingsStay) {
-  std::optional<std::vector<std::uint8_t>> plain = ReplyToGet();
-  ASSERT_TRUE(plain);
-  SnmpPdu expected;
-  ASSERT_EQ(ParseSnmpMessage(plain->data(), plain->size(), &expected), 1);
-
   ScrambleChanges changes;
   changes.requestId = 5;
   ScrambleReplies(changes);
   std::optional<SnmpPdu> reply = Send(GetOf({"1.3.6.1.2.1.1.5.0", "1.3.6.1.2.1.1.4.0"}));
   ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->requestId, 5);
-  EXPECT_EQ(reply->type, kGetResponse);
-  ASSERT_EQ(reply->requestVarBinds.size(), expected.requestVarBinds.size());
-  for (std::size_t i = 0; i < expected.requestVarBinds.size(); ++i) {
-    EXPECT_EQ(reply->requestVarBinds[i].name, expected.requestVarBinds[i].name);
-    EXPECT_EQ(reply->requestVarBinds[i].value.octets, expected.requestVarBinds[i].value.octets);
-  }
+  EXPECT_EQ(std::tie(reply->type, reply->requestId), std::tuple(kGetResponse, 5));
+  ASSERT_EQ(reply->requestVarBinds.size(), 2u);
+  EXPECT_EQ(reply->requestVarBinds[0].name, O("1.3.6.1.2.1.1.5.0"));
+  EXPECT_EQ(reply->requestVarBinds[0].value, VarValue::Octets(kAsnOctetString, "r1"));
+  EXPECT_EQ(reply->requestVarBinds[1].name, O("1.3.6.1.2.1.1.4.0"));
+  EXPECT_EQ(reply->requestVarBinds[1].value, VarValue::Octets(kAsnOctetString, "ops"));
 
   changes.community = "x";
   changes.errorStatus = 5;
@@ -94,31 +99,8 @@ TEST_F(ScramblerTest, ReplacedHeaderFieldsReachTheWireAndTheBindingsStay) {
   ScrambleReplies(changes);
   reply = Send(GetOf({"1.3.6.1.2.1.1.5.0"}));
   ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->community, "x");
-  EXPECT_EQ(reply->errorStatus, 5);
-  EXPECT_EQ(reply->errorIndex, 1);
-}
-
-TEST_F(ScramblerTest, AnOidThatIsNoOidLeavesTheWholePduAsItWas) {
-  std::optional<std::vector<std::uint8_t>> plain = ReplyToGet();
-  ScrambleChanges changes;
-  changes.requestId = 5;
-  changes.oidField = "1.3.x";
-  ScrambleReplies(changes);
-  EXPECT_EQ(ReplyToGet(), plain);
-}
-
-TEST_F(ScramblerTest, AChangedRequestIsWhatTheAgentAnswers) {
-  gv_scramblePdu = 1;
-  host_.SetScrambler([](const ScrambleQuery& query) -> std::optional<ScrambleChanges> {
-    ScrambleChanges changes;
-    if (!query.isResponse) changes.requestId = 77;
-    return changes;
-  });
-  std::optional<SnmpPdu> reply = Send(GetOf({"1.3.6.1.2.1.1.5.0"}));
-  ASSERT_TRUE(reply);
-  EXPECT_EQ(reply->requestId, 77);
-  EXPECT_EQ(host_.ScrambleQueries().back().requestId, 77);  // the reply shows the changed id
+  EXPECT_EQ(std::tie(reply->community, reply->errorStatus, reply->errorIndex),
+            std::tuple("x", 5, 1));
 }
 
 }  // namespace

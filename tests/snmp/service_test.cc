@@ -48,9 +48,8 @@ std::string Endpoint(const std::string& address, std::uint16_t port) {
 }
 
 std::vector<std::uint8_t> GetSysName(std::int32_t requestId = 42) {
-  Request request;
+  Request request = GetOf({"1.3.6.1.2.1.1.5.0"});
   request.requestId = requestId;
-  request.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
   return EncodeRequest(request);
 }
 

@@ -255,8 +255,7 @@ TEST_F(V3MessageTest, InvalidMessagesAreDroppedAndCounted) {
   }
   EXPECT_TRUE(Exchange3(good));
   // A v3 engine still answers v2c unless told to drop it.
-  Request v2c;
-  v2c.bindings = {{O("1.3.6.1.2.1.1.5.0"), VarValue::Empty(kAsnNull)}};
+  Request v2c = GetOf({"1.3.6.1.2.1.1.5.0"});
   EXPECT_TRUE(Send(v2c));
   gv_dropV1V2Requests = 1;
   EXPECT_FALSE(Send(v2c));

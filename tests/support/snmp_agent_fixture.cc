@@ -35,6 +35,14 @@ Oid O(const std::string& dotted) {
   return oid;
 }
 
+Request GetOf(const std::vector<std::string>& oids, std::uint8_t type, std::int32_t version) {
+  Request request;
+  request.version = version;
+  request.type = type;
+  for (const std::string& oid : oids) request.bindings.push_back({O(oid), VarValue::Empty(kAsnNull)});
+  return request;
+}
+
 std::vector<std::uint8_t> EncodeRequest(const Request& request) {
   std::vector<std::uint8_t> buffer(65536);
   std::int32_t remaining = static_cast<std::int32_t>(buffer.size());

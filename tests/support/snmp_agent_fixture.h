@@ -30,6 +30,9 @@ struct Request {
 
 std::vector<std::uint8_t> EncodeRequest(const Request& request);
 Oid O(const std::string& dotted);
+// A request of the given type that names each OID with a NULL value.
+Request GetOf(const std::vector<std::string>& oids, std::uint8_t type = kGetRequest,
+              std::int32_t version = kSnmpV2c);
 // Registers a cell (SMIv2); columns as {sub-identifier, data type, access}.
 void RegisterCell(const std::string& label, const std::string& oid, bool isTable,
                   std::vector<std::array<std::string, 3>> columns);

@@ -165,42 +165,6 @@ class LauncherTest {
   }
 
   @Test
-  void aTl1GroupServesBesideAnSnmpGroupAndADeviceWhosePortIsTakenIsFailedForTl1(@TempDir Path dir)
-      throws Exception {
-    Path data = Files.writeString(dir.resolve("optical.tl1"), "[RTRV-HDR]\nCOMPLD\n");
-    Path network = Files.writeString(dir.resolve("network.yaml"), String.join("\n", "admin: off", "groups:",
-        "  - {name: routers, count: 1, address: 127.0.9.1, snmp: {port: 28171, data: "
-            + Launcher.defaultData().toAbsolutePath() + "}}",
-        "  - {name: optical, count: 2, address: 127.0.9.11, device-name: 'NE{n}', tl1: {port: 28175, data: " + data
-            + "}}", ""));
-    ServerSocket squatter = new ServerSocket(28175, 1, InetAddress.getByName("127.0.9.12"));
-    Launcher launcher = new Launcher();
-    AtomicInteger status = new AtomicInteger(-1);
-    Thread running = startNetwork(launcher, status, "--network", network.toString());
-    try {
-      awaitServing(running);
-      assertEquals("2 devices running: routers 1/1, optical 1/2 (1 failed)", err().strip());
-      DeviceTable devices = launcher.devices();
-      // Agent ids run through the groups: the router is 0, the optical devices 1 and 2.
-      Device first = devices.find("127.0.9.11").orElseThrow();
-      Device second = devices.find("127.0.9.12").orElseThrow();
-      assertEquals("NE1 optical {tl1=RUNNING} 1", describe(first) + " " + first.agentId());
-      assertEquals("NE2 optical {tl1=FAILED} 2", describe(second) + " " + second.agentId());
-      assertTrue(out().contains("TL1 Agent started at Port : 28175, IpAddress : 127.0.9.11"), out());
-      squatter.close();
-      assertEquals(Optional.empty(), devices.start("127.0.9.12", Optional.of("tl1")).orElseThrow().failure());
-      try (Socket client = new Socket("127.0.9.12", 28175)) {
-        assertTrue(client.isConnected(), "a device started again listens");
-      }
-    } finally {
-      squatter.close();
-      launcher.requestStop();
-      running.join(5000);
-    }
-    assertEquals(0, status.get());
-  }
-
-  @Test
   void noDeviceStartedExitsWithStatusOne() throws Exception {
     String nowhere = "203.0.113.1"; // a documentation address, on no interface of a test machine
     assertFalse(bindable(nowhere, 0), "this machine has " + nowhere);
@@ -255,11 +219,15 @@ class LauncherTest {
   @Test
   void groupsOfANetworkFileServeTheirOwnDataAndDevicesStopAndStartOneByOne(@TempDir Path dir) throws Exception {
     Path hosts = Path.of(System.getProperty("tessel.data.dir"), "linux-host.walk");
+    Path tl1 = Files.writeString(dir.resolve("optical.tl1"), "[RTRV-HDR]\nCOMPLD\n");
     Path network = dir.resolve("network.yaml");
     Files.writeString(network, String.join("\n", "admin: off", "log: {file: logs/engine.log}", "groups:",
         "  - {name: routers, count: 2, address: 127.0.3.1, device-name: 'R{n}',",
         "     snmp: {port: 28163, data: " + Launcher.defaultData().toAbsolutePath() + "}}",
-        "  - {name: hosts, count: 1, address: 127.0.3.9, snmp: {port: 28165, data: " + hosts + "}}", ""));
+        "  - {name: hosts, count: 1, address: 127.0.3.9, snmp: {port: 28165, data: " + hosts + "}}",
+        "  - {name: optical, count: 2, address: 127.0.9.11, device-name: 'NE{n}', tl1: {port: 28175, data: " + tl1
+            + "}}", ""));
+    ServerSocket squatter = new ServerSocket(28175, 1, InetAddress.getByName("127.0.9.12"));
     Launcher launcher = new Launcher();
     AtomicInteger status = new AtomicInteger(-1);
     Thread running = startNetwork(launcher, status, "--network", network.toString(), "--admin", "127.0.0.1:0");
@@ -267,23 +235,29 @@ class LauncherTest {
     try {
       awaitServing(running);
       String[] lines = err().strip().split("\n");
-      assertEquals("3 devices running: routers 2/2, hosts 1/1", lines[1]);
+      assertEquals("4 devices running: routers 2/2, hosts 1/1, optical 1/2 (1 failed)", lines[1]);
       api = lines[0].replaceFirst("^control interface: ", "") + "api/";
-      assertTrue(fetch(api + "network").contains("\"devices\":3,\"running\":3"), fetch(api + "network"));
+      assertTrue(fetch(api + "network").contains("\"devices\":5,\"running\":4"), fetch(api + "network"));
       assertTrue(Files.isDirectory(dir.resolve("logs")), "the log's folder is made, relative to the file");
       DeviceTable devices = launcher.devices();
       assertEquals("R2 routers {snmp=RUNNING}", describe(devices.find("127.0.3.2").orElseThrow()));
       assertEquals("127.0.3.9 hosts {snmp=RUNNING}", describe(devices.find("127.0.3.9").orElseThrow()));
-      assertFalse(bindable("127.0.3.9", 28165));
+      // Agent ids run through the groups: the routers are 0 and 1, the host 2, the optical devices 3 and 4.
+      Device first = devices.find("127.0.9.11").orElseThrow();
+      Device second = devices.find("127.0.9.12").orElseThrow();
+      assertEquals("NE1 optical {tl1=RUNNING} 3", describe(first) + " " + first.agentId());
+      assertEquals("NE2 optical {tl1=FAILED} 4", describe(second) + " " + second.agentId());
+      assertTrue(out().contains("TL1 Agent started at Port : 28175, IpAddress : 127.0.9.11"), out());
+      squatter.close();
+      assertEquals(Optional.empty(), devices.start("127.0.9.12", Optional.of("tl1")).orElseThrow().failure());
+      try (Socket client = new Socket("127.0.9.12", 28175)) {
+        assertTrue(client.isConnected(), "a device started again listens");
+      }
 
-      devices.stop("127.0.3.9", Optional.empty());
-      assertTrue(bindable("127.0.3.9", 28165), "a stopped device gives its port back");
-      assertEquals(Optional.empty(), devices.start("127.0.3.9", Optional.of("snmp")).orElseThrow().failure());
-      assertFalse(bindable("127.0.3.9", 28165), "a started device holds its port again");
-
+      // A stopped device gives its port back: another socket takes it, and the device cannot start.
       devices.stop("127.0.3.1", Optional.empty());
-      try (DatagramSocket squatter = new DatagramSocket(new InetSocketAddress("127.0.3.1", 28163))) {
-        assertTrue(squatter.isBound());
+      try (DatagramSocket taken = new DatagramSocket(new InetSocketAddress("127.0.3.1", 28163))) {
+        assertTrue(taken.isBound());
         DeviceTable.Change change = devices.start("127.0.3.1", Optional.empty()).orElseThrow();
         assertTrue(change.failure().orElseThrow().contains("UDP port 28163 on 127.0.3.1"), change.toString());
         assertEquals(AgentState.FAILED, change.device().protocols().get("snmp"));
@@ -291,6 +265,7 @@ class LauncherTest {
       assertEquals(AgentState.RUNNING,
           devices.restart("127.0.3.1", Optional.empty()).orElseThrow().device().protocols().get("snmp"));
     } finally {
+      squatter.close();
       launcher.requestStop();
       running.join(5000);
     }
