@@ -121,22 +121,49 @@ final class RunningConfig {
   }
 
   /**
-   * Stores a line in a block (opened when missing) or, for a null block, globally: replacing the
-   * lines with the same key when there is a key, else added once.
+   * Stores a line in a block (opened when missing) or, for a null block, globally. With a key, it
+   * takes the place of the first line with that key (or of its "no" form) and the others with the
+   * key go, so that storing the same line again changes nothing; without, it is added once.
    */
   void store(String blockHeader, String key, String line) {
     List<String> lines = blockHeader == null ? null : lines(blockHeader);
-    if (key != null) {
-      remove(blockHeader, key, true);
-      remove(blockHeader, "no " + key, false);
-    } else if (contains(blockHeader, line)) {
+    if (key == null && contains(blockHeader, line)) {
       return;
     }
     if (lines != null) {
-      lines.add(line);
+      int at = key == null ? -1 : indexOfKey(lines, key);
+      if (at >= 0) {
+        lines.removeIf(other -> sameOrKeyed(other, key, true) || other.equalsIgnoreCase("no " + key));
+        lines.add(Math.min(at, lines.size()), line);
+      } else {
+        lines.add(line);
+      }
+      return;
+    }
+    List<String> globals = new ArrayList<>();
+    entries.forEach(entry -> globals.add(entry.isBlock() || entry.isSeparator() ? "" : entry.text));
+    int at = key == null ? -1 : indexOfKey(globals, key);
+    if (at >= 0) {
+      entries.set(at, new Entry(line, null));
+      for (int i = entries.size() - 1; i > at; i--) {
+        if (!globals.get(i).isEmpty() && (sameOrKeyed(globals.get(i), key, true)
+            || globals.get(i).equalsIgnoreCase("no " + key))) {
+          entries.remove(i);
+        }
+      }
       return;
     }
     entries.add(globalPosition(line), new Entry(line, null));
+  }
+
+  /** The first of the lines with the key, or in its "no" form; -1 for none. */
+  private static int indexOfKey(List<String> lines, String key) {
+    for (int i = 0; i < lines.size(); i++) {
+      if (sameOrKeyed(lines.get(i), key, true) || lines.get(i).equalsIgnoreCase("no " + key)) {
+        return i;
+      }
+    }
+    return -1;
   }
 
   /**

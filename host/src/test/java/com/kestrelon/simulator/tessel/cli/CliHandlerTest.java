@@ -136,16 +136,21 @@ class CliHandlerTest {
       }
     }
     String config = config(R1);
-    for (String expected : List.of("!\nhostname Core-1\n!\n", "interface GigabitEthernet0/1\n duplex auto\n speed auto\n"
-        + " description to core\n ip address 10.1.1.1 255.255.255.0\n shutdown\n!\n",
+    for (String expected : List.of("!\nhostname Core-1\n!\n", "interface GigabitEthernet0/1\n description to core\n"
+        + " ip address 10.1.1.1 255.255.255.0\n duplex auto\n speed auto\n shutdown\n!\n",
         "interface GigabitEthernet0/2\n ip ospf cost 10\n duplex auto\n speed auto\n!\n",
-        "interface GigabitEthernet0/3\n duplex auto\n speed auto\n description spare\n ip address 10.3.3.1 255.255.255.128\n!\n",
+        "interface GigabitEthernet0/3\n ip address 10.3.3.1 255.255.255.128\n duplex auto\n speed auto\n description spare\n!\n",
         "router ospf 1\n router-id 10.0.0.1\n network 192.168.1.0 0.0.0.255 area 0\n passive-interface GigabitEthernet0/1\n"
             + " network 10.1.1.0 0.0.0.255 area 0\n!\n",
         "ip route 0.0.0.0 0.0.0.0 10.0.0.2\nip route 10.9.0.0 255.255.0.0 10.1.1.2\n!\n", "ntp server 10.0.0.2\nntp server 10.0.0.9\n!\n")) {
       assertTrue(config.contains(expected), expected + "\nnot in\n" + config);
     }
     assertFalse(config.contains("Loopback7"), config);
+    for (String again : List.of("description to core", "ip address 10.1.1.1 255.255.255.0", "shutdown")) {
+      enter(R1, CliData.INTERFACE, GI1, again);
+    }
+    enter(R1, CliData.CONFIG, "", "ip domain-name lab.example.net");
+    assertEquals(config, config(R1), "the same lines again change nothing");
     assertTrue(config.endsWith("\n!\nend"), config);
     String brief = r1(6, "sh ip int br");
     assertTrue(brief.contains("\nGigabitEthernet0/1         10.1.1.1        YES manual administratively down down"), brief);
