@@ -3,7 +3,9 @@ package com.kestrelon.simulator.tessel;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import com.kestrelon.simulator.tessel.network.Network;
+import com.kestrelon.simulator.tessel.cli.CliData;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
+import com.kestrelon.simulator.tessel.network.Network.Cli;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Snmp;
@@ -34,6 +36,8 @@ public final class LaunchOptions {
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
   /** The names of the devices of the flags when they answer TL1. */
   static final String TL1_DEVICE_NAME = "NE{n}";
+  /** The names of the devices of the flags when they answer the CLI and not TL1: their hostnames. */
+  static final String CLI_DEVICE_NAME = "R{n}";
 
   @Option(names = "--network", paramLabel = "FILE", description = "the network file (YAML) to start")
   Path networkFile;
@@ -74,6 +78,27 @@ public final class LaunchOptions {
   @Option(names = "--tl1-keepalive", paramLabel = "S",
       description = "seconds a silent TL1 session stays open; 0 for ever (default 0)")
   Integer tl1KeepAlive;
+
+  @Option(names = "--cli-data", paramLabel = "FILE",
+      description = "CLI data file: the devices also answer a router CLI over Telnet (without SNMP unless an SNMP "
+          + "option is given)")
+  Path cliDataFile;
+
+  @Option(names = "--cli-port", paramLabel = "P", description = "TCP port of every device's Telnet CLI (default 2323)")
+  Integer cliPort;
+
+  @Option(names = "--ssh-port", paramLabel = "P", description = "TCP port of every device's SSH CLI (default none)")
+  Integer sshPort;
+
+  @Option(names = "--cli-user", paramLabel = "U", description = "the CLI login user (default admin)")
+  String cliUser;
+
+  @Option(names = "--cli-password", paramLabel = "W", description = "the CLI login password (default admin)")
+  String cliPassword;
+
+  @Option(names = "--cli-enable", paramLabel = "E",
+      description = "the enable secret; empty for none (default enable)")
+  String cliEnable;
 
   @Option(names = "--log-level", paramLabel = "0..3", description = "detail of the engine's log; 0 writes none")
   Integer logLevel;
@@ -136,7 +161,7 @@ public final class LaunchOptions {
    */
   public Network network(Path defaultNetwork) throws UsageException, NetworkFileException {
     Object[][] paths = {{"--network", networkFile}, {"--snmp-data", dataFile}, {"--snmpv3", snmpV3File},
-        {"--tl1-data", tl1DataFile}, {"--log-file", logFile}, {"--admin-token-file", adminTokenFile},
+        {"--tl1-data", tl1DataFile}, {"--cli-data", cliDataFile}, {"--log-file", logFile}, {"--admin-token-file", adminTokenFile},
         {"--state-dir", stateDir}};
     for (Object[] path : paths) {
       if (path[1] != null && path[1].toString().isEmpty()) {
@@ -158,7 +183,13 @@ public final class LaunchOptions {
     List<String> given = snmpFlags();
     given.addAll(given(new Object[][] {{"--devices", devices}, {"--address", address}, {"--tl1-data", tl1DataFile},
         {"--tl1-port", tl1Port}, {"--tl1-keepalive", tl1KeepAlive}}));
+    given.addAll(cliFlags());
     return given;
+  }
+
+  private List<String> cliFlags() {
+    return given(new Object[][] {{"--cli-data", cliDataFile}, {"--cli-port", cliPort}, {"--ssh-port", sshPort},
+        {"--cli-user", cliUser}, {"--cli-password", cliPassword}, {"--cli-enable", cliEnable}});
   }
 
   private List<String> snmpFlags() {
@@ -178,8 +209,8 @@ public final class LaunchOptions {
   }
 
   /**
-   * The one-group network of the device flags, named after its SNMP data file, or its TL1 data
-   * file when it serves TL1 alone.
+   * The one-group network of the device flags, named after its SNMP data file, or its TL1 or CLI
+   * data file when it serves no SNMP.
    */
   private Network flagNetwork() throws UsageException, NetworkFileException {
     int count = devices == null ? 100 : number("--devices", devices, 1, Integer.MAX_VALUE);
@@ -188,14 +219,16 @@ public final class LaunchOptions {
       throw new UsageException(count + " devices from " + Network.dotted(first) + " run past 255.255.255.255");
     }
     Optional<Tl1> tl1 = tl1();
-    Optional<Snmp> snmp = tl1.isEmpty() || !snmpFlags().isEmpty() ? Optional.of(snmp()) : Optional.empty();
-    Path named = snmp.isPresent() ? snmp.get().data() : tl1DataFile;
+    Optional<Cli> cli = cli(tl1);
+    Optional<Snmp> snmp = (tl1.isEmpty() && cli.isEmpty()) || !snmpFlags().isEmpty() ? Optional.of(snmp())
+        : Optional.empty();
+    Path named = snmp.isPresent() ? snmp.get().data() : tl1.isPresent() ? tl1DataFile : cliDataFile;
     String name = named.getFileName().toString().replaceFirst("\\.[^.]*$", "");
     // A TL1 device answers with its name as SID, which a TID must match: NE1, NE2, ... rather than
-    // an address, whose dots no TID may hold.
-    String deviceName = tl1.isPresent() ? TL1_DEVICE_NAME : "{address}";
+    // an address, whose dots no TID may hold; a CLI device's name is its hostname, R1, R2, ...
+    String deviceName = tl1.isPresent() ? TL1_DEVICE_NAME : cli.isPresent() ? CLI_DEVICE_NAME : "{address}";
     Group group = new Group(name.isEmpty() ? "devices" : name, count, first, deviceName, snmp, List.of(),
-        List.of(), tl1);
+        List.of(), tl1, cli);
     return new Network(new Log(0, Path.of("tessel.log")), Optional.of(new Admin("127.0.0.1", 8161)),
         Path.of(System.getProperty("user.home"), ".local", "state", "tessel"), List.of(group));
   }
@@ -222,6 +255,36 @@ public final class LaunchOptions {
     try {
       return Optional.of(new Tl1(tl1PortNumber, OptionalInt.empty(), keepAlive, tl1DataFile,
           TL1Data.load(tl1DataFile), List.of(), false, "--tl1-data"));
+    } catch (DeviceDataException e) {
+      throw new NetworkFileException(e.file(), e.line(), e.reason());
+    }
+  }
+
+  /** The CLI agents of the flags: none without --cli-data, which the other CLI flags need. */
+  private Optional<Cli> cli(Optional<Tl1> tl1) throws UsageException, NetworkFileException {
+    if (cliDataFile == null) {
+      List<String> orphans = cliFlags();
+      if (!orphans.isEmpty()) {
+        throw new UsageException(orphans.get(0) + " needs --cli-data");
+      }
+      return Optional.empty();
+    }
+    int telnet = cliPort == null ? Cli.DEFAULT_PORT : number("--cli-port", cliPort, 1, 65535);
+    OptionalInt ssh = sshPort == null ? OptionalInt.empty() : OptionalInt.of(number("--ssh-port", sshPort, 1, 65535));
+    int tl1Listener = tl1.map(Tl1::port).orElse(-1);
+    if ((ssh.isPresent() && ssh.getAsInt() == telnet) || telnet == tl1Listener
+        || (ssh.isPresent() && ssh.getAsInt() == tl1Listener)) {
+      throw new UsageException("--cli-port, --ssh-port and --tl1-port need different ports");
+    }
+    for (String[] text : new String[][] {{"--cli-user", cliUser}, {"--cli-password", cliPassword}}) {
+      if (text[1] != null && text[1].isEmpty()) {
+        throw new UsageException(text[0] + " needs a value");
+      }
+    }
+    try {
+      return Optional.of(new Cli(telnet, ssh, cliDataFile, CliData.load(cliDataFile),
+          cliUser == null ? Cli.DEFAULT_USER : cliUser, cliPassword == null ? Cli.DEFAULT_PASSWORD : cliPassword,
+          cliEnable == null ? Cli.DEFAULT_ENABLE : cliEnable, "--cli-data"));
     } catch (DeviceDataException e) {
       throw new NetworkFileException(e.file(), e.line(), e.reason());
     }

@@ -1,11 +1,15 @@
 package com.kestrelon.simulator.tessel;
 
 import com.kestrelon.simulator.tessel.LaunchOptions.UsageException;
+import com.kestrelon.simulator.tessel.cli.CliHandler;
+import com.kestrelon.simulator.tessel.cli.CliNetwork;
 import com.kestrelon.simulator.tessel.control.AdminConfigException;
 import com.kestrelon.simulator.tessel.control.AdminServer;
 import com.kestrelon.simulator.tessel.control.AgentState;
+import com.kestrelon.simulator.tessel.control.CliControl;
 import com.kestrelon.simulator.tessel.control.DeviceTable;
 import com.kestrelon.simulator.tessel.control.InformLog;
+import com.kestrelon.simulator.tessel.control.NativeCliControl;
 import com.kestrelon.simulator.tessel.control.NativeNotifications;
 import com.kestrelon.simulator.tessel.control.NativeTl1Control;
 import com.kestrelon.simulator.tessel.control.NotificationSchedule;
@@ -70,6 +74,7 @@ public final class Launcher {
   private static final String DEFAULT_SNMPV3 = "snmpv3.conf";
   private static final String SNMP = "snmp";
   private static final String TL1 = "tl1";
+  private static final String CLI = "cli";
   private static final int MAX_LOG_FILE_SIZE = 100 << 20;
   /** What {@link #start} returns when the network is up. */
   private static final int SERVING = -1;
@@ -237,9 +242,12 @@ public final class Launcher {
     // Status lines go to the output stream only: the launcher never reads them back.
     NetworkSimulator simulator = engines.apply(out);
     Tl1Network tl1 = new Tl1Network(network, new TL1Handler(), new TL1Register());
-    int status = start(simulator, network, snmp, tl1, err);
+    // A network without CLI groups never touches the engine's CLI service.
+    CliNetwork cli = new CliNetwork(network, new CliHandler());
+    int status = start(simulator, network, snmp, tl1, cli, err);
     if (status == SERVING && control.isPresent()) {
-      status = listen(network, control.get(), tl1.isEmpty() ? Tl1Control.NONE : new NativeTl1Control(), err);
+      status = listen(network, control.get(), tl1.isEmpty() ? Tl1Control.NONE : new NativeTl1Control(),
+          cli.isEmpty() ? CliControl.NONE : new NativeCliControl(cli.handler()), err);
     }
     if (status == SERVING) {
       err.println(StartReport.summary(devices)); // last: once it shows, everything serves
@@ -257,7 +265,7 @@ public final class Launcher {
    * a stop is seen between steps. Returns {@link #SERVING} when the network runs, 0 when a stop
    * came first, else the exit status of the failure; it never stops the engine itself.
    */
-  private int start(NetworkSimulator simulator, Network network, SnmpNetwork snmp, Tl1Network tl1,
+  private int start(NetworkSimulator simulator, Network network, SnmpNetwork snmp, Tl1Network tl1, CliNetwork cli,
       PrintStream err) {
     SnmpHandler handler = snmp.handler();
     synchronized (lifecycle) {
@@ -289,16 +297,22 @@ public final class Launcher {
       if (!tl1.isEmpty()) {
         tl1.register();
       }
+      if (!cli.isEmpty()) {
+        Optional<String> refused = cli.register();
+        if (refused.isPresent()) {
+          return fail(err, refused.get());
+        }
+      }
     }
     DeviceTable.Builder table = new DeviceTable.Builder();
-    if (!startGroups(network, snmp, tl1, table, err)) {
+    if (!startGroups(network, snmp, tl1, cli, table, err)) {
       return 0;
     }
     synchronized (lifecycle) {
       if (stopRequested) {
         return 0;
       }
-      devices = table.build(Map.of(SNMP, snmp, TL1, tl1));
+      devices = table.build(Map.of(SNMP, snmp, TL1, tl1, CLI, cli));
       if (devices.running() == 0) {
         return fail(err, "no device started");
       }
@@ -316,8 +330,8 @@ public final class Launcher {
    * Registers and opens the agents of every group's devices, in file order, as many devices as the
    * open-file limit leaves room for; the others are listed as failed. False when a stop came first.
    */
-  private boolean startGroups(Network network, SnmpNetwork snmp, Tl1Network tl1, DeviceTable.Builder table,
-      PrintStream err) {
+  private boolean startGroups(Network network, SnmpNetwork snmp, Tl1Network tl1, CliNetwork cli,
+      DeviceTable.Builder table, PrintStream err) {
     long descriptorsLeft = descriptorsThatFit(network, err);
     StartReport report = new StartReport(err, Boolean.getBoolean("tessel.progress"), network.devices());
     long done = 0;
@@ -336,7 +350,7 @@ public final class Launcher {
             if (stopRequested) {
               return false;
             }
-            states = startAgents(group, snmpGroup, first, count, starting, snmp, tl1);
+            states = startAgents(group, snmpGroup, first, count, starting, snmp, tl1, cli);
           }
           for (int i = 0; i < count; i++) {
             table.add(group.firstAddress() + first + i, network.firstAgentId(group) + first + i,
@@ -357,11 +371,13 @@ public final class Launcher {
    * first + count that did not fit are failed. The state of each device's agents, by protocol.
    */
   private static List<Map<String, AgentState>> startAgents(Group group, int snmpGroup, int first, int count,
-      int starting, SnmpNetwork snmp, Tl1Network tl1) {
+      int starting, SnmpNetwork snmp, Tl1Network tl1, CliNetwork cli) {
     boolean[] snmpOpened = group.snmp().isPresent() && starting > 0 ? snmp.startAgents(snmpGroup, first, starting)
         : new boolean[0];
     List<Optional<String>> tl1Opened = group.tl1().isPresent() && starting > 0
         ? tl1.startAgents(group, first, starting) : List.of();
+    List<Optional<String>> cliOpened = group.cli().isPresent() && starting > 0
+        ? cli.startAgents(group, first, starting) : List.of();
     List<Map<String, AgentState>> states = new ArrayList<>(count);
     for (int i = 0; i < count; i++) {
       Map<String, AgentState> device = new LinkedHashMap<>();
@@ -371,25 +387,32 @@ public final class Launcher {
       if (group.tl1().isPresent()) {
         device.put(TL1, i < tl1Opened.size() && tl1Opened.get(i).isEmpty() ? AgentState.RUNNING : AgentState.FAILED);
       }
+      if (group.cli().isPresent()) {
+        device.put(CLI, i < cliOpened.size() && cliOpened.get(i).isEmpty() ? AgentState.RUNNING : AgentState.FAILED);
+      }
       states.add(device);
     }
     return states;
   }
 
-  /** The sockets one device of the group holds: its SNMP agent, its TL1 listener and Telnet listener. */
+  /**
+   * The sockets one device of the group holds: its SNMP agent, its TL1 listener and Telnet
+   * listener, its CLI Telnet and SSH listeners.
+   */
   private static int descriptorsPerDevice(Group group) {
-    return (group.snmp().isPresent() ? 1 : 0) + group.tl1().map(tl1 -> tl1.telnetPort().isPresent() ? 2 : 1).orElse(0);
+    return (group.snmp().isPresent() ? 1 : 0) + group.tl1().map(tl1 -> tl1.telnetPort().isPresent() ? 2 : 1).orElse(0)
+        + group.cli().map(Network.Cli::sockets).orElse(0);
   }
 
   /** Opens the control interface on the running network; returns SERVING or the exit status. */
-  private int listen(Network network, Control control, Tl1Control tl1, PrintStream err) {
+  private int listen(Network network, Control control, Tl1Control tl1, CliControl cli, PrintStream err) {
     synchronized (lifecycle) {
       if (stopRequested) {
         return 0;
       }
       try {
         admin = AdminServer.start(control.listen(), control.token(), network, devices, new NativeReports(),
-            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling, tl1);
+            new AdminServer.Notifications(new NativeNotifications(), informs), scrambling, tl1, cli);
       } catch (IOException e) {
         return fail(err, "the control interface cannot listen on " + control.listen() + ": " + e.getMessage());
       }

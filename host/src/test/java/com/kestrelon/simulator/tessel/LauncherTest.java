@@ -108,6 +108,8 @@ class LauncherTest {
       "--tl1-keepalive 5;          --tl1-keepalive needs --tl1-data",
       "--tl1-data t.tl1 --tl1-port 65536; --tl1-port takes a number from 1 to 65535",
       "--tl1-data=;                --tl1-data needs a value",
+      "--ssh-port 2222;            --ssh-port needs --cli-data",
+      "--cli-data r.cli --cli-port 2222 --ssh-port 2222; --cli-port, --ssh-port and --tl1-port need different ports",
       "--address 127.0.1.256;      --address takes an IPv4 address such as 127.0.1.1, not '127.0.1.256'",
       "--read-community a,b;       --read-community takes a non-empty community without ','",
       "--admin 127.0.0.1;          --admin takes HOST:PORT",
@@ -165,6 +167,16 @@ class LauncherTest {
   }
 
   @Test
+  void cliFlagsDescribeTheOneGroupOfRoutersNamedForTheirHostnames(@TempDir Path dir) throws Exception {
+    Path data = Files.writeString(dir.resolve("edge.cli"), "[user]\nshow version \"v\"\n");
+    Network.Group alone = LaunchOptions.parse(new String[] {"--cli-data", data.toString(), "--ssh-port", "2222",
+        "--cli-user", "ops", "--cli-enable", ""}).network(Path.of("unused.yaml")).groups().get(0);
+    Network.Cli cli = alone.cli().orElseThrow();
+    assertEquals(List.of("edge", "false", "R2", "2323", "2222", "ops", "admin", ""), List.of(alone.name(),
+        "" + alone.snmp().isPresent(), alone.deviceName(1), "" + cli.port(), "" + cli.sshPort().getAsInt(), cli.user(),
+        cli.password(), cli.enable()));
+  }
+
   void noDeviceStartedExitsWithStatusOne() throws Exception {
     String nowhere = "203.0.113.1"; // a documentation address, on no interface of a test machine
     assertFalse(bindable(nowhere, 0), "this machine has " + nowhere);

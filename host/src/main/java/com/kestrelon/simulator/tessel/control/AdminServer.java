@@ -57,9 +57,11 @@ public final class AdminServer implements AutoCloseable {
   private final Notifications notifications;
   private final Scrambling scrambling;
   private final Tl1Control tl1;
+  private final CliControl cli;
   private final Optional<byte[]> dashboard;
   private final RequestRate rate = new RequestRate();
   private final RequestRate tl1Rate = new RequestRate();
+  private final RequestRate cliLoginRate = new RequestRate();
   private final List<Route> routes = List.of(
       new Route("/", "GET", (exchange, path) -> dashboard()),
       new Route("/api/network", "GET", (exchange, path) -> json(200, networkJson())),
@@ -77,6 +79,7 @@ public final class AdminServer implements AutoCloseable {
           (exchange, path) -> tl1PendingAction(exchange, path.group(1), path.group(2), false)),
       new Route("/api/devices/([^/]+)/tl1/pending/([^/]+)/run", "POST",
           (exchange, path) -> tl1PendingAction(exchange, path.group(1), path.group(2), true)),
+      new Route("/api/devices/([^/]+)/cli/running-config", "GET", (exchange, path) -> cliConfig(path.group(1))),
       new Route("/api/informs", "GET", (exchange, path) -> informList()),
       new Route("/api/informs/([^/]+)", "GET", (exchange, path) -> inform(path.group(1))),
       new Route("/api/scramble", "GET, PUT, DELETE", (exchange, path) -> scramble(exchange)),
@@ -118,7 +121,7 @@ public final class AdminServer implements AutoCloseable {
   public record Notifications(NotificationSender sender, InformLog informs) {}
 
   private AdminServer(HttpServer server, ExecutorService executor, Network network, DeviceTable devices,
-      EngineReports reports, Notifications notifications, Scrambling scrambling, Tl1Control tl1,
+      EngineReports reports, Notifications notifications, Scrambling scrambling, Tl1Control tl1, CliControl cli,
       AdminAccess access, Optional<byte[]> dashboard) {
     this.server = server;
     this.executor = executor;
@@ -129,6 +132,7 @@ public final class AdminServer implements AutoCloseable {
     this.notifications = notifications;
     this.scrambling = scrambling;
     this.tl1 = tl1;
+    this.cli = cli;
     this.dashboard = dashboard;
   }
 
@@ -139,6 +143,13 @@ public final class AdminServer implements AutoCloseable {
   public static AdminServer start(InetSocketAddress listen, Optional<String> token, Network network,
       DeviceTable devices, EngineReports reports, Notifications notifications, Scrambling scrambling,
       Tl1Control tl1) throws IOException {
+    return start(listen, token, network, devices, reports, notifications, scrambling, tl1, CliControl.NONE);
+  }
+
+  /** The same, for a network whose CLI agents {@code cli} shows. */
+  public static AdminServer start(InetSocketAddress listen, Optional<String> token, Network network,
+      DeviceTable devices, EngineReports reports, Notifications notifications, Scrambling scrambling,
+      Tl1Control tl1, CliControl cli) throws IOException {
     HttpServer server = HttpServer.create(listen, 0);
     // Two request threads: one slow client does not hold the others.
     AtomicInteger threads = new AtomicInteger();
@@ -148,7 +159,7 @@ public final class AdminServer implements AutoCloseable {
       return thread;
     });
     AdminServer admin = new AdminServer(server, executor, network, devices, reports, notifications, scrambling,
-        tl1, new AdminAccess(listen.getAddress(), token), readDashboard());
+        tl1, cli, new AdminAccess(listen.getAddress(), token), readDashboard());
     server.setExecutor(executor);
     server.createContext("/", admin::serve);
     server.start();
@@ -233,12 +244,21 @@ public final class AdminServer implements AutoCloseable {
     return json;
   }
 
+  /** A group's CLI listeners: Telnet, and SSH when there is one. */
+  private static Map<String, Object> cliJson(Network.Cli cli) {
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("port", cli.port());
+    cli.sshPort().ifPresent(port -> json.put("sshPort", port));
+    return json;
+  }
+
   private Map<String, Object> networkJson() {
     List<Map<String, Object>> groups = new ArrayList<>();
     for (Network.Group group : network.groups()) {
       Map<String, Object> protocols = new LinkedHashMap<>();
       group.snmp().ifPresent(snmp -> protocols.put("snmp", Map.of("port", snmp.port())));
       group.tl1().ifPresent(tl1 -> protocols.put("tl1", tl1Json(tl1)));
+      group.cli().ifPresent(cli -> protocols.put("cli", cliJson(cli)));
       Map<String, Object> json = new LinkedHashMap<>();
       json.put("name", group.name());
       json.put("count", group.count());
@@ -503,6 +523,20 @@ public final class AdminServer implements AutoCloseable {
     return device;
   }
 
+  /** A device's running configuration, whether its CLI agent runs or not (it keeps its configuration). */
+  private Response cliConfig(String address) throws Refusal {
+    Device device = devices.find(address).orElseThrow(() -> noDevice(address));
+    if (!device.protocols().containsKey("cli")) {
+      throw new Refusal(422, "the device " + device.address() + " has no CLI agent");
+    }
+    String config = cli.runningConfig(device).orElseThrow(
+        () -> new Refusal(422, "the device " + device.address() + " has no CLI configuration"));
+    Map<String, Object> json = new LinkedHashMap<>();
+    json.put("address", device.address());
+    json.put("runningConfig", config);
+    return json(200, json);
+  }
+
   /**
    * GET shows the scrambling setting, PUT replaces it and turns scrambling on, DELETE turns it
    * off; each answers the setting then in force.
@@ -617,16 +651,22 @@ public final class AdminServer implements AutoCloseable {
     Map<String, Object> tl1Json = new LinkedHashMap<>();
     tl1Json.put("sessions", tl1Counters.sessions());
     tl1Json.put("commandsPerSecond", Math.round(tl1Rate.sample(tl1Counters.commands()) * 1000) / 1000.0);
+    CliControl.Counters cliCounters = cli.counters();
+    Map<String, Object> cliJson = new LinkedHashMap<>();
+    cliJson.put("sessions", cliCounters.sessions());
+    cliJson.put("loginsPerSecond", Math.round(cliLoginRate.sample(cliCounters.logins()) * 1000) / 1000.0);
     Map<String, Object> json = new LinkedHashMap<>();
     json.put("snmp", snmp);
     json.put("tl1", tl1Json);
+    json.put("cli", cliJson);
     json.put("errors", errors);
     return json;
   }
 
   private Response metrics() {
     long[] counters = reports.counters();
-    String text = MetricsText.render(counters, rate.sample(counters[0]), tl1.counters(), devices.counts());
+    String text = MetricsText.render(counters, rate.sample(counters[0]), tl1.counters(), cli.counters(),
+        devices.counts());
     return new Response(200, MetricsText.CONTENT_TYPE, text.getBytes(StandardCharsets.UTF_8), Map.of());
   }
 

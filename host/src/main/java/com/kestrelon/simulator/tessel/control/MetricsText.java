@@ -15,7 +15,7 @@ final class MetricsText {
 
   private MetricsText() {}
 
-  static String render(long[] counters, double requestsPerSecond, Tl1Control.Counters tl1,
+  static String render(long[] counters, double requestsPerSecond, Tl1Control.Counters tl1, CliControl.Counters cli,
       Map<String, Map<String, EnumMap<AgentState, Integer>>> devices) {
     StringBuilder text = new StringBuilder();
     for (int i = 0; i < COUNTER_METRICS.size(); i++) {
@@ -29,12 +29,11 @@ final class MetricsText {
     text.append("# TYPE tessel_snmp_requests_per_second gauge\n");
     text.append("tessel_snmp_requests_per_second ").append(String.format(Locale.ROOT, "%.3f", requestsPerSecond))
         .append('\n');
-    text.append("# HELP tessel_tl1_sessions TL1 sessions open now.\n");
-    text.append("# TYPE tessel_tl1_sessions gauge\n");
-    text.append("tessel_tl1_sessions ").append(tl1.sessions()).append('\n');
-    text.append("# HELP tessel_tl1_commands_total TL1 commands answered.\n");
-    text.append("# TYPE tessel_tl1_commands_total counter\n");
-    text.append("tessel_tl1_commands_total ").append(tl1.commands()).append('\n');
+    metric(text, "tessel_tl1_sessions", "gauge", "TL1 sessions open now.", tl1.sessions());
+    metric(text, "tessel_tl1_commands_total", "counter", "TL1 commands answered.", tl1.commands());
+    metric(text, "tessel_cli_sessions", "gauge", "CLI sessions open now (Telnet and SSH).", cli.sessions());
+    metric(text, "tessel_cli_logins_total", "counter", "CLI logins that succeeded.", cli.logins());
+    metric(text, "tessel_cli_commands_total", "counter", "CLI commands answered.", cli.commands());
     text.append("# HELP tessel_devices Devices per group and protocol whose agent is in the state.\n");
     text.append("# TYPE tessel_devices gauge\n");
     devices.forEach((group, protocols) -> protocols.forEach((protocol, states) -> states.forEach(
@@ -42,6 +41,13 @@ final class MetricsText {
             .append("\",protocol=\"").append(labelValue(protocol))
             .append("\",state=\"").append(state.text()).append("\"} ").append(count).append('\n'))));
     return text.toString();
+  }
+
+  /** One metric without labels: its help, its type and its value. */
+  private static void metric(StringBuilder text, String name, String type, String help, long value) {
+    text.append("# HELP ").append(name).append(' ').append(help).append('\n');
+    text.append("# TYPE ").append(name).append(' ').append(type).append('\n');
+    text.append(name).append(' ').append(value).append('\n');
   }
 
   /**

@@ -44,7 +44,7 @@ import picocli.CommandLine.Spec;
     description = "Shows and drives a running network through its control interface.",
     subcommands = {Ctl.Devices.class, Ctl.OneDevice.class, Ctl.Stats.class, Ctl.Trap.class, Ctl.Inform.class,
         Ctl.Informs.class, Ctl.Scramble.class, Ctl.Tl1Message.class, Ctl.Tl1Atag.class, Ctl.Tl1Pending.class,
-        Ctl.Tl1Run.class, Ctl.Tl1Cancel.class})
+        Ctl.Tl1Run.class, Ctl.Tl1Cancel.class, Ctl.CliConfig.class})
 public final class Ctl implements Runnable {
   static final int API_ERROR = 1;
   static final int UNREACHABLE = 3;
@@ -91,7 +91,7 @@ public final class Ctl implements Runnable {
   public void run() {
     throw new ParameterException(spec.commandLine(),
         "Missing command: devices, device, stop, start, restart, stats, trap, inform, informs, scramble, "
-            + "tl1-message, tl1-atag, tl1-pending, tl1-run or tl1-cancel");
+            + "tl1-message, tl1-atag, tl1-pending, tl1-run, tl1-cancel or cli-config");
   }
 
   /**
@@ -281,6 +281,11 @@ public final class Ctl implements Runnable {
         JsonObject tl1 = stats.getAsJsonObject("tl1");
         out.println("tl1 sessions: " + tl1.get("sessions").getAsString() + ", commands per second: "
             + tl1.get("commandsPerSecond").getAsString());
+      }
+      if (stats.has("cli")) {
+        JsonObject cli = stats.getAsJsonObject("cli");
+        out.println("cli sessions: " + cli.get("sessions").getAsString() + ", logins per second: "
+            + cli.get("loginsPerSecond").getAsString());
       }
       JsonArray errors = stats.has("errors") ? stats.getAsJsonArray("errors") : new JsonArray();
       out.println();
@@ -701,6 +706,22 @@ public final class Ctl implements Runnable {
     void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
       JsonElement answer = client.delete(path());
       out.println(json ? answer.toString() : "cancelled " + id);
+    }
+  }
+
+  @Command(name = "cli-config", description = "Prints the device's running configuration, as show running-config lists it.")
+  static final class CliConfig extends ApiCommand {
+    @Parameters(paramLabel = "ADDRESS", description = "the device's IPv4 address")
+    String address;
+
+    @Override
+    void execute(AdminClient client, boolean json, PrintWriter out) throws ApiException, UnreachableException {
+      JsonElement answer = client.get("/api/devices/" + AdminClient.encode(address) + "/cli/running-config");
+      if (json) {
+        printJson(out, answer);
+      } else {
+        out.println(answer.getAsJsonObject().get("runningConfig").getAsString());
+      }
     }
   }
 

@@ -1,5 +1,6 @@
 package com.kestrelon.simulator.tessel.network;
 
+import com.kestrelon.simulator.tessel.cli.CliData;
 import com.kestrelon.simulator.tessel.control.Notification;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import com.kestrelon.simulator.tessel.tl1.TL1Data;
@@ -114,13 +115,20 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
    * @param trapSinks the managers that receive its devices' standard traps, besides the network's
    * @param notifications what every device of the group sends on a timer
    * @param tl1 the group's TL1 agents; empty when the group serves no TL1
+   * @param cli the group's CLI agents; empty when the group serves no CLI
    */
   public record Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
-      List<TrapSink> trapSinks, List<Scheduled> notifications, Optional<Tl1> tl1) {
+      List<TrapSink> trapSinks, List<Scheduled> notifications, Optional<Tl1> tl1, Optional<Cli> cli) {
 
     public Group {
       trapSinks = List.copyOf(trapSinks);
       notifications = List.copyOf(notifications);
+    }
+
+    /** A group without CLI. */
+    public Group(String name, int count, long firstAddress, String deviceName, Optional<Snmp> snmp,
+        List<TrapSink> trapSinks, List<Scheduled> notifications, Optional<Tl1> tl1) {
+      this(name, count, firstAddress, deviceName, snmp, trapSinks, notifications, tl1, Optional.empty());
     }
 
     /** A group without TL1. */
@@ -198,6 +206,33 @@ public record Network(Log log, Optional<Admin> admin, Path stateDir, List<Group>
 
     public Tl1 {
       users = List.copyOf(users);
+    }
+  }
+
+  /**
+   * The CLI agent every device of a group runs: Telnet on {@code port}, SSH on {@code sshPort} if
+   * given, one login user and an enable secret (none when empty); the device's name is its
+   * hostname until a session changes it.
+   *
+   * @param data the commands and the starting configuration, read from {@code dataFile}
+   * @param where where the section was given: {@code FILE:LINE}, or the flag
+   */
+  public record Cli(int port, OptionalInt sshPort, Path dataFile, CliData data, String user, String password,
+      String enable, String where) {
+    public static final int DEFAULT_PORT = 2323;
+    public static final String DEFAULT_USER = "admin";
+    public static final String DEFAULT_PASSWORD = "admin";
+    public static final String DEFAULT_ENABLE = "enable";
+
+    /** The listeners one device holds: Telnet, and SSH when it has a port. */
+    public int sockets() {
+      return sshPort.isPresent() ? 2 : 1;
+    }
+
+    /** What the control interface shows: no secret. */
+    @Override
+    public String toString() {
+      return "Cli[port=" + port + ", sshPort=" + sshPort + ", dataFile=" + dataFile + ", user=" + user + "]";
     }
   }
 

@@ -4,10 +4,12 @@ import com.google.gson.JsonArray;
 import com.google.gson.JsonElement;
 import com.google.gson.JsonObject;
 import com.google.gson.JsonPrimitive;
+import com.kestrelon.simulator.tessel.cli.CliData;
 import com.kestrelon.simulator.tessel.control.Notification;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
 import com.kestrelon.simulator.tessel.data.ValueText;
 import com.kestrelon.simulator.tessel.network.Network.Admin;
+import com.kestrelon.simulator.tessel.network.Network.Cli;
 import com.kestrelon.simulator.tessel.network.Network.Group;
 import com.kestrelon.simulator.tessel.network.Network.Log;
 import com.kestrelon.simulator.tessel.network.Network.Scheduled;
@@ -60,6 +62,7 @@ public final class NetworkFile {
   private static final List<String> SNMP_KEYS = List.of("port", "data", "v3", "read-community", "write-community");
   private static final List<String> TL1_KEYS =
       List.of("port", "data", "keepalive", "telnet-port", "users", "require-login");
+  private static final List<String> CLI_KEYS = List.of("port", "ssh-port", "data", "user", "password", "enable");
   private static final List<String> SCHEDULED_KEYS = List.of("every", "to", "kind", "version", "oid",
       "enterprise", "generic", "specific", "varbinds", "community", "user", "context", "timeout", "retries");
   /** Keys a notification to the trap sinks takes from each sink instead. */
@@ -68,8 +71,6 @@ public final class NetworkFile {
   private static final Pattern PERIOD = Pattern.compile("([0-9]{1,9})(ms|s|m|h)");
   private static final Duration SHORTEST_PERIOD = Duration.ofMillis(100);
   private static final Duration LONGEST_PERIOD = Duration.ofDays(1);
-  /** Protocol sections whose devices the host cannot serve yet. */
-  private static final List<String> LATER_PROTOCOLS = List.of("cli");
   private static final long LAST_ADDRESS = 0xFFFF_FFFFL;
 
   private final String name;
@@ -78,6 +79,8 @@ public final class NetworkFile {
   private final List<PortUse> ports = new ArrayList<>();
   /** TL1 data files read so far: groups that share one share what was read. */
   private final Map<Path, TL1Data> tl1Data = new LinkedHashMap<>();
+  /** CLI data files read so far. */
+  private final Map<Path, CliData> cliData = new LinkedHashMap<>();
 
   /** A port a group's devices bind on each of their addresses, and what for. */
   private record PortUse(int number, String purpose, String group) {}
@@ -154,11 +157,6 @@ public final class NetworkFile {
 
   private Group group(Node node) throws NetworkFileException {
     Map<String, NodeTuple> keys = mapping(node, "a group", GROUP_KEYS);
-    for (String protocol : LATER_PROTOCOLS) {
-      if (keys.containsKey(protocol)) {
-        throw fault(keys.get(protocol), protocol + " is not available yet");
-      }
-    }
     NodeTuple nameEntry = required(keys, "name", node, "a group");
     String groupName = text(nameEntry);
     if (groups.stream().anyMatch(earlier -> earlier.name().equals(groupName))) {
@@ -180,11 +178,51 @@ public final class NetworkFile {
     String deviceName = keys.containsKey("device-name") ? deviceName(keys.get("device-name")) : "{address}";
     Optional<Snmp> snmp = keys.containsKey("snmp") ? Optional.of(snmp(keys.get("snmp"), groupName)) : Optional.empty();
     Optional<Tl1> tl1 = keys.containsKey("tl1") ? Optional.of(tl1(keys.get("tl1"))) : Optional.empty();
-    if (snmp.isEmpty() && tl1.isEmpty()) {
-      throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp, tl1)");
+    Optional<Cli> cli = keys.containsKey("cli") ? Optional.of(cli(keys.get("cli"), tl1)) : Optional.empty();
+    if (snmp.isEmpty() && tl1.isEmpty() && cli.isEmpty()) {
+      throw fault(nameEntry, "group " + groupName + " has no protocol section (snmp, tl1, cli)");
     }
     return new Group(groupName, count, first, deviceName, snmp, trapSinks(keys.get("trap-sinks")),
-        notifications(keys.get("notifications")), tl1);
+        notifications(keys.get("notifications")), tl1, cli);
+  }
+
+  /**
+   * A {@code cli} section: Telnet and SSH ports of its own (TCP, on each device's address, so they
+   * must differ from each other and from the group's TL1 ports), the data (the shipped router by
+   * default), the login user and the enable secret ({@code ""} for none).
+   */
+  private Cli cli(NodeTuple entry, Optional<Tl1> tl1) throws NetworkFileException {
+    Map<String, NodeTuple> keys = mapping(entry.getValueNode(), "cli", CLI_KEYS);
+    List<Integer> taken = new ArrayList<>();
+    tl1.ifPresent(section -> {
+      taken.add(section.port());
+      section.telnetPort().ifPresent(taken::add);
+    });
+    int port = keys.containsKey("port") ? tcpPort(keys.get("port"), taken) : Cli.DEFAULT_PORT;
+    taken.add(port);
+    OptionalInt sshPort = keys.containsKey("ssh-port") ? OptionalInt.of(tcpPort(keys.get("ssh-port"), taken))
+        : OptionalInt.empty();
+    Path dataFile = keys.containsKey("data") ? existingFile(keys.get("data")) : defaultCliData();
+    CliData data = dataFile(cliData, dataFile, CliData::load);
+    String user = keys.containsKey("user") ? text(keys.get("user")) : Cli.DEFAULT_USER;
+    String password = keys.containsKey("password") ? text(keys.get("password")) : Cli.DEFAULT_PASSWORD;
+    String enable = keys.containsKey("enable") ? textOrEmpty(keys.get("enable")) : Cli.DEFAULT_ENABLE;
+    return new Cli(port, sshPort, dataFile, data, user, password, enable,
+        name + ":" + (entry.getKeyNode().getStartMark().getLine() + 1));
+  }
+
+  /** The shipped router, the data of a cli section without its own. */
+  public static Path defaultCliData() {
+    return Path.of(System.getProperty("tessel.profiles.dir", "profiles"), "router.cli").toAbsolutePath().normalize();
+  }
+
+  /** A TCP port none of the device's other listeners has. */
+  private int tcpPort(NodeTuple entry, List<Integer> taken) throws NetworkFileException {
+    int port = number(entry, 1, 65535);
+    if (taken.contains(port)) {
+      throw fault(entry, key(entry) + " " + port + " is another listener's port on the same device");
+    }
+    return port;
   }
 
   /**
@@ -222,14 +260,24 @@ public final class NetworkFile {
 
   /** A TL1 data file, read once however many groups use it; its faults name its own lines. */
   private TL1Data tl1Data(Path file) throws NetworkFileException {
-    TL1Data data = tl1Data.get(file);
+    return dataFile(tl1Data, file, TL1Data::load);
+  }
+
+  /** Reads one kind of data file. */
+  private interface DataLoader<T> {
+    T load(Path file) throws DeviceDataException;
+  }
+
+  /** A data file of the kind {@code read} holds, read once; its faults name its own lines. */
+  private static <T> T dataFile(Map<Path, T> read, Path file, DataLoader<T> loader) throws NetworkFileException {
+    T data = read.get(file);
     if (data == null) {
       try {
-        data = TL1Data.load(file);
+        data = loader.load(file);
       } catch (DeviceDataException e) {
         throw new NetworkFileException(e.file(), e.line(), e.reason());
       }
-      tl1Data.put(file, data);
+      read.put(file, data);
     }
     return data;
   }
@@ -396,15 +444,15 @@ public final class NetworkFile {
       throw fault(node, "a v3 sink needs 'user'");
     }
     String secret = keys.containsKey(credential) ? text(keys.get(credential)) : "public";
-    String context = keys.containsKey("context") ? contextName(keys.get("context")) : "";
+    String context = keys.containsKey("context") ? textOrEmpty(keys.get("context")) : "";
     int timeout = keys.containsKey("timeout") ? number(keys.get("timeout"), 1, 3600) : 5;
     int retries = keys.containsKey("retries") ? number(keys.get("retries"), 0, 100) : 0;
     return new TrapSink(version, address, port, v3 ? "" : secret, v3 ? secret : "", context,
         kind.equals("inform"), timeout, retries);
   }
 
-  /** A context may be named "" (the default context). */
-  private static String contextName(NodeTuple entry) {
+  /** A text that may be empty: "" or no value (a context "" is the default context). */
+  private static String textOrEmpty(NodeTuple entry) {
     return entry.getValueNode() instanceof ScalarNode scalar && !scalar.getTag().equals(Tag.NULL)
         ? scalar.getValue() : "";
   }

@@ -1,10 +1,7 @@
 package com.kestrelon.simulator.tessel.tl1;
 
+import com.kestrelon.simulator.tessel.data.DataFiles;
 import com.kestrelon.simulator.tessel.data.DeviceDataException;
-import java.io.IOException;
-import java.nio.charset.StandardCharsets;
-import java.nio.file.Files;
-import java.nio.file.NoSuchFileException;
 import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.LinkedHashMap;
@@ -70,13 +67,7 @@ public final class TL1Data {
 
   /** Reads a TL1 data file; the faults name it as {@code file} is written. */
   public static TL1Data load(Path file) throws DeviceDataException {
-    try {
-      return parse(file.toString(), new String(Files.readAllBytes(file), StandardCharsets.UTF_8));
-    } catch (NoSuchFileException e) {
-      throw new DeviceDataException(file.toString(), 1, "no such file");
-    } catch (IOException e) {
-      throw new DeviceDataException(file.toString(), 1, "cannot be read: " + e.getMessage());
-    }
+    return parse(file.toString(), DataFiles.read(file));
   }
 
   /** Reads the text of a TL1 data file; the faults name it {@code name}. */

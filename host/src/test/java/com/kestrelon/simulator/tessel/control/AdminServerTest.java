@@ -59,6 +59,18 @@ class AdminServerTest {
   private final List<Integer> engineSwitch = Collections.synchronizedList(new ArrayList<>());
   private final Scrambling scrambling = new Scrambling(engineSwitch::add);
   private final FakeTl1 tl1 = new FakeTl1();
+  /** CLI agents whose configuration is the device's name, with fixed counters. */
+  private final CliControl cli = new CliControl() {
+    @Override
+    public Optional<String> runningConfig(Device device) {
+      return Optional.of("!\nhostname " + device.name() + "\nend");
+    }
+
+    @Override
+    public Counters counters() {
+      return new Counters(3, 12, 40);
+    }
+  };
   private AdminServer server;
 
   @TempDir
@@ -142,7 +154,9 @@ class AdminServerTest {
 
   private AdminServer start(Optional<String> token) throws IOException {
     Snmp snmp = new Snmp(1161, dir.resolve("d.snmprec"), Optional.empty(), "public", "private");
-    Group routers = new Group("routers", 3, 0x7F000101L, "R{n}", Optional.of(snmp));
+    Group routers = new Group("routers", 3, 0x7F000101L, "R{n}", Optional.of(snmp), List.of(), List.of(),
+        Optional.empty(), Optional.of(new Network.Cli(2323, OptionalInt.of(2222), dir.resolve("r.cli"), null, "admin",
+            "admin", "", "")));
     Group optical = new Group(OPTICAL, 2, 0x7F000201L, "O{n}", Optional.of(snmp), List.of(), List.of(),
         Optional.of(new Network.Tl1(3083, OptionalInt.of(3023), 0, dir.resolve("o.tl1"), null, List.of(), false, "")));
     Network network = new Network(new Network.Log(0, dir.resolve("log")), Optional.empty(), dir,
@@ -151,7 +165,8 @@ class AdminServerTest {
     for (Group group : network.groups()) {
       for (int i = 0; i < group.count(); i++) {
         AgentState state = group.address(i).equals(REFUSING) ? AgentState.FAILED : AgentState.RUNNING;
-        Map<String, AgentState> protocols = group == optical && i == 0 ? Map.of("snmp", state, "tl1", state) : Map.of("snmp", state);
+        Map<String, AgentState> protocols = group == optical && i == 0 ? Map.of("snmp", state, "tl1", state)
+            : group == routers && i == 1 ? Map.of("snmp", state, "cli", state) : Map.of("snmp", state);
         table.add(group.firstAddress() + i, i, group.deviceName(i), group.name(), protocols);
       }
     }
@@ -173,8 +188,8 @@ class AdminServerTest {
       return sendOutcome;
     };
     return AdminServer.start(new InetSocketAddress("127.0.0.1", 0), token, network,
-        table.build(Map.of("snmp", agents, "tl1", agents)), reports, new AdminServer.Notifications(sender, informs),
-        scrambling, tl1);
+        table.build(Map.of("snmp", agents, "tl1", agents, "cli", agents)), reports,
+        new AdminServer.Notifications(sender, informs), scrambling, tl1, cli);
   }
 
   private Answer send(String method, String path, String contentType, String body, String... headers)
@@ -414,6 +429,22 @@ class AdminServerTest {
     JsonObject stats = get("/api/stats").json().getAsJsonObject("tl1");
     assertEquals(0, stats.get("sessions").getAsInt());
     assertTrue(get("/metrics").body().contains("\ntessel_tl1_commands_total 4294967300\n"));
+  }
+
+  @Test
+  void cliConfigurationsAndCountersComeFromTheDevicesAgent() throws Exception {
+    assertEquals("{\"address\":\"127.0.1.2\",\"runningConfig\":\"!\\nhostname R2\\nend\"}",
+        get("/api/devices/127.0.1.2/cli/running-config").body());
+    Answer none = get("/api/devices/127.0.1.1/cli/running-config");
+    assertEquals(422, none.status());
+    assertTrue(none.json().get("error").getAsString().contains("has no CLI agent"), none.body());
+    assertEquals(404, get("/api/devices/127.0.9.9/cli/running-config").status());
+    assertEquals("{\"port\":2323,\"sshPort\":2222}", get("/api/network").json().getAsJsonArray("groups").get(0)
+        .getAsJsonObject().getAsJsonObject("protocols").get("cli").toString());
+    assertEquals(3, get("/api/stats").json().getAsJsonObject("cli").get("sessions").getAsInt());
+    String metrics = get("/metrics").body();
+    assertTrue(metrics.contains("\ntessel_cli_sessions 3\n") && metrics.contains("\ntessel_cli_logins_total 12\n")
+        && metrics.contains("\ntessel_cli_commands_total 40\n"), metrics);
   }
 
   @Test

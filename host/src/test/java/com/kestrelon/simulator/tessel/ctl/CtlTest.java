@@ -100,6 +100,8 @@ class CtlTest {
             + " \"time\": null, \"command\": \"ENT-X:NE1:A:1:ON=5;\"}]}";
         default -> "{\"id\": 7}";
       });
+    } else if (uri.getPath().equals("/api/devices/10.0.0.5/cli/running-config")) {
+      reply(exchange, 200, "{\"address\": \"10.0.0.5\", \"runningConfig\": \"!\\nhostname R5\\n!\\nend\"}");
     } else if (uri.getPath().equals("/api/stats")) {
       reply(exchange, 200, "{\"snmp\": {\"counters\": {\"snmpInPkts\": 12, \"snmpInBadVersions\": 0},"
           + " \"requestsPerSecond\": 3.5}, \"tl1\": {\"sessions\": 4, \"commandsPerSecond\": 1.5}, \"errors\": [{\"manager\": \"127.0.0.9\", \"errorStatus\": 2}]}");
@@ -207,6 +209,14 @@ class CtlTest {
     assertEquals(0, ctl("--admin", url, "tl1-cancel", "10.0.0.5", "7"));
     assertEquals(List.of("POST /api/devices/10.0.0.5/tl1/pending/7/run", "DELETE /api/devices/10.0.0.5/tl1/pending/7"),
         requests.subList(4, 6).stream().map(r -> r.split(" null")[0]).toList());
+  }
+
+  @Test
+  void cliConfigPrintsTheConfigurationAsTheDeviceListsIt() {
+    assertEquals(0, ctl("--admin", url, "cli-config", "10.0.0.5"));
+    assertEquals("!\nhostname R5\n!\nend\n", out);
+    assertEquals(1, ctl("--admin", url, "cli-config", "10.9.9.9"));
+    assertTrue(err.contains("no device at 10.9.9.9"), err);
   }
 
   @Test

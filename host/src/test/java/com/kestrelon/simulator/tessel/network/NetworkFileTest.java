@@ -1,6 +1,7 @@
 package com.kestrelon.simulator.tessel.network;
 
 import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertFalse;
 import static org.junit.jupiter.api.Assertions.assertSame;
 import static org.junit.jupiter.api.Assertions.assertThrows;
 import static org.junit.jupiter.api.Assertions.assertTrue;
@@ -39,6 +40,9 @@ class NetworkFileTest {
 
   /** A group whose tl1 section starts on line 6. */
   private static final String TL1 = "  - name: b\n    count: 1\n    address: 127.0.2.1\n    tl1: ";
+
+  /** A group whose cli section starts on line 6. */
+  private static final String CLI = "  - name: b\n    count: 1\n    address: 127.0.2.1\n    cli: ";
 
   @TempDir
   Path dir;
@@ -96,8 +100,12 @@ class NetworkFileTest {
         fault(TL1 + "\n      data: d.tl1\n      users:\n        - {user: a, password: b}\n        - {user: a, password: c}\n",
             "10: a second user 'a'"),
         fault(TL1 + "{data: d.tl1, users: [{user: a}]}\n", "6: a user needs 'password'"),
-        fault("  - name: b\n    count: 1\n    address: 127.0.2.1\n    cli: {port: 2323}\n",
-            "6: cli is not available yet"),
+        fault(TL1 + "{data: d.tl1, port: 2323}\n    cli: {port: 2323}\n", "7: port 2323 is another listener's port"),
+        fault(TL1 + "{data: d.tl1}\n    cli: {ssh-port: 3083}\n", "7: ssh-port 3083 is another listener's port"),
+        fault(CLI + "{port: 2323, ssh-port: 2323}\n", "6: ssh-port 2323 is another listener's port"),
+        fault(CLI + "{data: gone.cli}\n", "6: data file "),
+        fault(CLI + "{user: ''}\n", "6: user takes a non-empty text"),
+        fault(CLI + "{users: [a]}\n", "6: unknown key 'users' in cli"),
         fault("trap-sinks: [127.0.0.1:162]\n", "3: a trap sink takes a mapping of version"),
         fault("trap-sinks:\n  - {version: v4, address: h}\n", "4: version takes v1, v2c or v3, not 'v4'"),
         fault("trap-sinks:\n  - {version: v2c, address: h, kind: note}\n", "4: kind takes trap or inform"),
@@ -158,6 +166,27 @@ class NetworkFileTest {
     Files.writeString(dir.resolve("d.tl1"), "[RTRV-HDR]\nCOMPLD\n\n[RTRV-ALM]\nDENY XXXX\n");
     NetworkFileException fault = assertThrows(NetworkFileException.class, () -> NetworkFile.read(file));
     assertTrue(fault.getMessage().startsWith(dir.resolve("d.tl1") + ":5: DENY takes one code"), fault.getMessage());
+  }
+
+  @Test
+  void readsCliSectionsWithTheirDefaultsAndTheirDataFilesFaults() throws Exception {
+    Files.writeString(dir.resolve("r.cli"), "[user]\nshow version \"v\"\n");
+    Path file = write("groups:\n" + CLI + "{}\n  - {name: c, count: 1, address: 127.0.3.1,\n"
+        + "     cli: {port: 23, ssh-port: 22, data: r.cli, user: u, password: p, enable: ''}}\n");
+    List<Group> groups = NetworkFile.read(file).groups();
+    Network.Cli plain = groups.get(0).cli().orElseThrow();
+    assertEquals(List.of("2323", "false", "admin", "admin", "enable", file + ":5"), List.of("" + plain.port(),
+        "" + plain.sshPort().isPresent(), plain.user(), plain.password(), plain.enable(), plain.where()));
+    assertEquals(NetworkFile.defaultCliData(), plain.dataFile());
+    assertEquals(Optional.empty(), groups.get(0).snmp());
+    Network.Cli full = groups.get(1).cli().orElseThrow();
+    assertEquals(List.of(23, 22), List.of(full.port(), full.sshPort().getAsInt()));
+    assertEquals(List.of("u", "p", ""), List.of(full.user(), full.password(), full.enable()));
+    assertEquals(dir.resolve("r.cli"), full.dataFile());
+    assertFalse(full.toString().contains("p,") || full.toString().contains("password"), full.toString());
+    Files.writeString(dir.resolve("r.cli"), "[user]\nshow version\n");
+    NetworkFileException fault = assertThrows(NetworkFileException.class, () -> NetworkFile.read(file));
+    assertTrue(fault.getMessage().startsWith(dir.resolve("r.cli") + ":2: a command reads"), fault.getMessage());
   }
 
   @Test
