@@ -177,6 +177,7 @@ class LauncherTest {
         cli.password(), cli.enable()));
   }
 
+  @Test
   void noDeviceStartedExitsWithStatusOne() throws Exception {
     String nowhere = "203.0.113.1"; // a documentation address, on no interface of a test machine
     assertFalse(bindable(nowhere, 0), "this machine has " + nowhere);
