@@ -16,6 +16,7 @@
 #include <deque>
 #include <new>
 #include <system_error>
+#include <utility>
 
 #include "base/log.h"
 
@@ -392,7 +393,12 @@ void TcpServer::Loop() {
     }
     try {
       for (int i = 0; i < count; ++i) Dispatch(ready[i].data.u64, ready[i].events);
-      events_->OnReadsDone();
+    } catch (const std::bad_alloc&) {
+      LOG_ERROR("Error in allocating memory");
+    }
+    try {
+      // After a round cut short too: what its reads queued must not wait for the next round.
+      if (std::exchange(bytesThisRound_, false)) events_->OnReadsDone();
       FinishClosing();
     } catch (const std::bad_alloc&) {
       LOG_ERROR("Error in allocating memory");
@@ -507,6 +513,7 @@ void TcpServer::ReadFrom(TcpSessionId id) {
   } while (count < 0 && errno == EINTR);
   if (count > 0) {
     session->lastInput = Clock::now();
+    bytesThisRound_ = true;
     events_->OnBytes(id, std::string_view(readBuffer_.data(), static_cast<std::size_t>(count)));
     return;
   }

@@ -135,6 +135,7 @@ class TcpServer final : public StreamServer {
   std::vector<TimerEntry> timers_;  // a heap, earliest deadline first
   std::uint64_t nextSerial_ = 1;
   std::vector<char> readBuffer_;
+  bool bytesThisRound_ = false;  // an OnBytes call since the last OnReadsDone
 };
 
 }  // namespace tessel
