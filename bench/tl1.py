@@ -3,12 +3,13 @@
 
 - the TCP echo server (tessel_tl1load echo, one thread, epoll) with the same exchange the TL1 load
   makes: the ceiling of the machine for it;
-- the launcher with BENCH_TL1_DEVICES TL1 devices (flag form, profiles/optical.tl1, TL1 only) and
+- `./tessel run` with BENCH_TL1_DEVICES TL1 devices (flag form, profiles/optical.tl1, TL1 only) and
   with one: resident memory of each, hence the memory per further TL1 agent; the CPU the large
   network uses idle over BENCH_IDLE_SECONDS; RTRV-HDR round trips per second over BENCH_TL1_CONNECTIONS
   connections spread over as many devices, closed loop, with p50/p99; the same paced at half that
   rate (latency below saturation); and how many sessions per second open, answer one RTRV-HDR and
-  close, one after another.
+  close, one after another;
+- the engine alone (tessel_tl1memory, no JVM) with as many agents: its share of the memory per agent.
 
 Environment (defaults in brackets): BENCH_TL1_DEVICES [10000], BENCH_TL1_CONNECTIONS [100],
 BENCH_TL1_ADDRESS [127.18.0.1], BENCH_TL1_ECHO_ADDRESS [127.19.0.1], BENCH_TL1_PORT [11401],
@@ -26,8 +27,8 @@ from pathlib import Path
 
 ROOT = Path(__file__).resolve().parents[1]
 BUILD = Path(os.environ.get("TESSEL_BUILD", ROOT / "build"))
-JAVA = Path(os.environ.get("JAVA_HOME", "/usr/lib/jvm/java-17-openjdk-amd64")) / "bin" / "java"
 LOAD = BUILD / "bench" / "tessel_tl1load"
+MEMORY = BUILD / "bench" / "tessel_tl1memory"
 DEVICES = int(os.environ.get("BENCH_TL1_DEVICES", 10000))
 CONNECTIONS = int(os.environ.get("BENCH_TL1_CONNECTIONS", 100))
 ADDRESS = os.environ.get("BENCH_TL1_ADDRESS", "127.18.0.1")
@@ -52,10 +53,15 @@ def load(mode, address, until, *extra):
     """One bounded run of the load tool; its RESULT fields as numbers."""
     command = ["taskset", "-c", LOADGEN_CPU, str(LOAD), mode, "--targets", f"{address}+{CONNECTIONS}", "--port",
                str(PORT), "--command", COMMAND, "--until", until, *extra]
-    result = subprocess.run(command, capture_output=True, text=True, timeout=DURATION + WARMUP + 60)
+    return result_fields(command, DURATION + WARMUP + 60)
+
+
+def result_fields(command, timeout):
+    """Runs a bench tool; the fields of its RESULT line as numbers."""
+    result = subprocess.run(command, capture_output=True, text=True, timeout=timeout)
     line = next((l for l in result.stdout.splitlines() if l.startswith("RESULT")), None)
     if line is None:
-        raise SystemExit(f"bench tl1: no result from {mode}: {result.stdout}{result.stderr}")
+        raise SystemExit(f"bench tl1: no result from {Path(command[3]).name}: {result.stdout}{result.stderr}")
     return {key: float(value) for key, value in re.findall(r"(\w+)=([0-9.]+)", line)}
 
 
@@ -81,13 +87,11 @@ def stop(process):
 
 
 def start_network(devices):
-    """The launcher serving `devices` TL1 devices; returns it once its summary line is out."""
-    jars = [j for j in sorted(BUILD.glob("host/tessel-host*.jar")) if "tests" not in j.name]
-    command = ["taskset", "-c", SERVER_CPU, str(JAVA), f"-Dtessel.library={BUILD / 'src' / 'libtessel.so'}",
-               f"-Dtessel.profiles.dir={ROOT / 'profiles'}", "-cp", str(jars[0]),
-               "com.kestrelon.simulator.tessel.Launcher", "--tl1-data", str(ROOT / "profiles" / "optical.tl1"),
-               "--devices", str(devices), "--address", ADDRESS, "--tl1-port", str(PORT), "--admin", "off",
-               "--log-file", "/dev/null"]
+    """`./tessel run` serving `devices` TL1 devices, as users start it (the launcher's JVM options
+    included: they set how much of the heap is resident); returns it once its summary line is out."""
+    command = ["taskset", "-c", SERVER_CPU, str(ROOT / "tessel"), "run", "--tl1-data",
+               str(ROOT / "profiles" / "optical.tl1"), "--devices", str(devices), "--address", ADDRESS,
+               "--tl1-port", str(PORT), "--admin", "off", "--log-file", "/dev/null"]
     process = subprocess.Popen(command, stdout=subprocess.DEVNULL, stderr=subprocess.PIPE, text=True,
                                start_new_session=True)
     deadline = time.monotonic() + START_TIMEOUT
@@ -150,10 +154,17 @@ def tl1_figures():
     return small_kib, large_kib, per_agent, idle, saturated, half, sessions
 
 
+def engine_share():
+    """Heap bytes per further agent of the engine alone, on addresses of its own."""
+    return result_fields(["taskset", "-c", SERVER_CPU, str(MEMORY), "--agents", str(DEVICES), "--address",
+                          ECHO_ADDRESS, "--port", str(PORT)], 120)
+
+
 def main():
-    subprocess.run(["cmake", "--build", str(BUILD), "--target", "tessel_tl1load", "tessel", "tessel_host"],
-                   check=True, stdout=subprocess.DEVNULL)
+    subprocess.run(["cmake", "--build", str(BUILD), "--target", "tessel_tl1load", "tessel_tl1memory", "tessel",
+                    "tessel_host"], check=True, stdout=subprocess.DEVNULL)
     echo = echo_ceiling()
+    engine = engine_share()
     small_kib, large_kib, per_agent, idle, saturated, half, sessions = tl1_figures()
     print(f"TL1 bench: {CONNECTIONS} connections over {CONNECTIONS} devices, {DURATION:g} s per figure")
     print(f"{'':34}{'exchanges/s':>12}{'p50 us':>10}{'p99 us':>10}")
@@ -165,6 +176,8 @@ def main():
     print(f"sessions opened, answered once and closed: {sessions['rate']:.0f}/s ({sessions['errors']:.0f} errors)")
     print(f"resident memory: 1 device {small_kib / 1024:.1f} MiB, {DEVICES} devices {large_kib / 1024:.1f} MiB; "
           f"{per_agent * 1024:.0f} bytes per further TL1 agent")
+    print(f"the engine alone: {engine['heap_per_agent']:.0f} bytes of heap per further TL1 agent "
+          f"({engine['rss_per_agent']:.0f} resident)")
     print(f"idle CPU with {DEVICES} TL1 agents: {idle:.2f} % of a core over {IDLE_SECONDS:g} s")
 
 

@@ -19,6 +19,7 @@ struct Tl1Service::Session {
   // Guarded by workMutex_.
   std::deque<Work> inbox;
   bool scheduled = false;  // in readySessions_ or held by a worker
+  bool inputEnded = false;  // the client sends no more: close once the inbox is answered
   // The worker holding the session only.
   bool loggedIn = false;
   // Guarded by mutex_: the ATAG of the next autonomous message when this is the agent's first
@@ -59,13 +60,15 @@ std::vector<std::string> Tl1Service::Complete(std::string_view prefix) const {
 }
 
 void Tl1Service::RegisterAgent(const Tl1Agent& agent, std::int32_t hostInt) {
+  auto info = std::make_shared<const Tl1Agent>(agent);
+  Endpoint endpoint{info->ipAddress, info->port};
   std::lock_guard<std::mutex> lock(mutex_);
   ForgetAgentLocked(agent.agentId);
-  agentAt_[{agent.ipAddress, agent.port}] = agent.agentId;
-  Agent& record = agents_[agent.agentId];
-  record.info = std::make_shared<const Tl1Agent>(agent);
-  record.hostInt = hostInt;
-  record.telnetPorts.clear();
+  agents_[agent.agentId] = {std::move(info), hostInt};
+  // An agent registered earlier on the same endpoint is no longer found by it; the key takes
+  // the new record's text, which lives as long as the index entry.
+  agentAt_.erase(endpoint);
+  agentAt_.emplace(endpoint, agent.agentId);
 }
 
 // The caller holds mutex_.
@@ -84,6 +87,8 @@ void Tl1Service::ForgetAgentLocked(std::int32_t agentId) {
   auto at = agentAt_.find({found->second.info->ipAddress, found->second.info->port});
   if (at != agentAt_.end() && at->second == agentId) agentAt_.erase(at);
   agents_.erase(found);
+  telnetPorts_.erase(telnetPorts_.lower_bound({agentId, 0}),
+                     telnetPorts_.upper_bound({agentId, UINT16_MAX}));
 }
 
 bool Tl1Service::StartAgent(const std::string& address, std::uint16_t port) {
@@ -119,10 +124,9 @@ bool Tl1Service::StartTelnetListener(const std::string& address, std::uint16_t p
                                      std::int32_t agentId) {
   {
     std::lock_guard<std::mutex> lock(mutex_);
-    auto found = agents_.find(agentId);
-    if (found == agents_.end()) return false;
+    if (!agents_.contains(agentId)) return false;
     // Known before the first connection can arrive.
-    found->second.telnetPorts.insert(port);
+    telnetPorts_.insert({agentId, port});
   }
   int error = 0;
   if (tcp_.Listen(static_cast<std::uint32_t>(agentId), address, port, keepAliveSeconds_.load(),
@@ -134,8 +138,7 @@ bool Tl1Service::StartTelnetListener(const std::string& address, std::uint16_t p
   LOG_ERROR("Unable to start TL1 telnet listener at %s:%d (errno %d)\n", address.c_str(), port,
             error);
   std::lock_guard<std::mutex> lock(mutex_);
-  auto found = agents_.find(agentId);
-  if (found != agents_.end()) found->second.telnetPorts.erase(port);
+  telnetPorts_.erase({agentId, port});
   return false;
 }
 
@@ -177,7 +180,10 @@ std::uint32_t Tl1Service::SetKeepAlive(std::uint32_t seconds) {
 
 void Tl1Service::SetLoginRequired(std::int32_t agentId, bool required) {
   std::lock_guard<std::mutex> lock(mutex_);
-  loginRequired_[agentId] = required;
+  if (required)
+    loginRequired_.insert(agentId);
+  else
+    loginRequired_.erase(agentId);
 }
 
 Tl1Counters Tl1Service::Counters() const {
@@ -223,6 +229,7 @@ void Tl1Service::Stop() {
   agents_.clear();
   agentAt_.clear();
   loginRequired_.clear();
+  telnetPorts_.clear();
   sessions_.clear();
   registry_.Clear();
 }
@@ -234,8 +241,7 @@ void Tl1Service::OnAccepted(TcpSessionId id, std::uint32_t listenerTag, const Tc
   bool interactive = false;
   {
     std::lock_guard<std::mutex> lock(mutex_);
-    auto found = agents_.find(agentId);
-    interactive = found != agents_.end() && found->second.telnetPorts.count(peer.localPort) > 0;
+    interactive = telnetPorts_.contains({agentId, peer.localPort});
   }
   auto session = std::make_shared<Session>(
       id, agentId, interactive, [this](std::string_view prefix) { return Complete(prefix); });
@@ -248,21 +254,42 @@ void Tl1Service::OnAccepted(TcpSessionId id, std::uint32_t listenerTag, const Tc
   if (!opening.empty()) tcp_.Send(id, std::move(opening));
 }
 
+std::shared_ptr<Tl1Service::Session> Tl1Service::FindSession(TcpSessionId id) const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  auto found = sessions_.find(id);
+  return found == sessions_.end() ? nullptr : found->second;
+}
+
 void Tl1Service::OnBytes(TcpSessionId id, std::string_view bytes) {
-  std::shared_ptr<Session> session;
-  {
-    std::lock_guard<std::mutex> lock(mutex_);
-    auto found = sessions_.find(id);
-    if (found == sessions_.end()) return;
-    session = found->second;
-  }
+  std::shared_ptr<Session> session = FindSession(id);
+  if (!session) return;
   Tl1InputResult input = session->input.Feed(bytes);
   if (!input.reply.empty()) tcp_.Send(id, std::move(input.reply));
   if (input.events.empty()) return;
   std::vector<Work> work;
   work.reserve(input.events.size());
   for (Tl1InputEvent& event : input.events) work.push_back({std::move(event), std::nullopt});
-  Enqueue(session, std::move(work));
+  Enqueue(session, std::move(work), true);
+}
+
+// One wake-up per session made ready in the round, at most one per worker: a worker that is
+// busy takes the next ready session without being woken.
+void Tl1Service::OnReadsDone() {
+  if (wakeUps_ == 0) return;
+  std::size_t wake = std::min(wakeUps_, options_.workers);
+  wakeUps_ = 0;
+  std::lock_guard<std::mutex> lock(workMutex_);
+  for (std::size_t i = 0; i < wake; ++i) workReady_.notify_one();
+}
+
+// The messages received before the end of input are still answered; the worker that answers the
+// last of them closes the session.
+bool Tl1Service::OnInputEnded(TcpSessionId id) {
+  std::shared_ptr<Session> session = FindSession(id);
+  if (!session) return false;
+  std::lock_guard<std::mutex> lock(workMutex_);
+  session->inputEnded = true;
+  return session->scheduled;
 }
 
 void Tl1Service::OnClosed(TcpSessionId id) {
@@ -272,13 +299,17 @@ void Tl1Service::OnClosed(TcpSessionId id) {
 
 // Workers.
 
-void Tl1Service::Enqueue(const std::shared_ptr<Session>& session, std::vector<Work> work) {
+void Tl1Service::Enqueue(const std::shared_ptr<Session>& session, std::vector<Work> work,
+                         bool wakeLater) {
   std::lock_guard<std::mutex> lock(workMutex_);
   for (Work& unit : work) session->inbox.push_back(std::move(unit));
   if (session->scheduled) return;
   session->scheduled = true;
   readySessions_.push_back(session);
-  workReady_.notify_one();
+  if (wakeLater)
+    ++wakeUps_;
+  else
+    workReady_.notify_one();
 }
 
 void Tl1Service::WorkerLoop() {
@@ -295,14 +326,19 @@ void Tl1Service::WorkerLoop() {
       session->inbox.pop_front();
     }
     Answer(*session, work);
-    std::lock_guard<std::mutex> lock(workMutex_);
-    if (session->inbox.empty()) {
-      session->scheduled = false;
-    } else {
-      // Behind the other waiting sessions, so that a busy one does not hold a worker.
-      readySessions_.push_back(std::move(session));
-      workReady_.notify_one();
+    bool answeredAll = false;
+    {
+      std::lock_guard<std::mutex> lock(workMutex_);
+      if (session->inbox.empty()) {
+        session->scheduled = false;
+        answeredAll = session->inputEnded;
+      } else {
+        // Behind the other waiting sessions, so that a busy one does not hold a worker.
+        readySessions_.push_back(session);
+        workReady_.notify_one();
+      }
     }
+    if (answeredAll) tcp_.Close(session->id, true);
   }
 }
 
@@ -314,8 +350,7 @@ void Tl1Service::Answer(Session& session, const Work& work) {
     std::lock_guard<std::mutex> lock(mutex_);
     auto found = agents_.find(session.agentId);
     if (found != agents_.end()) agent = found->second.info;
-    auto login = loginRequired_.find(session.agentId);
-    context.loginRequired = login != loginRequired_.end() && login->second;
+    context.loginRequired = loginRequired_.contains(session.agentId);
   }
   context.agent = agent.get();
   switch (work.event.kind) {
@@ -342,13 +377,8 @@ void Tl1Service::Answer(Session& session, const Work& work) {
 }
 
 void Tl1Service::Deliver(Tl1PendingEntry entry) {
-  std::shared_ptr<Session> session;
-  {
-    std::lock_guard<std::mutex> lock(mutex_);
-    auto found = sessions_.find(entry.sessionId);
-    if (found == sessions_.end()) return;  // the session closed while its command waited
-    session = found->second;
-  }
+  std::shared_ptr<Session> session = FindSession(entry.sessionId);
+  if (!session) return;  // the session closed while its command waited
   std::vector<Work> work;
   work.push_back(
       {{Tl1InputEvent::Kind::kMessage, std::move(entry.commandText)}, std::move(entry.command)});

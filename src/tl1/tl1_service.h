@@ -21,7 +21,10 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <thread>
+#include <unordered_map>
+#include <unordered_set>
 #include <utility>
 #include <vector>
 
@@ -106,10 +109,21 @@ class Tl1Service final : private TcpSessionEvents {
   void Stop();
 
  private:
+  // A network may hold tens of thousands of agents: their records stay small.
   struct Agent {
     std::shared_ptr<const Tl1Agent> info;
     std::int32_t hostInt = 0;
-    std::set<std::uint16_t> telnetPorts;
+  };
+  // An agent's address and port; the text is that of the agent indexed under it.
+  struct Endpoint {
+    std::string_view address;
+    std::uint16_t port = 0;
+    bool operator==(const Endpoint&) const = default;
+  };
+  struct EndpointHash {
+    std::size_t operator()(const Endpoint& endpoint) const noexcept {
+      return std::hash<std::string_view>{}(endpoint.address) * 31 + endpoint.port;
+    }
   };
   // One unit of a session's work: a message, an overflow, an empty line or a delayed command.
   struct Work {
@@ -126,13 +140,19 @@ class Tl1Service final : private TcpSessionEvents {
   void OnAccepted(TcpSessionId session, std::uint32_t listenerTag, const TcpPeer& peer) override;
   void OnBytes(TcpSessionId session, std::string_view bytes) override;
   void OnClosed(TcpSessionId session) override;
+  bool OnInputEnded(TcpSessionId session) override;
+  void OnReadsDone() override;
 
   HostBridge* Host() const;
+  std::shared_ptr<Session> FindSession(TcpSessionId id) const;
   std::vector<std::string> Complete(std::string_view prefix) const;
   const Agent* FindAgentLocked(const std::string& address, std::uint16_t port) const;
   void ForgetAgentLocked(std::int32_t agentId);
   void StartThreadsLocked();
-  void Enqueue(const std::shared_ptr<Session>& session, std::vector<Work> work);
+  // Queues work for the session; the workers are woken now, or with wakeLater at the end of the
+  // TCP loop's round.
+  void Enqueue(const std::shared_ptr<Session>& session, std::vector<Work> work,
+               bool wakeLater = false);
   void Deliver(Tl1PendingEntry entry);
   void WorkerLoop();
   void Answer(Session& session, const Work& work);
@@ -156,16 +176,18 @@ class Tl1Service final : private TcpSessionEvents {
 
   // Guards the agents, the sessions and their ATAGs.
   mutable std::mutex mutex_;
-  std::map<std::int32_t, Agent> agents_;
+  std::unordered_map<std::int32_t, Agent> agents_;
   // The agent on each address and port, so that a start or stop by endpoint does not walk them.
-  std::map<std::pair<std::string, std::uint16_t>, std::int32_t> agentAt_;
-  std::map<std::int32_t, bool> loginRequired_;
+  std::unordered_map<Endpoint, std::int32_t, EndpointHash> agentAt_;
+  std::unordered_set<std::int32_t> loginRequired_;
+  std::set<std::pair<std::int32_t, std::uint16_t>> telnetPorts_;  // agent, telnet listener port
   std::map<TcpSessionId, std::shared_ptr<Session>> sessions_;
 
   // Sessions with queued work, each at most once.
   std::mutex workMutex_;
   std::condition_variable workReady_;
   std::deque<std::shared_ptr<Session>> readySessions_;
+  std::size_t wakeUps_ = 0;  // TCP loop thread only: sessions made ready in this round
 
   // Autonomous messages by alarm code, each in arrival order.
   std::mutex alarmMutex_;

@@ -38,6 +38,15 @@ class TcpSessionEvents {
   virtual void OnAccepted(TcpSessionId session, std::uint32_t listenerTag, const TcpPeer& peer) = 0;
   // The bytes of one read; a protocol message may span several reads or share one.
   virtual void OnBytes(TcpSessionId session, std::string_view bytes) = 0;
+  // The peer ended its input (it may still be reading): no OnBytes follows. True when answers to
+  // what it sent are still to come and the service closes the session itself once they are sent
+  // (Close with afterPendingOutput); false lets the server close it once its queued output is
+  // written. A half-closed session is closed after a short bound all the same.
+  virtual bool OnInputEnded(TcpSessionId) { return false; }
+  // After the OnBytes calls of one round of ready sessions: a service may gather the messages of
+  // a round and hand them on together here, with one wake-up of its workers instead of one per
+  // message. A server calls it at least after every round that made an OnBytes call.
+  virtual void OnReadsDone() {}
   // The session is gone (peer close or reset, read or write error, keep-alive expiry, output
   // past the cap, Close, CloseListeners or Stop); Send to it returns false from now on.
   virtual void OnClosed(TcpSessionId session) = 0;

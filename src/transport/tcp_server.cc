@@ -16,6 +16,7 @@
 #include <deque>
 #include <new>
 #include <system_error>
+#include <utility>
 
 #include "base/log.h"
 
@@ -159,15 +160,6 @@ constexpr auto kEarliestFirst = [](const auto& left, const auto& right) {
 
 }  // namespace
 
-struct TcpServer::Listener {
-  Listener(int socket, std::uint32_t tag, std::uint32_t keepAliveSeconds)
-      : socket(socket), tag(tag), keepAliveSeconds(keepAliveSeconds) {}
-  ~Listener() { ::close(socket); }
-  const int socket;
-  const std::uint32_t tag;
-  const std::uint32_t keepAliveSeconds;
-};
-
 struct TcpServer::Session {
   Session(TcpSessionId id, int socket, std::uint32_t keepAliveSeconds, std::uint64_t serial)
       : id(id), socket(socket), keepAlive(keepAliveSeconds), serial(serial) {}
@@ -179,12 +171,14 @@ struct TcpServer::Session {
   // Loop thread only.
   TcpPeer peer;
   Clock::time_point lastInput;
+  Clock::time_point inputEndedAt;  // when inputEnded was set
   // Under the server's lock.
   std::deque<std::string> output;
   std::size_t frontWritten = 0;  // bytes of output.front() already written
   std::size_t queuedBytes = 0;
   bool watchingOutput = false;
   bool closeAfterOutput = false;
+  bool inputEnded = false;  // the peer ended its input: nothing more is read (set on the loop)
 };
 
 TcpServer::TcpServer(TcpSessionEvents* events, TcpServerOptions options)
@@ -217,16 +211,23 @@ bool TcpServer::Listen(std::uint32_t tag, const std::string& address, std::uint1
   int socket = OpenListeningSocket(address, port, options_.sendBuffer, &failure);
   if (socket < 0) return false;
   try {
-    auto listener = std::make_unique<Listener>(socket, tag, keepAliveSeconds);
     std::lock_guard<std::mutex> lock(mutex_);
+    listeners_.emplace(socket, Listener{tag, keepAliveSeconds});
+    try {
+      listenersByTag_.emplace(tag, socket);
+    } catch (const std::bad_alloc&) {
+      listeners_.erase(socket);
+      throw;
+    }
     if (!Register(epoll_, EPOLL_CTL_ADD, socket, DescriptorKey(socket), EPOLLIN)) {
       failure = errno;
+      ForgetListener(tag, socket);
+      ::close(socket);
       return false;
     }
-    listenersByTag_.emplace(tag, socket);
-    listeners_.emplace(socket, std::move(listener));
   } catch (const std::bad_alloc&) {
     LOG_ERROR("Error in allocating memory");
+    ::close(socket);
     failure = ENOMEM;
     return false;
   }
@@ -247,9 +248,23 @@ bool TcpServer::StartLoop() {
   return true;
 }
 
+// The caller holds mutex_.
 void TcpServer::CloseListener(int socket) {
   epoll_ctl(epoll_, EPOLL_CTL_DEL, socket, nullptr);
+  ::close(socket);
   listeners_.erase(socket);
+}
+
+// The caller holds mutex_. Drops the records of a listener that never served.
+void TcpServer::ForgetListener(std::uint32_t tag, int socket) {
+  listeners_.erase(socket);
+  auto [first, last] = listenersByTag_.equal_range(tag);
+  for (auto listener = first; listener != last; ++listener) {
+    if (listener->second == socket) {
+      listenersByTag_.erase(listener);
+      return;
+    }
+  }
 }
 
 void TcpServer::CloseListeners(std::uint32_t tag) {
@@ -364,7 +379,7 @@ void TcpServer::Wake() {
 void TcpServer::Watch(Session& session, bool wantOutput) {
   session.watchingOutput = wantOutput;
   if (!Register(epoll_, EPOLL_CTL_MOD, session.socket, session.id,
-                EPOLLIN | (wantOutput ? EPOLLOUT : 0u)))
+                (session.inputEnded ? 0u : EPOLLIN) | (wantOutput ? EPOLLOUT : 0u)))
     LOG_ERROR("TCP server: epoll_ctl failed for fd %d (errno %d)", session.socket, errno);
 }
 
@@ -378,6 +393,12 @@ void TcpServer::Loop() {
     }
     try {
       for (int i = 0; i < count; ++i) Dispatch(ready[i].data.u64, ready[i].events);
+    } catch (const std::bad_alloc&) {
+      LOG_ERROR("Error in allocating memory");
+    }
+    try {
+      // After a round cut short too: what its reads queued must not wait for the next round.
+      if (std::exchange(bytesThisRound_, false)) events_->OnReadsDone();
       FinishClosing();
     } catch (const std::bad_alloc&) {
       LOG_ERROR("Error in allocating memory");
@@ -415,7 +436,7 @@ void TcpServer::AcceptOn(int listenerSocket) {
     auto found = listeners_.find(listenerSocket);
     if (found == listeners_.end()) return;  // closed since epoll_wait reported it
     for (int i = 0; i < kAcceptsPerWakeup && result == AcceptResult::kAccepted; ++i)
-      result = AcceptOne(*found->second, &accepted);
+      result = AcceptOne(listenerSocket, found->second, &accepted);
     if (result == AcceptResult::kOutOfDescriptors) {
       // Level-triggered readiness would report the waiting connection again at once: accept
       // nothing more here until a session closes or the retry time passes.
@@ -434,10 +455,11 @@ void TcpServer::AcceptOn(int listenerSocket) {
 }
 
 // The caller holds mutex_.
-TcpServer::AcceptResult TcpServer::AcceptOne(Listener& listener, std::vector<Session*>* accepted) {
+TcpServer::AcceptResult TcpServer::AcceptOne(int listenerSocket, const Listener& listener,
+                                             std::vector<Session*>* accepted) {
   sockaddr_storage peer{};
   socklen_t length = sizeof peer;
-  int socket = accept4(listener.socket, reinterpret_cast<sockaddr*>(&peer), &length,
+  int socket = accept4(listenerSocket, reinterpret_cast<sockaddr*>(&peer), &length,
                        SOCK_NONBLOCK | SOCK_CLOEXEC);
   if (socket < 0) {
     int error = errno;
@@ -491,15 +513,36 @@ void TcpServer::ReadFrom(TcpSessionId id) {
   } while (count < 0 && errno == EINTR);
   if (count > 0) {
     session->lastInput = Clock::now();
+    bytesThisRound_ = true;
     events_->OnBytes(id, std::string_view(readBuffer_.data(), static_cast<std::size_t>(count)));
     return;
   }
   if (count < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return;
-  // 0 is the peer's close; a reset connection counts as closed too.
+  // 0 is the end of the peer's input: the first time it may be a half-close, after which the
+  // session is only read again when the socket reports a hang-up, the peer gone for good.
+  if (count == 0 && !session->inputEnded) {
+    EndInput(*session);
+    return;
+  }
+  // A reset connection counts as closed too.
   if (count < 0 && errno != ECONNRESET)
     LOG_ERROR("Read Error from Socket (fd: %d, errno: %d )", session->socket, errno);
   std::lock_guard<std::mutex> lock(mutex_);
   Retire(id);
+}
+
+// Loop thread. The peer may still read what is queued for it and what its last input is answered
+// with: the session stops reading and is closed once the service has sent its answers, or at the
+// half-close bound.
+void TcpServer::EndInput(Session& session) {
+  {
+    std::lock_guard<std::mutex> lock(mutex_);
+    session.inputEnded = true;
+    Watch(session, session.watchingOutput);
+  }
+  session.inputEndedAt = Clock::now();
+  Schedule({session.inputEndedAt + options_.halfClosedLimit, session.id, session.serial});
+  if (!events_->OnInputEnded(session.id)) Close(session.id, true);
 }
 
 void TcpServer::FlushOutput(TcpSessionId id) {
@@ -581,7 +624,8 @@ void TcpServer::Schedule(const TimerEntry& entry) {
 }
 
 // Keep-alive deadlines are checked lazily: input only moves a session's lastInput, and an entry
-// that comes due for a session heard from since is put back at its new deadline.
+// that comes due for a session heard from since is put back at its new deadline. A half-closed
+// session's deadline is the earlier of its keep-alive's and the half-close bound's.
 void TcpServer::OnTimer() {
   std::uint64_t expirations;
   if (read(timer_, &expirations, sizeof expirations) < 0 && errno != EAGAIN)
@@ -599,12 +643,16 @@ void TcpServer::OnTimer() {
     auto found = sessions_.find(due.session);
     if (found == sessions_.end() || found->second->serial != due.serial) continue;
     Session& session = *found->second;
-    Clock::time_point deadline = session.lastInput + session.keepAlive;
+    Clock::time_point deadline = Clock::time_point::max();
+    if (session.keepAlive.count() > 0) deadline = session.lastInput + session.keepAlive;
+    if (session.inputEnded)
+      deadline = std::min(deadline, session.inputEndedAt + options_.halfClosedLimit);
     if (deadline > now) {
       timers_.push_back({deadline, due.session, due.serial});
       std::push_heap(timers_.begin(), timers_.end(), kEarliestFirst);
     } else {
-      LOG_TRACE("TCP session %" PRIu64 " silent for its keep-alive time: closed", due.session);
+      LOG_TRACE("TCP session %" PRIu64 " past its keep-alive or half-close time: closed",
+                due.session);
       Retire(due.session);
     }
   }

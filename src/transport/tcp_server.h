@@ -19,6 +19,7 @@
 #include <string>
 #include <string_view>
 #include <thread>
+#include <unordered_map>
 #include <vector>
 
 #include "transport/stream_server.h"
@@ -35,6 +36,9 @@ struct TcpServerOptions {
   // How long accepting stays paused on a listener after the process ran out of descriptors,
   // unless a session closes first.
   std::chrono::milliseconds acceptRetry{1000};
+  // How long a session stays open after the peer ended its input, for the answers still due to
+  // it; its keep-alive closes it sooner when that comes first.
+  std::chrono::milliseconds halfClosedLimit{10000};
 };
 
 class TcpServer final : public StreamServer {
@@ -70,10 +74,14 @@ class TcpServer final : public StreamServer {
   void Stop() override;
 
  private:
-  struct Listener;
+  // A listening socket's tag and the keep-alive of the sessions it accepts.
+  struct Listener {
+    std::uint32_t tag = 0;
+    std::uint32_t keepAliveSeconds = 0;
+  };
   struct Session;
-  // A keep-alive deadline of a session (serial tells it from a later session with the same id),
-  // or with serial 0 the end of a pause in accepting.
+  // A keep-alive or half-close deadline of a session (serial tells it from a later session with
+  // the same id), or with serial 0 the end of a pause in accepting.
   struct TimerEntry {
     std::chrono::steady_clock::time_point deadline;
     TcpSessionId session = 0;
@@ -85,9 +93,11 @@ class TcpServer final : public StreamServer {
   void Loop();
   void Dispatch(std::uint64_t key, std::uint32_t events);
   void AcceptOn(int listenerSocket);
-  AcceptResult AcceptOne(Listener& listener, std::vector<Session*>* accepted);
+  AcceptResult AcceptOne(int listenerSocket, const Listener& listener,
+                         std::vector<Session*>* accepted);
   void ResumeAccepting();
   void ReadFrom(TcpSessionId id);
+  void EndInput(Session& session);
   void FlushOutput(TcpSessionId id);
   bool WriteQueued(Session& session);
   void Watch(Session& session, bool wantOutput);
@@ -99,6 +109,7 @@ class TcpServer final : public StreamServer {
   void ArmTimer();
   TcpSessionId NextSessionId(std::uint32_t tag);
   void CloseListener(int socket);
+  void ForgetListener(std::uint32_t tag, int socket);
 
   TcpSessionEvents* const events_;
   const TcpServerOptions options_;
@@ -112,8 +123,9 @@ class TcpServer final : public StreamServer {
 
   // Guards the listeners, the session map, the closing list and every session's output.
   mutable std::mutex mutex_;
-  std::map<int, std::unique_ptr<Listener>> listeners_;  // by listening socket
-  std::multimap<std::uint32_t, int> listenersByTag_;
+  // By listening socket; a server may hold tens of thousands, so the records stay small.
+  std::unordered_map<int, Listener> listeners_;
+  std::unordered_multimap<std::uint32_t, int> listenersByTag_;
   std::vector<int> pausedListeners_;  // out of descriptors when they last accepted
   std::map<TcpSessionId, std::unique_ptr<Session>> sessions_;  // ordered: accept order per tag
   std::vector<std::unique_ptr<Session>> closing_;              // left the map; the loop closes them
@@ -123,6 +135,7 @@ class TcpServer final : public StreamServer {
   std::vector<TimerEntry> timers_;  // a heap, earliest deadline first
   std::uint64_t nextSerial_ = 1;
   std::vector<char> readBuffer_;
+  bool bytesThisRound_ = false;  // an OnBytes call since the last OnReadsDone
 };
 
 }  // namespace tessel

@@ -7,6 +7,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
 #include <thread>
 
@@ -43,6 +44,7 @@ class Client {
   }
   ~Client() { ::close(socket_); }
   bool Connected() const { return connected_; }
+  void EndOutput() { ::shutdown(socket_, SHUT_WR); }
   void Send(const std::string& bytes) {
     ASSERT_EQ(::send(socket_, bytes.data(), bytes.size(), MSG_NOSIGNAL),
               static_cast<ssize_t>(bytes.size()));
@@ -97,6 +99,15 @@ class Client {
   std::string buffer_;
 };
 
+// A host that takes its time over each response, as a busy one may.
+struct SlowHost : MemoryHost {
+  HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& query) override {
+    std::this_thread::sleep_for(delay.load());
+    return MemoryHost::Tl1GetResponseBlock(query);
+  }
+  std::atomic<std::chrono::milliseconds> delay{0ms};
+};
+
 struct Tl1ServiceTest : ::testing::Test {
   Tl1ServiceTest() {
     host.SetTl1Reply("RTRV-HDR", {0, Answer{"1"}});
@@ -115,7 +126,7 @@ struct Tl1ServiceTest : ::testing::Test {
     return service.SendAutonomous(kAgentId, {{code, verb, "ALM", std::nullopt, {{2, line}}}});
   }
 
-  MemoryHost host;
+  SlowHost host;
   std::vector<std::string> status;
   Tl1Service service{{&host,
                       Noon,
@@ -152,6 +163,15 @@ TEST_F(Tl1ServiceTest, RawStreamIsCutAtTerminatorsAndEveryAnswerEndsWithThePromp
   EXPECT_EQ(status.back(), "Unable to start TL1 Agent at Port :" + std::to_string(kOtherPort) +
                                " and at IpAddress : 127.87.0.1.1");
   EXPECT_FALSE(service.AgentIdAt("127.87.0.1.1", kOtherPort));
+}
+
+TEST_F(Tl1ServiceTest, AClientThatEndsItsInputAfterItsCommandsIsAnsweredThenClosed) {
+  host.delay = 200ms;
+  Client client(kPort);
+  client.Send("RTRV-HDR:::1;RTRV-HDR:::2;");
+  client.EndOutput();
+  EXPECT_EQ(client.ReadUntil(kPrompt, 2), Response("1", "COMPLD") + Response("2", "COMPLD"));
+  EXPECT_TRUE(client.WaitClosed(3s));
 }
 
 TEST_F(Tl1ServiceTest, AutonomousMessagesTakeConsecutiveAtagsInSeverityOrder) {

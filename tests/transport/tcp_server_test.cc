@@ -40,6 +40,7 @@ class Recorder : public TcpSessionEvents {
     changed_.notify_all();
   }
   void OnBytes(TcpSessionId id, std::string_view bytes) override { onBytes(id, bytes); }
+  bool OnInputEnded(TcpSessionId id) override { return answersDue && answersDue(id); }
   void OnClosed(TcpSessionId id) override {
     std::lock_guard<std::mutex> lock(mutex_);
     EXPECT_TRUE(closed_.insert(id).second) << "closed twice";
@@ -59,6 +60,7 @@ class Recorder : public TcpSessionEvents {
 
   std::function<void(TcpSessionId)> onAccepted;
   std::function<void(TcpSessionId, std::string_view)> onBytes = [](auto, auto) {};
+  std::function<bool(TcpSessionId)> answersDue;  // what OnInputEnded answers; unset: false
   std::vector<TcpSessionId> accepted_;
   std::map<TcpSessionId, TcpPeer> peers_;
   std::set<TcpSessionId> closed_;
@@ -287,6 +289,34 @@ TEST_F(TcpServerTest, CloseAfterPendingOutputAndStopEndSessionsCleanly) {
   ASSERT_TRUE(server_.Listen(1, kAddress, kBasePort + 7, 0));
   Client(kAddress, kBasePort + 7);
   EXPECT_EQ(Accepted(2), MakeTcpSessionId(1, 1));
+}
+
+// A client that half-closes after its request (nc -N, a script's pipe) still reads the answer.
+TEST(TcpServerHalfCloseTest, OutputDueAfterTheClientsEndOfInputIsSentWithinABound) {
+  Recorder events;
+  TcpServer server(&events, {.sendBuffer = 16 * 1024, .halfClosedLimit = 300ms});
+  ASSERT_TRUE(server.Listen(1, kAddress, kBasePort + 8, 0));
+  std::string answer = Pattern(300 * 1024);  // far more than the socket buffers hold
+  events.onBytes = [&](TcpSessionId id, std::string_view) { server.Send(id, answer); };
+  int answered = Connect(kAddress, kBasePort + 8, 16 * 1024);
+  Write(answered, "q");
+  shutdown(answered, SHUT_WR);
+  bool closed = false;
+  EXPECT_TRUE(Read(answered, answer.size() + 1, 1000, &closed) == answer);
+  EXPECT_TRUE(closed || PeerClosed(answered));
+
+  // A service that still owes answers and never sends them holds the session no longer than
+  // the bound, keep-alive 0 or not.
+  events.answersDue = [](TcpSessionId) { return true; };
+  int owed = Connect(kAddress, kBasePort + 8);
+  shutdown(owed, SHUT_WR);
+  auto ended = Clock::now();
+  EXPECT_TRUE(PeerClosed(owed, 2000));
+  EXPECT_GE(Clock::now() - ended, 250ms);
+  EXPECT_TRUE(events.WaitUntil([&] { return events.closed_.size() == 2; }));
+  server.Stop();
+  close(answered);
+  close(owed);
 }
 
 // Out of descriptors, a waiting connection must not keep the loop busy; it is accepted once

@@ -7,6 +7,7 @@ import java.util.ArrayList;
 import java.util.Arrays;
 import java.util.Comparator;
 import java.util.EnumMap;
+import java.util.HashMap;
 import java.util.LinkedHashMap;
 import java.util.List;
 import java.util.Map;
@@ -23,20 +24,47 @@ public final class DeviceTable {
   private final long[] addresses; // entries[i].address, for binary search
   private final Map<String, ProtocolAgents> agents;
 
-  /** A device's fixed identity and its agents' states (guarded by the table). */
+  /**
+   * A device's fixed identity and its agents' states (guarded by the table). A network holds tens
+   * of thousands: the protocol names are one array shared by the devices that have the same ones,
+   * the states an array beside it.
+   */
   private static final class Entry {
     final long address;
     final int agentId;
     final String name;
     final String group;
-    final Map<String, AgentState> states;
+    final List<String> protocols;
+    final AgentState[] states;
 
-    Entry(long address, int agentId, String name, String group, Map<String, AgentState> states) {
+    Entry(long address, int agentId, String name, String group, List<String> protocols, AgentState[] states) {
       this.address = address;
       this.agentId = agentId;
       this.name = name;
       this.group = group;
-      this.states = new LinkedHashMap<>(states);
+      this.protocols = protocols;
+      this.states = states;
+    }
+
+    AgentState state(String protocol) {
+      int index = protocols.indexOf(protocol);
+      return index < 0 ? null : states[index];
+    }
+
+    void set(String protocol, AgentState state) {
+      states[protocols.indexOf(protocol)] = state;
+    }
+
+    boolean any(AgentState state) {
+      return Arrays.asList(states).contains(state);
+    }
+
+    Map<String, AgentState> stateMap() {
+      Map<String, AgentState> map = new LinkedHashMap<>();
+      for (int i = 0; i < states.length; i++) {
+        map.put(protocols.get(i), states[i]);
+      }
+      return map;
     }
   }
 
@@ -49,9 +77,12 @@ public final class DeviceTable {
   /** The devices as they start; add them in any order. */
   public static final class Builder {
     private final List<Entry> entries = new ArrayList<>();
+    private final Map<List<String>, List<String>> protocolLists = new HashMap<>();
 
     public Builder add(long address, int agentId, String name, String group, Map<String, AgentState> states) {
-      entries.add(new Entry(address, agentId, name, group, states));
+      List<String> protocols = List.copyOf(states.keySet());
+      protocols = protocolLists.computeIfAbsent(protocols, list -> list);
+      entries.add(new Entry(address, agentId, name, group, protocols, states.values().toArray(new AgentState[0])));
       return this;
     }
 
@@ -84,7 +115,7 @@ public final class DeviceTable {
     List<Device> page = new ArrayList<>();
     int total = 0;
     for (Entry entry : entries) {
-      if ((group == null || entry.group.equals(group)) && (state == null || entry.states.containsValue(state))) {
+      if ((group == null || entry.group.equals(group)) && (state == null || entry.any(state))) {
         if (total >= offset && page.size() < limit) {
           page.add(snapshot(entry));
         }
@@ -99,9 +130,9 @@ public final class DeviceTable {
     Map<String, Map<String, EnumMap<AgentState, Integer>>> counts = new LinkedHashMap<>();
     for (Entry entry : entries) {
       Map<String, EnumMap<AgentState, Integer>> group = counts.computeIfAbsent(entry.group, g -> new LinkedHashMap<>());
-      entry.states.forEach((protocol, state) -> group
-          .computeIfAbsent(protocol, p -> zeroCounts())
-          .merge(state, 1, Integer::sum));
+      for (int i = 0; i < entry.states.length; i++) {
+        group.computeIfAbsent(entry.protocols.get(i), p -> zeroCounts()).merge(entry.states[i], 1, Integer::sum);
+      }
     }
     return counts;
   }
@@ -110,7 +141,7 @@ public final class DeviceTable {
   public synchronized int running() {
     int running = 0;
     for (Entry entry : entries) {
-      running += entry.states.values().stream().allMatch(state -> state == AgentState.RUNNING) ? 1 : 0;
+      running += Arrays.stream(entry.states).allMatch(state -> state == AgentState.RUNNING) ? 1 : 0;
     }
     return running;
   }
@@ -125,10 +156,10 @@ public final class DeviceTable {
       return Optional.empty();
     }
     for (String name : protocols(entry.get(), protocol)) {
-      if (entry.get().states.get(name) == AgentState.RUNNING) {
+      if (entry.get().state(name) == AgentState.RUNNING) {
         agents.get(name).stop(snapshot(entry.get()));
       }
-      entry.get().states.put(name, AgentState.STOPPED);
+      entry.get().set(name, AgentState.STOPPED);
     }
     return Optional.of(new Change(snapshot(entry.get()), Optional.empty()));
   }
@@ -144,11 +175,11 @@ public final class DeviceTable {
     }
     List<String> failures = new ArrayList<>();
     for (String name : protocols(entry.get(), protocol)) {
-      if (entry.get().states.get(name) == AgentState.RUNNING) {
+      if (entry.get().state(name) == AgentState.RUNNING) {
         continue;
       }
       Optional<String> failure = agents.get(name).start(snapshot(entry.get()));
-      entry.get().states.put(name, failure.isEmpty() ? AgentState.RUNNING : AgentState.FAILED);
+      entry.get().set(name, failure.isEmpty() ? AgentState.RUNNING : AgentState.FAILED);
       failure.ifPresent(reason -> failures.add(name + ": " + reason));
     }
     Optional<String> failure = failures.isEmpty() ? Optional.empty() : Optional.of(String.join("; ", failures));
@@ -162,11 +193,11 @@ public final class DeviceTable {
 
   private List<String> protocols(Entry entry, Optional<String> protocol) {
     if (protocol.isEmpty()) {
-      return List.copyOf(entry.states.keySet());
+      return entry.protocols;
     }
-    if (!entry.states.containsKey(protocol.get())) {
+    if (!entry.protocols.contains(protocol.get())) {
       throw new IllegalArgumentException("device " + Network.dotted(entry.address) + " has no " + protocol.get()
-          + " agent (it has " + String.join(", ", entry.states.keySet()) + ")");
+          + " agent (it has " + String.join(", ", entry.protocols) + ")");
     }
     return List.of(protocol.get());
   }
@@ -183,7 +214,8 @@ public final class DeviceTable {
   }
 
   private static Device snapshot(Entry entry) {
-    return new Device(Network.dotted(entry.address), entry.address, entry.agentId, entry.name, entry.group, entry.states);
+    return new Device(Network.dotted(entry.address), entry.address, entry.agentId, entry.name, entry.group,
+        entry.stateMap());
   }
 
   private static EnumMap<AgentState, Integer> zeroCounts() {

@@ -91,20 +91,18 @@ public final class TL1Data {
    * engine finds the command; within that code the block of the AID, else the one for every AID.
    */
   public Optional<Block> find(String verb, String modifier1, String modifier2, String aid) {
-    List<String> candidates = new ArrayList<>();
-    candidates.add(join(verb, modifier1, modifier2));
-    if (modifier1 != null) {
-      candidates.add(join(verb, modifier1, null));
+    Map<String, Block> byAid = blocks.get(join(verb, modifier1, modifier2));
+    if (byAid == null && modifier1 != null && modifier2 != null) {
+      byAid = blocks.get(join(verb, modifier1, null));
     }
-    candidates.add(join(verb, null, null));
-    for (String code : candidates) {
-      Map<String, Block> byAid = blocks.get(code);
-      if (byAid != null) {
-        Block own = aid == null ? null : byAid.get(aid.toUpperCase(Locale.ROOT));
-        return Optional.ofNullable(own != null ? own : byAid.get(ANY_AID));
-      }
+    if (byAid == null && modifier1 != null) {
+      byAid = blocks.get(join(verb, null, null));
     }
-    return Optional.empty();
+    if (byAid == null) {
+      return Optional.empty();
+    }
+    Block own = aid == null ? null : byAid.get(aid.toUpperCase(Locale.ROOT));
+    return Optional.ofNullable(own != null ? own : byAid.get(ANY_AID));
   }
 
   /** A command code from its parts, upper case; absent parts are null. */

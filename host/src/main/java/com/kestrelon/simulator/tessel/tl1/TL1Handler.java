@@ -14,6 +14,7 @@ import java.util.Map;
 import java.util.Optional;
 import java.util.Set;
 import java.util.concurrent.ConcurrentHashMap;
+import java.util.function.Supplier;
 import java.util.regex.Matcher;
 import java.util.regex.Pattern;
 
@@ -124,7 +125,8 @@ public class TL1Handler {
     if (block.isEmpty()) {
       return code.equals(ACT_USER) || code.equals(CANC_USER) ? new String[] {"1"} : error("SCNF");
     }
-    return response(block.get(), placeholders(device, aid, parameters));
+    String[] given = parameters;
+    return response(block.get(), () -> placeholders(device, aid, given));
   }
 
   private static boolean accepts(List<TL1User> users, String user, String password) {
@@ -137,7 +139,9 @@ public class TL1Handler {
     return new String[] {ERROR_CODE, code, TL1Codes.errorText(number)};
   }
 
-  private static String[] response(Block block, Map<String, String> values) {
+  /** The answer of a block; values are asked for only when a line has a placeholder. */
+  private static String[] response(Block block, Supplier<Map<String, String>> placeholders) {
+    Map<String, String> values = null;
     List<String> answer = new ArrayList<>();
     answer.add(Integer.toString(block.completion()));
     if (block.deny() != null) {
@@ -149,7 +153,12 @@ public class TL1Handler {
       answer.add(TL1Data.LineType.QUOTED.number() + "|" + TL1Codes.errorText(TL1Codes.errorNumber(block.deny())));
     }
     for (Line line : block.lines()) {
-      answer.add(line.type().number() + "|" + replace(line.text(), values));
+      String text = line.text();
+      if (text.indexOf('{') >= 0) {
+        values = values == null ? placeholders.get() : values;
+        text = replace(text, values);
+      }
+      answer.add(line.type().number() + "|" + text);
     }
     return answer.toArray(new String[0]);
   }
@@ -171,9 +180,6 @@ public class TL1Handler {
 
   /** Replaces in one pass, so that a value holding a placeholder's name stays as it is. */
   private static String replace(String text, Map<String, String> values) {
-    if (text.indexOf('{') < 0) {
-      return text;
-    }
     Matcher matcher = PLACEHOLDER.matcher(text);
     StringBuilder replaced = new StringBuilder();
     while (matcher.find()) {
