@@ -44,6 +44,8 @@ std::uint64_t LogIn(const std::string& address, unsigned int port) {
   ssh_session session = ssh_new();
   int timeout = 10;
   bool processConfig = false;
+  int noDelay = 1;  // as interactive clients do
+  ssh_options_set(session, SSH_OPTIONS_NODELAY, &noDelay);
   ssh_options_set(session, SSH_OPTIONS_HOST, address.c_str());
   ssh_options_set(session, SSH_OPTIONS_PORT, &port);
   ssh_options_set(session, SSH_OPTIONS_USER, "admin");
@@ -61,6 +63,8 @@ std::uint64_t LogIn(const std::string& address, unsigned int port) {
       ssh_channel_read_timeout(channel, prompt, 3, 0, 10000) == 3) {
     elapsed = static_cast<std::uint64_t>(
         std::chrono::duration_cast<std::chrono::nanoseconds>(Clock::now() - start).count());
+  } else {
+    std::fprintf(stderr, "login failed: %s\n", ssh_get_error(session));
   }
   if (channel != nullptr) ssh_channel_free(channel);
   ssh_disconnect(session);

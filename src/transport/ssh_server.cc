@@ -1,6 +1,8 @@
 #include "transport/ssh_server.h"
 
 #include <fcntl.h>
+#include <netinet/in.h>
+#include <netinet/tcp.h>
 #include <libssh/callbacks.h>
 #include <libssh/libssh.h>
 #include <libssh/server.h>
@@ -177,11 +179,9 @@ struct SshServer::Callbacks {
     return 0;
   }
 
-  static int ListenersReady(socket_t descriptor, int, void* data) {
-    std::array<epoll_event, kMaxListenerEvents> ready;
-    int count = epoll_wait(descriptor, ready.data(), kMaxListenerEvents, 0);
-    auto* server = static_cast<SshServer*>(data);
-    for (int i = 0; i < count; ++i) server->AcceptOn(ready[i].data.fd);
+  // Accepting waits until the poll is over (see Loop).
+  static int ListenersReady(socket_t, int, void* data) {
+    static_cast<SshServer*>(data)->listenersReady_ = true;
     return 0;
   }
 
@@ -521,6 +521,12 @@ void SshServer::Loop() {
     // Errors of poll itself (a signal) only end this round.
     ssh_event_dopoll(event_, MillisecondsToDeadline());
     try {
+      // libssh closes the socket of a connection that ends during the poll but keeps it in the
+      // event until the session leaves it: finish those first, so that no descriptor number is
+      // given out again while the event still watches it under the old session.
+      CheckConnections();
+      FinishClosing();
+      if (listenersReady_) AcceptReady();
       OnTimer();
       WritePendingOutput();
       CheckConnections();
@@ -543,6 +549,13 @@ int SshServer::MillisecondsToDeadline() const {
   return static_cast<int>(std::clamp<std::int64_t>(wait.count(), 0, INT_MAX));
 }
 
+void SshServer::AcceptReady() {
+  listenersReady_ = false;
+  std::array<epoll_event, kMaxListenerEvents> ready;
+  int count = epoll_wait(listenerEpoll_, ready.data(), kMaxListenerEvents, 0);
+  for (int i = 0; i < count; ++i) AcceptOn(ready[i].data.fd);
+}
+
 void SshServer::AcceptOn(int listenerSocket) {
   std::vector<int> accepted;
   Listener listener;
@@ -555,6 +568,9 @@ void SshServer::AcceptOn(int listenerSocket) {
     for (int i = 0; i < kAcceptsPerWakeup; ++i) {
       int socket = accept4(listenerSocket, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC);
       if (socket >= 0) {
+        // Key exchange and login are a dialogue of small packets: no waiting for delayed ACKs.
+        int on = 1;
+        setsockopt(socket, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
         accepted.push_back(socket);
         continue;
       }
@@ -738,6 +754,7 @@ void SshServer::FinishClosing() {
   for (auto& connection : closed) {
     // Out of the event first: what libssh does below then touches this session alone.
     if (connection->inEvent) ssh_event_remove_session(event_, connection->session);
+    // An orderly end for a client still there: end of file and close on its channel first.
     if (connection->channel != nullptr && ssh_channel_is_open(connection->channel)) {
       ssh_channel_send_eof(connection->channel);
       ssh_channel_close(connection->channel);

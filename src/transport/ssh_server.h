@@ -93,6 +93,7 @@ class SshServer final : public StreamServer {
   bool StartLoop();
   void Loop();
   int MillisecondsToDeadline() const;
+  void AcceptReady();
   void AcceptOn(int listenerSocket);
   void StartConnection(int socket, const Listener& listener);
   void OpenShell(Connection& connection);
@@ -139,7 +140,8 @@ class SshServer final : public StreamServer {
 
   // Loop thread only.
   std::vector<TimerEntry> timers_;  // a heap, earliest deadline first
-  std::vector<TcpSessionId> windowWaiting_;  // output waits for the client's channel window
+  std::vector<TcpSessionId> windowWaiting_;
+  bool listenersReady_ = false;  // output waits for the client's channel window
   std::uint64_t nextSerial_ = 1;
 };
 
