@@ -135,13 +135,13 @@ class Client {
     return ssh_channel_write(channel_, bytes.data(), static_cast<std::uint32_t>(bytes.size())) ==
            static_cast<int>(bytes.size());
   }
-  // What arrives until it holds expected or nothing comes for a second; *closed tells whether
+  // What arrives until it holds expected or nothing comes for five seconds; *closed tells whether
   // the channel ended.
   std::string ReadUntil(std::string_view expected, bool* closed = nullptr) {
     std::string bytes;
     std::array<char, 4096> buffer;
     while (bytes.find(expected) == std::string::npos) {
-      int count = ssh_channel_read_timeout(channel_, buffer.data(), buffer.size(), 0, 1000);
+      int count = ssh_channel_read_timeout(channel_, buffer.data(), buffer.size(), 0, 5000);
       if (count <= 0) {
         if (closed) *closed = count < 0 || ssh_channel_is_eof(channel_);
         break;
