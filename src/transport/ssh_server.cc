@@ -754,8 +754,10 @@ void SshServer::FinishClosing() {
   for (auto& connection : closed) {
     // Out of the event first: what libssh does below then touches this session alone.
     if (connection->inEvent) ssh_event_remove_session(event_, connection->session);
-    // An orderly end for a client still there: end of file and close on its channel first.
+    // An orderly end for a client still there: an exit status (a command-line client exits with
+    // it), end of file and close on its channel first.
     if (connection->channel != nullptr && ssh_channel_is_open(connection->channel)) {
+      if (connection->shellRequested) ssh_channel_request_send_exit_status(connection->channel, 0);
       ssh_channel_send_eof(connection->channel);
       ssh_channel_close(connection->channel);
     }
