@@ -247,10 +247,9 @@ struct SshServer::Callbacks {
 
   static int Shell(ssh_session, ssh_channel, void* data) {
     auto& connection = *static_cast<Connection*>(data);
-    if (connection.shellRequested || Retired(connection)) return 1;
+    if (connection.shellRequested) return 1;
     connection.shellRequested = true;
-    connection.server->OpenShell(connection);
-    return 0;
+    return connection.server->OpenShell(connection) ? 0 : 1;
   }
 
   static int WindowChange(ssh_session, ssh_channel, int, int, int, int, void*) { return 0; }
@@ -639,10 +638,12 @@ void SshServer::StartConnection(int socket, const Listener& listener) {
             connection.peer.port);
 }
 
-// The client has a shell: from now on the connection is a session of the events object.
-void SshServer::OpenShell(Connection& connection) {
+// The client has a shell: from now on the connection is a session of the events object. False
+// when the connection was closed meanwhile.
+bool SshServer::OpenShell(Connection& connection) {
   {
     std::lock_guard<std::mutex> lock(mutex_);
+    if (connection.retired) return false;
     connection.open = true;
     ++openSessions_;
   }
@@ -650,6 +651,7 @@ void SshServer::OpenShell(Connection& connection) {
   if (connection.keepAlive.count() > 0)
     Schedule({connection.lastInput + connection.keepAlive, connection.id, connection.serial});
   events_->OnAccepted(connection.id, TcpListenerTagOf(connection.id), connection.peer);
+  return true;
 }
 
 // The caller holds mutex_. Client numbers run on from 1 below the SSH bit and never give an id

@@ -96,7 +96,7 @@ class SshServer final : public StreamServer {
   void AcceptReady();
   void AcceptOn(int listenerSocket);
   void StartConnection(int socket, const Listener& listener);
-  void OpenShell(Connection& connection);
+  bool OpenShell(Connection& connection);
   void ListOutput(Connection& connection);
   void WritePendingOutput();
   void WriteOutput(Connection& connection);
