@@ -50,13 +50,6 @@ std::optional<std::uint32_t> CliAgents::Forget(const std::string& address, std::
   return id;
 }
 
-std::vector<std::uint32_t> CliAgents::Ids() const {
-  std::lock_guard<std::mutex> lock(mutex_);
-  std::vector<std::uint32_t> ids;
-  for (const auto& [id, agent] : agents_) ids.push_back(id);
-  return ids;
-}
-
 void CliAgents::Clear() {
   std::lock_guard<std::mutex> lock(mutex_);
   agents_.clear();

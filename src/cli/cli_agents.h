@@ -44,8 +44,6 @@ class CliAgents {
   bool Update(std::uint32_t id, const std::function<void(CliAgent&)>& change);
   // Forgets the agent at address:port and returns its id.
   std::optional<std::uint32_t> Forget(const std::string& address, std::uint16_t port);
-  // Ids of the agents, in registration order.
-  std::vector<std::uint32_t> Ids() const;
   void Clear();
 
  private:

@@ -106,12 +106,6 @@ void CliPrompts::SetUserModes(std::vector<CliUserMode> modes, std::vector<std::s
   userPrompts_ = std::move(prompts);
 }
 
-bool CliPrompts::IsUserMode(std::int32_t mode) const {
-  std::lock_guard<std::mutex> lock(mutex_);
-  return std::any_of(userModes_.begin(), userModes_.end(),
-                     [mode](const CliUserMode& user) { return user.number == mode; });
-}
-
 std::string CliPrompts::Prompt(std::int32_t mode, const std::string& deviceName) const {
   std::lock_guard<std::mutex> lock(mutex_);
   bool namedFirst =

@@ -47,7 +47,6 @@ class CliPrompts {
   // a file cannot be read. False when either could not.
   bool ReadUserModes(const std::string& baseDirectory);
   void SetUserModes(std::vector<CliUserMode> modes, std::vector<std::string> prompts);
-  bool IsUserMode(std::int32_t mode) const;
 
   std::string Prompt(std::int32_t mode, const std::string& deviceName) const;
 

@@ -13,11 +13,9 @@ const char* const kCliSessionLimitLine =
 
 namespace {
 
-using Clock = std::chrono::steady_clock;
-
 constexpr std::uint32_t kDefaultKeepAliveSeconds = 300;
 
-std::int64_t Now() { return Clock::now().time_since_epoch().count(); }
+std::int64_t Now() { return std::chrono::steady_clock::now().time_since_epoch().count(); }
 
 }  // namespace
 
@@ -44,6 +42,7 @@ struct CliService::Session {
   std::mutex inputMutex;
   CliInput input;  // guarded by inputMutex
   std::atomic<std::int64_t> lastInput;
+  std::atomic<std::uint64_t> idleSerial{0};
   // Guarded by workMutex_.
   std::optional<CliInputEvent> event;
   bool scheduled = false;  // in readySessions_ or held by a worker
@@ -71,6 +70,10 @@ std::uint32_t CliService::RegisterAgent(CliAgent agent) {
 bool CliService::StartAgent(const std::string& address, std::uint16_t port, bool telnetServer,
                             std::int32_t hostInt1, std::int32_t hostInt2) {
   std::optional<CliAgent> agent = agents_.FindAt(address, port);
+  if (agent) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    if (listening_.count(agent->id) > 0) return true;  // already open
+  }
   int error = 0;
   bool started = false;
   if (agent) {
@@ -83,6 +86,10 @@ bool CliService::StartAgent(const std::string& address, std::uint16_t port, bool
     Start();
     // Idle sessions are closed by this service's timer, which follows the host's "timeout".
     started = tcp_.Listen(agent->id, address, port, 0, &error);
+    if (started) {
+      std::lock_guard<std::mutex> lock(mutex_);
+      listening_.insert(agent->id);
+    }
   }
   const char* what = telnetServer ? "Telnet Server" : "Cli Agent";
   char status[200];
@@ -134,6 +141,10 @@ bool CliService::StopAgent(const std::string& address, std::uint16_t port, bool 
   std::optional<std::uint32_t> id = agents_.Forget(address, port);
   if (!id) return false;
   tcp_.CloseListeners(*id);
+  {
+    std::lock_guard<std::mutex> lock(mutex_);
+    listening_.erase(*id);
+  }
   if (StreamServer* ssh = sshServer_.load()) ssh->CloseListeners(*id);
   char status[200];
   if (telnetServer) {
@@ -188,6 +199,7 @@ void CliService::Stop() {
     std::lock_guard<std::mutex> lock(mutex_);
     sessions_.clear();
     sessionsPerAgent_.clear();
+    listening_.clear();
   }
   agents_.Clear();
 }
@@ -220,7 +232,7 @@ void CliService::OnAccepted(TcpSessionId id, std::uint32_t listenerTag, const Tc
     std::size_t& count = sessionsPerAgent_[listenerTag];
     if (!agent || count >= options_.sessionsPerAgent) {
       if (count == 0) sessionsPerAgent_.erase(listenerTag);
-      server.Send(id, kCliSessionLimitLine);
+      if (agent) server.Send(id, kCliSessionLimitLine);  // else the agent is being stopped
       server.Close(id, true);
       return;
     }
@@ -231,9 +243,10 @@ void CliService::OnAccepted(TcpSessionId id, std::uint32_t listenerTag, const Tc
   Send(*session, session->input.Open());
   auto now = Clock::now();
   if (!ssh) Schedule({now + options_.negotiationTimeout, id, true});
+  if (ssh) ++loginsSucceeded_;  // the SSH server let it in
   std::uint32_t keepAlive =
       agent->keepAliveSeconds ? agent->keepAliveSeconds : kDefaultKeepAliveSeconds;
-  Schedule({now + std::chrono::seconds(keepAlive), id, false});
+  ScheduleIdleCheck(*session, now + std::chrono::seconds(keepAlive));
   PumpLocked(*session, session);
 }
 
@@ -340,17 +353,21 @@ void CliService::Answer(const std::shared_ptr<Session>& session, const CliInputE
 
 // Every session of the agent is looked at again under its new idle limit.
 void CliService::CheckIdleSoon(std::uint32_t agentId) {
-  std::vector<TcpSessionId> ids;
+  std::vector<std::shared_ptr<Session>> sessions;
   {
     std::lock_guard<std::mutex> lock(mutex_);
     for (auto it = sessions_.lower_bound(MakeTcpSessionId(agentId, 0));
          it != sessions_.end() && TcpListenerTagOf(it->first) == agentId; ++it)
-      ids.push_back(it->first);
+      sessions.push_back(it->second);
   }
   std::optional<CliAgent> agent = agents_.Find(agentId);
   if (!agent || agent->keepAliveSeconds == 0) return;
   auto deadline = Clock::now() + std::chrono::seconds(agent->keepAliveSeconds);
-  for (TcpSessionId id : ids) Schedule({deadline, id, false});
+  for (const std::shared_ptr<Session>& session : sessions) ScheduleIdleCheck(*session, deadline);
+}
+
+void CliService::ScheduleIdleCheck(Session& session, Clock::time_point deadline) {
+  Schedule({deadline, session.id, false, ++session.idleSerial});
 }
 
 void CliService::Schedule(Timer timer) {
@@ -390,11 +407,12 @@ void CliService::OnTimer(const Timer& timer) {
     PumpLocked(*session, session);
     return;
   }
+  if (timer.serial != session->idleSerial) return;  // a later check replaced this one
   std::optional<CliAgent> agent = agents_.Find(session->agentId);
   std::uint32_t seconds = agent ? agent->keepAliveSeconds : kDefaultKeepAliveSeconds;
   auto now = Clock::now();
   if (seconds == 0) {  // never closed; looked at again in case the host sets a limit
-    Schedule({now + std::chrono::seconds(kDefaultKeepAliveSeconds), timer.session, false});
+    ScheduleIdleCheck(*session, now + std::chrono::seconds(kDefaultKeepAliveSeconds));
     return;
   }
   Clock::time_point deadline =
@@ -402,7 +420,7 @@ void CliService::OnTimer(const Timer& timer) {
   if (now >= deadline) {
     ServerOf(session->id).Close(session->id, false);
   } else {
-    Schedule({deadline, timer.session, false});
+    ScheduleIdleCheck(*session, deadline);
   }
 }
 

@@ -21,6 +21,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <thread>
@@ -102,10 +103,12 @@ class CliService final : private TcpSessionEvents {
 
  private:
   struct Session;
+  using Clock = std::chrono::steady_clock;
   struct Timer {
-    std::chrono::steady_clock::time_point deadline;
+    Clock::time_point deadline;
     TcpSessionId session = 0;
     bool negotiation = false;  // else an idle check
+    std::uint64_t serial = 0;  // an idle check counts only while it is the session's latest
     bool operator>(const Timer& other) const { return deadline > other.deadline; }
   };
 
@@ -123,6 +126,8 @@ class CliService final : private TcpSessionEvents {
   void WorkerLoop();
   void Answer(const std::shared_ptr<Session>& session, const CliInputEvent& event);
   void Schedule(Timer timer);
+  // Arms the session's idle check at deadline; the checks armed before it are void.
+  void ScheduleIdleCheck(Session& session, Clock::time_point deadline);
   void CheckIdleSoon(std::uint32_t agentId);
   void TimerLoop();
   void OnTimer(const Timer& timer);
@@ -147,6 +152,7 @@ class CliService final : private TcpSessionEvents {
   mutable std::mutex mutex_;
   std::map<TcpSessionId, std::shared_ptr<Session>> sessions_;
   std::map<std::uint32_t, std::size_t> sessionsPerAgent_;
+  std::set<std::uint32_t> listening_;  // agents whose Telnet listener is open
 
   // Sessions with an event to answer, each at most once.
   std::mutex workMutex_;

@@ -45,9 +45,11 @@ std::string WithCrLf(std::string_view text) {
 }
 
 CliSession::CliSession(CliSessionEnvironment environment, std::uint32_t agentId, bool loggedIn)
-    : environment_(std::move(environment)),
-      agentId_(agentId),
-      mode_(loggedIn ? kCliModeUserExec : kCliModeUserName) {}
+    : environment_(std::move(environment)), agentId_(agentId), mode_(kCliModeUserName) {
+  if (!loggedIn) return;
+  std::optional<CliAgent> agent = Agent();
+  mode_ = agent && agent->telnetServer ? kCliModeTelnetShell : kCliModeUserExec;
+}
 
 HostBridge* CliSession::Host() const {
   return environment_.host ? environment_.host : InstalledHost();

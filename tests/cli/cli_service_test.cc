@@ -4,6 +4,8 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <condition_variable>
+#include <mutex>
 
 #include "support/loopback_client.h"
 #include "support/memory_host.h"
@@ -130,6 +132,83 @@ TEST_F(CliServiceTest, IdleSessionsCloseAndStopClosesTheRest) {
                                           " and at IPAddress : " + kAddress,
                                       "Cli Agent Stopped at Port : " + std::to_string(kPort) +
                                           " and at IPAddress : " + kAddress}));
+}
+
+// Stands in for the SSH server: the test plays its part, accepting an authenticated session
+// and handing on its bytes, and reads what the service sends.
+class FakeSshServer final : public StreamServer {
+ public:
+  bool Listen(std::uint32_t tag, const std::string&, std::uint16_t, std::uint32_t, int*) override {
+    tags.push_back(tag);
+    return true;
+  }
+  void CloseListeners(std::uint32_t) override {}
+  bool Send(TcpSessionId, std::string bytes) override {
+    std::lock_guard<std::mutex> lock(mutex_);
+    sent_ += bytes;
+    arrived_.notify_all();
+    return true;
+  }
+  void Close(TcpSessionId, bool) override {}
+  std::vector<TcpSessionId> SessionsOf(std::uint32_t) const override { return {}; }
+  std::size_t SessionCount() const override { return 0; }
+  void Stop() override {}
+  // What was sent up to the end of until, waiting at most two seconds for it.
+  std::string ReadUntil(const std::string& until) {
+    std::unique_lock<std::mutex> lock(mutex_);
+    arrived_.wait_for(lock, 2s, [&] { return sent_.find(until) != std::string::npos; });
+    std::size_t end = sent_.find(until);
+    end = end == std::string::npos ? sent_.size() : end + until.size();
+    std::string head = sent_.substr(0, end);
+    sent_.erase(0, end);
+    return head;
+  }
+  std::vector<std::uint32_t> tags;
+
+ private:
+  std::mutex mutex_;
+  std::condition_variable arrived_;
+  std::string sent_;
+};
+
+TEST(CliServiceSsh, SessionsOfThePluggedInServerStartLoggedIn) {
+  MemoryHost host;
+  host.SetCliReply("show version", 5, Answer{"response", "Version 1\n"});
+  FakeSshServer* ssh = nullptr;
+  TcpSessionEvents* events = nullptr;
+  CliPasswordCheck check;
+  std::string keys;
+  CliServiceOptions options;
+  options.host = &host;
+  options.status = [](const std::string&) {};
+  options.sshServer = [&](TcpSessionEvents* to, CliPasswordCheck checker, const std::string& dir) {
+    auto server = std::make_unique<FakeSshServer>();
+    ssh = server.get();
+    events = to;
+    check = std::move(checker);
+    keys = dir;
+    return server;
+  };
+  CliService service(std::move(options));
+  std::uint32_t tag =
+      service.RegisterAgent({0, "admin", "pw", "", false, kAddress, kPort, "", "", "", "", "R7"});
+  service.SetSshKeyDirectory("/state/keys");
+  service.SetSshEnabled(false);
+  EXPECT_FALSE(service.StartSshListener(kAddress, kPort + 2, kPort));
+  service.SetSshEnabled(true);
+  ASSERT_TRUE(service.StartSshListener(kAddress, kPort + 2, kPort));
+  EXPECT_EQ(ssh->tags, std::vector<std::uint32_t>{tag});
+  EXPECT_EQ(keys, "/state/keys");
+  EXPECT_TRUE(check(tag, "admin", "pw"));
+  EXPECT_FALSE(check(tag, "admin", "pw2"));
+  EXPECT_FALSE(check(tag + 1, "admin", "pw"));
+  TcpSessionId id = MakeTcpSessionId(tag, kSshClientBit | 1);
+  events->OnAccepted(id, tag, {});
+  EXPECT_EQ(ssh->ReadUntil("R7>"), "R7>");
+  events->OnBytes(id, "show version\r");
+  EXPECT_EQ(ssh->ReadUntil("R7>"), "show version\r\nVersion 1\r\nR7>");
+  EXPECT_EQ(service.Counters().loginsSucceeded, 1u);
+  events->OnClosed(id);
 }
 
 }  // namespace
