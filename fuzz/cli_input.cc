@@ -32,6 +32,7 @@ std::vector<CliInputEvent> Run(std::string_view input, std::size_t readSize) {
   session.Open();
   std::vector<CliInputEvent> events;
   auto masking = LineEditor::Masking::kNone;
+  int lines = 0;
   auto answer = [&] {
     while (true) {
       std::string output;
@@ -42,9 +43,11 @@ std::vector<CliInputEvent> Run(std::string_view input, std::size_t readSize) {
       if (event->text.size() >= LineEditor::kLineLimit) Fail("a line reaches the limit");
       if (event->kind == CliInputEvent::Kind::kComplete) session.SetLine(event->text + "x");
       if (event->kind == CliInputEvent::Kind::kHelp) session.ShowLine();
+      // As a session does, the masking changes only with a line: each third line is a
+      // password, each third after it a secret.
+      if (event->kind == CliInputEvent::Kind::kLine)
+        masking = static_cast<LineEditor::Masking>(++lines % 3);
       events.push_back(std::move(*event));
-      // Each third line is a password, each third after it a secret.
-      masking = static_cast<LineEditor::Masking>(events.size() % 3);
       session.Answered(masking, "");
     }
   };
