@@ -62,15 +62,21 @@ struct CliServiceTest : ::testing::Test {
                       {}}};
 };
 
+// A client that names its terminal, answered up to the login prompt.
+void Negotiate(LoopbackClient& client) {
+  EXPECT_EQ(client.ReadUntil("\xff\xfd\x18"), "\xff\xfd\x18");
+  client.Send("\xff\xfb\x18");
+  EXPECT_EQ(client.ReadUntil("\xff\xf0"), "\xff\xfa\x18\x01\xff\xf0");
+  client.Send("\xff\xfa\x18\x00XTERM\xff\xf0"s);
+  EXPECT_EQ(client.ReadUntil("Username: "), "\xff\xfb\x03\xff\xfb\x01" + kBannerAndPrompt);
+  client.Send("\xff\xfd\x03\xff\xfd\x01");  // the server's echo accepted
+}
+
 TEST_F(CliServiceTest, TelnetOpeningNeverHoldsAnotherClient) {
   auto start = Clock::now();
   auto silent = Connect();
   auto negotiating = Connect();
-  EXPECT_EQ(negotiating->ReadUntil("\xff\xfd\x18"), "\xff\xfd\x18");
-  negotiating->Send("\xff\xfb\x18");
-  EXPECT_EQ(negotiating->ReadUntil("\xff\xf0"), "\xff\xfa\x18\x01\xff\xf0");
-  negotiating->Send("\xff\xfa\x18\x00XTERM\xff\xf0"s);
-  EXPECT_EQ(negotiating->ReadUntil("Username: "), "\xff\xfb\x03\xff\xfb\x01" + kBannerAndPrompt);
+  Negotiate(*negotiating);
   EXPECT_LT(Clock::now() - start, 500ms) << "served while the other client stays silent";
   negotiating->Send("a");
   EXPECT_EQ(negotiating->ReadUntil("a", 1, 1s), "a") << "a negotiated client gets each key echoed";
@@ -90,6 +96,28 @@ TEST_F(CliServiceTest, LinesSplitOrTogetherAreAnsweredInOrderWithEcho) {
   EXPECT_EQ(client->ReadUntil("R7>", 4), expected);
   EXPECT_EQ(service.Counters().loginsSucceeded, 1u);
   EXPECT_EQ(service.Counters().commandsAnswered, 2u);
+}
+
+TEST_F(CliServiceTest, NegotiatedSessionDrawsKeysAsksTheHostAndHidesSecretsTypedAhead) {
+  host.SetCliReply("enable", 5, Answer{"level", "6"});
+  host.SetCliCompletion("sh", "show");
+  host.SetCliHelp("show ", "version  System status\n");
+  service.Agents().Update(service.Agents().FindAt(kAddress, kPort)->id, [](CliAgent& agent) {
+    agent.enablePassword = "en";
+    agent.enableByTelnet = true;
+  });
+  auto client = Connect();
+  Negotiate(*client);
+  client->Send("admin\rpw\r");
+  EXPECT_EQ(client->ReadUntil("R7>"), "admin\r\nPassword: \r\nR7>");
+  client->Send("sh\t");
+  EXPECT_EQ(client->ReadUntil("show"), "show");
+  client->Send(" ?");
+  EXPECT_EQ(client->ReadUntil("R7>show "), " ?\r\nversion  System status\r\nR7>show ");
+  client->Send(
+      "\x15"
+      "enable\ren\r");  // Ctrl-U, then the secret typed before it is asked for
+  EXPECT_EQ(client->ReadUntil("R7#"), "\x1b[5D\x1b[0Kenable\r\nPassword: **\r\nR7#");
 }
 
 TEST_F(CliServiceTest, ThirdFailedLoginCloses) {
