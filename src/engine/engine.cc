@@ -6,6 +6,7 @@
 #include <mutex>
 
 #include "base/stop_signal.h"
+#include "cli/cli_service.h"
 #include "engine/engine_state.h"
 #include "engine/log.h"
 #include "notify/notifier.h"
@@ -145,6 +146,15 @@ Tl1Service& TheTl1Service() {
   return *service;
 }
 
+CliService& TheCliService() {
+  static auto* service = [] {
+    CliServiceOptions options;
+    options.status = [](const std::string& text) { PrintStatus(text); };
+    return new CliService(std::move(options));
+  }();
+  return *service;
+}
+
 void BaseLoop() {
   LOG_TRACE("\n\t@@@@@ Inside BaseLoop() @@@@@ \n");
   TheLifecycle().baseLoopStop.Wait();
@@ -176,6 +186,7 @@ bool AdapterJniStopNetwork() {
   LOG_TRACE("\n\t@@@@@ Inside AdapterJniStopNetwork() @@@@@ \n");
   Lifecycle& lifecycle = TheLifecycle();
   TheTl1Service().Stop();
+  TheCliService().Stop();
   StopSnmpAndReport(lifecycle, "Network resources cleared Successfully");
   std::lock_guard<std::mutex> lock(lifecycle.mutex);
   CloseEngineLog();

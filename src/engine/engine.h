@@ -13,6 +13,7 @@
 namespace tessel {
 
 class Tl1Service;
+class CliService;
 
 struct EngineParams {
   bool consoleMode = false;
@@ -36,6 +37,8 @@ std::vector<std::int64_t> StartSnmpNetwork(const std::vector<AgentRegistration>&
 bool StartAgentAndService(const std::string& address, std::int32_t port, std::uint32_t engineBoots);
 // The engine's TL1 service, created on first use and never destroyed.
 Tl1Service& TheTl1Service();
+// The engine's CLI service, created on first use and never destroyed.
+CliService& TheCliService();
 
 // Blocks the calling thread until AdapterJniStopNetwork.
 void BaseLoop();

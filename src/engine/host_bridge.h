@@ -105,6 +105,18 @@ struct Tl1HostQuery {
   std::string hostText2Again;  // the agent's hostText2 as it is
 };
 
+// The arguments of a CLI host call: the line (or the line typed so far, for help and
+// completion), the session's mode, the agent's host texts and endpoint, and the block the
+// session is in ("" for none). Help and completion pass only line, mode, hostText1 and hostText2.
+struct CliHostQuery {
+  std::string line;
+  std::int32_t mode = 0;
+  std::string hostText1, hostText2, hostText3, hostText4;
+  std::string ipAddress;
+  std::int32_t port = 0;
+  std::string context;
+};
+
 class HostBridge {
  public:
   virtual ~HostBridge() = default;
@@ -136,6 +148,17 @@ class HostBridge {
   // without TL1 acknowledges nothing and answers null (DENY).
   virtual std::int32_t Tl1GetAck(const Tl1HostQuery& /*query*/) { return 0; }
   virtual HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& /*query*/) { return std::nullopt; }
+
+  // CLI: the answer to a line, key/value pairs in order ("response", "level", "context", ...);
+  // the help text for '?'; the completed line for TAB. A host without a CLI answers null
+  // (nothing to print, no change).
+  virtual HostAnswer CliEnterResponse(const CliHostQuery& /*query*/) { return std::nullopt; }
+  virtual std::optional<std::string> CliQuestionResponse(const CliHostQuery& /*query*/) {
+    return std::nullopt;
+  }
+  virtual std::optional<std::string> CliTabResponse(const CliHostQuery& /*query*/) {
+    return std::nullopt;
+  }
 };
 
 // The installed host, or nullptr. Installing is not synchronised with calls in flight: install

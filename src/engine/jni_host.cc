@@ -305,6 +305,24 @@ constexpr MethodName kTl1GetResponseBlock = {
     "String;IILjava/lang/String;ILjava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/"
     "lang/String;)[Ljava/lang/String;"};
 
+// The CLI handler's methods: a line's answer (with the session's block, when the handler knows
+// it), the help for '?' and the completion for TAB.
+#define TESSEL_CLI_ENTER_ARGUMENTS                                                              \
+  "Ljava/lang/String;ILjava/lang/String;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;" \
+  "Ljava/lang/String;I"
+constexpr MethodName kCliEnterResponse = {"enterResponseMethod",
+                                          "(" TESSEL_CLI_ENTER_ARGUMENTS ")[Ljava/lang/String;"};
+constexpr MethodName kCliEnterContextResponse = {"enterContextResponseMethod",
+                                                 "(" TESSEL_CLI_ENTER_ARGUMENTS
+                                                 "Ljava/lang/String;)[Ljava/lang/String;"};
+#undef TESSEL_CLI_ENTER_ARGUMENTS
+constexpr MethodName kCliQuestionResponse = {
+    "questionResponseMethod",
+    "(Ljava/lang/String;ILjava/lang/String;Ljava/lang/String;)Ljava/lang/String;"};
+constexpr MethodName kCliTabResponse = {
+    "tabResponseMethod",
+    "(Ljava/lang/String;ILjava/lang/String;Ljava/lang/String;)Ljava/lang/String;"};
+
 // Status methods the handler must have although the engine does not call them.
 constexpr MethodName kStatusMethods[] = {{"setStatus", "(Ljava/lang/String;)V"},
                                          {"setProgressValue", "(I)V"}};
@@ -335,6 +353,16 @@ struct Tl1HandlerBinding {
   GlobalRef object;
   jmethodID getAck = nullptr;
   jmethodID getResponseBlock = nullptr;
+};
+
+struct CliHandlerBinding {
+  CliHandlerBinding(JavaVM* vm, JNIEnv* env, jobject handler) : vm(vm), object(vm, env, handler) {}
+  JavaVM* vm;
+  GlobalRef object;
+  jmethodID enter = nullptr;
+  jmethodID enterWithContext = nullptr;  // optional
+  jmethodID question = nullptr;
+  jmethodID tab = nullptr;
 };
 
 // The arguments of one value call, converted in the caller's local frame.
@@ -578,6 +606,33 @@ bool JniHost::BindTl1Handler(JNIEnv* env, jobject handler) {
   std::lock_guard<std::mutex> lock(mutex_);
   tl1Handler_ = std::move(binding);
   return true;
+}
+
+bool JniHost::BindCliHandler(JNIEnv* env, jobject handler) {
+  JavaVM* vm = nullptr;
+  if (handler == nullptr || env->GetJavaVM(&vm) != JNI_OK) return false;
+  LocalFrame frame(env);
+  if (!frame.Pushed()) return false;
+  jclass type = env->GetObjectClass(handler);
+  auto binding = std::make_shared<CliHandlerBinding>(vm, env, handler);
+  binding->enterWithContext =
+      env->GetMethodID(type, kCliEnterContextResponse.name, kCliEnterContextResponse.signature);
+  if (binding->enterWithContext == nullptr) env->ExceptionClear();
+  binding->enter = LookUpMethod(env, type, kCliEnterResponse.name, kCliEnterResponse.signature);
+  binding->question =
+      LookUpMethod(env, type, kCliQuestionResponse.name, kCliQuestionResponse.signature);
+  binding->tab = LookUpMethod(env, type, kCliTabResponse.name, kCliTabResponse.signature);
+  if (binding->enter == nullptr || binding->question == nullptr || binding->tab == nullptr ||
+      LoadJavaStrings(env) == nullptr)
+    return false;
+  std::lock_guard<std::mutex> lock(mutex_);
+  cliHandler_ = std::move(binding);
+  return true;
+}
+
+std::shared_ptr<const CliHandlerBinding> JniHost::CliHandler() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return cliHandler_;
 }
 
 std::shared_ptr<const Tl1HandlerBinding> JniHost::Tl1Handler() const {
@@ -919,6 +974,46 @@ std::optional<ScrambleChanges> JniHost::ChangesFromJava(JNIEnv* env, jobject tab
   }
   if (ClearException(env, "hasMoreElements")) return std::nullopt;
   return changes;
+}
+
+HostAnswer JniHost::CliEnterResponse(const CliHostQuery& query) {
+  std::shared_ptr<const CliHandlerBinding> handler = CliHandler();
+  bool withContext = handler && handler->enterWithContext != nullptr;
+  auto fill = [&](JavaArguments& a) {
+    a.Text(query.line).Int(query.mode);
+    a.Constant(query.hostText1).Constant(query.hostText2);
+    a.Constant(query.hostText3).Constant(query.hostText4);
+    a.Constant(query.ipAddress).Int(query.port);
+    if (withContext) a.Text(query.context);
+  };
+  return CallHost(handler, HostAnswer{}, fill, [&](JNIEnv* env, const jvalue* values) {
+    jmethodID method = withContext ? handler->enterWithContext : handler->enter;
+    jobject answer = env->CallObjectMethodA(handler->object.Get(), method, values);
+    if (ClearException(env, kCliEnterResponse.name)) return HostAnswer{};
+    return AnswerFromJava(env, static_cast<jobjectArray>(answer));
+  });
+}
+
+std::optional<std::string> JniHost::CallCliText(bool tab, const CliHostQuery& query) {
+  std::shared_ptr<const CliHandlerBinding> handler = CliHandler();
+  auto fill = [&](JavaArguments& a) {
+    a.Text(query.line).Int(query.mode).Constant(query.hostText1).Constant(query.hostText2);
+  };
+  using Text = std::optional<std::string>;
+  return CallHost(handler, Text{}, fill, [&](JNIEnv* env, const jvalue* values) {
+    jobject text = env->CallObjectMethodA(handler->object.Get(),
+                                          tab ? handler->tab : handler->question, values);
+    if (ClearException(env, tab ? kCliTabResponse.name : kCliQuestionResponse.name)) return Text{};
+    return ToCpp(env, static_cast<jstring>(text));
+  });
+}
+
+std::optional<std::string> JniHost::CliQuestionResponse(const CliHostQuery& query) {
+  return CallCliText(false, query);
+}
+
+std::optional<std::string> JniHost::CliTabResponse(const CliHostQuery& query) {
+  return CallCliText(true, query);
 }
 
 }  // namespace tessel

@@ -25,6 +25,7 @@ JNIEnv* AttachedEnv(JavaVM* vm);
 struct SimulatorBinding;
 struct HandlerBinding;
 struct Tl1HandlerBinding;
+struct CliHandlerBinding;
 class JavaArguments;
 
 class JniHost final : public HostBridge {
@@ -40,6 +41,9 @@ class JniHost final : public HostBridge {
   // Binds the TL1 handler object (acknowledgments and responses). False when one of its methods
   // is missing.
   bool BindTl1Handler(JNIEnv* env, jobject handler);
+  // Binds the CLI handler object (line answers, help, completion); its context-taking line
+  // method is used when it has one. False when one of its required methods is missing.
+  bool BindCliHandler(JNIEnv* env, jobject handler);
 
   // Java text to C++ bytes (UTF-8, through the simulator's getBytes when bound); nothing for
   // null or when the host fails.
@@ -57,6 +61,9 @@ class JniHost final : public HostBridge {
   std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& query) override;
   std::int32_t Tl1GetAck(const Tl1HostQuery& query) override;
   HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& query) override;
+  HostAnswer CliEnterResponse(const CliHostQuery& query) override;
+  std::optional<std::string> CliQuestionResponse(const CliHostQuery& query) override;
+  std::optional<std::string> CliTabResponse(const CliHostQuery& query) override;
 
  private:
   // Calls the handler's inform method (kLogResponse or kStoreDropped) with what fill adds.
@@ -65,6 +72,9 @@ class JniHost final : public HostBridge {
   std::shared_ptr<const SimulatorBinding> Simulator() const;
   std::shared_ptr<const HandlerBinding> Handler() const;
   std::shared_ptr<const Tl1HandlerBinding> Tl1Handler() const;
+  std::shared_ptr<const CliHandlerBinding> CliHandler() const;
+  // The help (tab false) or completion text of the CLI handler.
+  std::optional<std::string> CallCliText(bool tab, const CliHostQuery& query);
   // Calls value method number method with the arguments fill adds.
   template <typename Fill>
   HostAnswer CallValueMethod(int method, Fill fill);
@@ -76,6 +86,7 @@ class JniHost final : public HostBridge {
   std::shared_ptr<const SimulatorBinding> simulator_;
   std::shared_ptr<const HandlerBinding> handler_;
   std::shared_ptr<const Tl1HandlerBinding> tl1Handler_;
+  std::shared_ptr<const CliHandlerBinding> cliHandler_;
 };
 
 // C++ bytes to a Java String (local reference), decoded as UTF-8; bytes that are not plain

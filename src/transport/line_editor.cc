@@ -13,6 +13,7 @@ constexpr std::uint8_t kEnd = 0x05;   // Ctrl-E
 constexpr std::uint8_t kBackspace = 0x08;
 constexpr std::uint8_t kTab = 0x09;
 constexpr std::uint8_t kKillLine = 0x15;  // Ctrl-U
+constexpr std::uint8_t kSuspend = 0x1a;   // Ctrl-Z
 constexpr std::uint8_t kDelete = 0x7f;
 constexpr std::size_t kMaxEscapeParameters = 8;
 constexpr std::string_view kEraseToEnd = "\x1b[0K";
@@ -46,29 +47,56 @@ std::string_view CommonPrefix(const std::vector<std::string>& candidates) {
 
 }  // namespace
 
-LineEditor::LineEditor(std::string prompt, Completion completion)
-    : prompt_(std::move(prompt)), completion_(std::move(completion)) {}
+LineEditor::LineEditor(std::string prompt, Completion completion, Options options)
+    : prompt_(std::move(prompt)), completion_(std::move(completion)), options_(options) {}
 
 LineEditor::Result LineEditor::Feed(std::string_view keys) {
   Result result;
   for (char c : keys) {
+    ++result.consumed;
     auto key = static_cast<std::uint8_t>(c);
     bool lineEnd = key == '\r' || key == '\n';
-    if (droppingLine_ && !lineEnd) continue;
-    if (escape_ != Escape::kNone)
+    bool skip = droppingLine_ && !lineEnd;
+    if (!skip && escape_ != Escape::kNone) {
       ReadEscape(key, &result);
-    else
+    } else if (!skip) {
       ReadKey(key, &result);
+    }
     afterCr_ = key == '\r';
+    if (options_.handOffRequests && (result.request || !result.lines.empty())) break;
   }
   return result;
+}
+
+void LineEditor::SetHistorySize(std::size_t size) {
+  historySize_ = size;
+  while (history_.size() > historySize_) history_.pop_front();
+  historyPosition_ = 0;
+}
+
+std::string LineEditor::SetLine(std::string_view text) {
+  ReplaceLine(text.substr(0, kLineLimit - 1));
+  std::string output;
+  if (echo_) Redraw(&output);
+  return output;
+}
+
+std::string LineEditor::ShowLine() {
+  shown_.clear();
+  shownColumn_ = 0;
+  appended_ = false;
+  std::string output;
+  if (echo_) Redraw(&output);
+  return output;
 }
 
 void LineEditor::ReadKey(std::uint8_t key, Result* result) {
   appended_ = false;
   if (key == kEscape) {
     escape_ = Escape::kStarted;
-  } else if (key == '?' && echo_ && !PasswordFieldOpen()) {
+  } else if (key == '?' && options_.handOffRequests && masking_ == Masking::kNone) {
+    HandOff(Request::Kind::kHelp, result);
+  } else if (key == '?' && echo_ && !options_.handOffRequests && !PasswordFieldOpen()) {
     Complete(result);
   } else if (key >= 0x20 && key != kDelete) {
     Insert(static_cast<char>(key), result);
@@ -138,7 +166,15 @@ void LineEditor::RunControlKey(std::uint8_t key, Result* result) {
       Erase(0, line_.size());
       break;
     case kTab:
-      if (echo_) Complete(result);
+      if (options_.handOffRequests) {
+        if (masking_ == Masking::kNone) HandOff(Request::Kind::kComplete, result);
+      } else if (echo_) {
+        Complete(result);
+      }
+      break;
+    case kSuspend:
+      if (options_.handOffRequests && masking_ == Masking::kNone)
+        HandOff(Request::Kind::kSuspend, result);
       break;
     default:
       break;  // other control characters mean nothing here
@@ -178,12 +214,17 @@ void LineEditor::CompleteLine(Result* result) {
     droppingLine_ = false;  // the end of a line already answered with the prompt
     return;
   }
-  if (echo_) result->output.append("\r\n");
-  if (!line_.empty()) {
+  if (!echo_ && options_.echoCompletedLines) result->output.append(VisibleLine(nullptr));
+  if (echo_ || options_.echoCompletedLines) result->output.append("\r\n");
+  if (!line_.empty() && masking_ == Masking::kNone && historySize_ > 0) {
     history_.push_back(line_);
-    if (history_.size() > kHistorySize) history_.pop_front();
+    if (history_.size() > historySize_) history_.pop_front();
   }
   result->lines.push_back(std::move(line_));
+  ClearLine();
+}
+
+void LineEditor::ClearLine() {
   line_.clear();
   hidden_.clear();
   cursor_ = 0;
@@ -191,6 +232,18 @@ void LineEditor::CompleteLine(Result* result) {
   shownColumn_ = 0;
   historyPosition_ = 0;
   typedLine_.clear();
+}
+
+// The caller answers the request; a suspended line is dropped, and a help request leaves the
+// '?' on the screen before the caller's help.
+void LineEditor::HandOff(Request::Kind kind, Result* result) {
+  result->request = Request{kind, kind == Request::Kind::kSuspend ? std::string() : line_};
+  if (kind == Request::Kind::kSuspend) {
+    if (echo_) result->output.append("^Z\r\n");
+    ClearLine();
+  } else if (kind == Request::Kind::kHelp && echo_) {
+    result->output.push_back('?');
+  }
 }
 
 // A line this long is no command: it is dropped, with whatever of it is still to come, and the
@@ -207,6 +260,7 @@ void LineEditor::DropLongLine(Result* result) {
 }
 
 void LineEditor::WalkHistory(bool towardsOlder) {
+  if (masking_ != Masking::kNone) return;  // no secret is drawn from the history
   if (towardsOlder && historyPosition_ < history_.size()) {
     if (historyPosition_ == 0) typedLine_ = line_;
     ++historyPosition_;
@@ -246,6 +300,7 @@ bool LineEditor::MayComplete() const {
 
 // ACT-USER:TID:UID:CTAG::PASSWORD — what is typed after the fifth ':' and before a ';'.
 bool LineEditor::PasswordFieldOpen() const {
+  if (options_.handOffRequests) return false;
   if (line_.size() < kPasswordCommand.size() ||
       !std::equal(kPasswordCommand.begin(), kPasswordCommand.end(), line_.begin(), SameLetter))
     return false;
@@ -255,22 +310,37 @@ bool LineEditor::PasswordFieldOpen() const {
 // Brings the client's screen from what it shows to the line as it is now: from the first
 // character that differs, the rest is written again (and what is left over erased), then the
 // cursor is put in place. Hidden characters take no room on the screen.
-void LineEditor::Redraw(std::string* output) {
-  if (appended_) {  // typing at the end, the common case, costs no pass over the line
-    appended_ = false;
-    if (hidden_.back()) return;
-    output->push_back(line_.back());
-    shown_.push_back(line_.back());
-    ++shownColumn_;
-    return;
-  }
+// The character shown for line_[index]; '\0' when it takes no room on the screen.
+char LineEditor::Shown(std::size_t index) const {
+  if (hidden_[index] || masking_ == Masking::kHidden) return '\0';
+  return masking_ == Masking::kStars ? '*' : line_[index];
+}
+
+std::string LineEditor::VisibleLine(std::size_t* cursorColumn) const {
   std::string visible;
   std::size_t column = 0;
   for (std::size_t i = 0; i < line_.size(); ++i) {
-    if (hidden_[i]) continue;
-    visible.push_back(line_[i]);
+    char shown = Shown(i);
+    if (shown == '\0') continue;
+    visible.push_back(shown);
     if (i < cursor_) ++column;
   }
+  if (cursorColumn != nullptr) *cursorColumn = column;
+  return visible;
+}
+
+void LineEditor::Redraw(std::string* output) {
+  if (appended_) {  // typing at the end, the common case, costs no pass over the line
+    appended_ = false;
+    char shown = Shown(line_.size() - 1);
+    if (shown == '\0') return;
+    output->push_back(shown);
+    shown_.push_back(shown);
+    ++shownColumn_;
+    return;
+  }
+  std::size_t column = 0;
+  std::string visible = VisibleLine(&column);
   if (visible != shown_) {
     auto differ = std::mismatch(visible.begin(), visible.end(), shown_.begin(), shown_.end());
     auto common = static_cast<std::size_t>(differ.first - visible.begin());

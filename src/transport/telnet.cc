@@ -1,5 +1,8 @@
 #include "transport/telnet.h"
 
+#include <algorithm>
+#include <cctype>
+
 namespace tessel {
 namespace {
 
@@ -8,6 +11,9 @@ void AppendCommand(std::string* out, std::uint8_t verb, std::uint8_t option) {
   out->push_back(static_cast<char>(verb));
   out->push_back(static_cast<char>(option));
 }
+
+// IAC SB TERMINAL-TYPE SEND IAC SE.
+constexpr std::string_view kSendTerminalType = "\xff\xfa\x18\x01\xff\xf0";
 
 // A client that sends this much in its first read types whole lines, not single keys.
 constexpr std::size_t kLineAtOnce = 3;
@@ -21,6 +27,32 @@ std::string TelnetInput::Open() {
     AppendCommand(&offer, kTelnetWill, option);
   }
   return offer;
+}
+
+std::string TelnetInput::OpenAskingTerminalType() {
+  commandLine_ = true;
+  negotiation_ = Negotiation::kPending;
+  client_[kTelnetTerminalType] = Option::kOffered;
+  std::string request;
+  AppendCommand(&request, kTelnetDo, kTelnetTerminalType);
+  return request;
+}
+
+void TelnetInput::GiveUpNegotiation() {
+  if (negotiation_ == Negotiation::kPending) negotiation_ = Negotiation::kNotNegotiated;
+}
+
+// A client that names a terminal is offered what a terminal needs; one without (or a dumb one)
+// is served as it is.
+void TelnetInput::Settle(Negotiation negotiation, std::string* replies) {
+  if (negotiation_ != Negotiation::kPending) return;
+  negotiation_ = negotiation;
+  if (negotiation != Negotiation::kNegotiated) return;
+  for (std::uint8_t option : {kTelnetSuppressGoAhead, kTelnetEcho}) {
+    if (server_[option] != Option::kOff) continue;
+    server_[option] = Option::kOffered;
+    AppendCommand(replies, kTelnetWill, option);
+  }
 }
 
 TelnetFeed TelnetInput::Feed(std::string_view bytes) {
@@ -40,13 +72,19 @@ TelnetFeed TelnetInput::Feed(std::string_view bytes) {
         ReadOptionRequest(byte, &out.replies);
         break;
       case State::kSubnegotiation:
-        if (byte == kTelnetIac) state_ = State::kSubnegotiationCommand;
+        if (byte == kTelnetIac) {
+          state_ = State::kSubnegotiationCommand;
+        } else if (subnegotiation_.size() < kSubnegotiationLimit) {
+          subnegotiation_.push_back(c);  // bytes past the limit are dropped
+        }
         break;
       case State::kSubnegotiationCommand:
         if (byte == kTelnetSubnegotiationEnd) {
           state_ = State::kData;
+          EndSubnegotiation(&out.replies);
         } else if (byte == kTelnetIac) {
           state_ = State::kSubnegotiation;  // an escaped 0xFF inside the parameters
+          if (subnegotiation_.size() < kSubnegotiationLimit) subnegotiation_.push_back(c);
         } else {
           ReadCommand(byte);  // a command without IAC SE ends the subnegotiation too
         }
@@ -55,6 +93,18 @@ TelnetFeed TelnetInput::Feed(std::string_view bytes) {
   }
   if (firstDataLength_ == 0) firstDataLength_ = out.data.size();
   return out;
+}
+
+// TERMINAL-TYPE IS name, once the client agreed to tell it; other parameters are not used.
+void TelnetInput::EndSubnegotiation(std::string* replies) {
+  std::string_view parameters = subnegotiation_;
+  if (!commandLine_ || client_[kTelnetTerminalType] != Option::kOn || parameters.size() < 2 ||
+      static_cast<std::uint8_t>(parameters[0]) != kTelnetTerminalType || parameters[1] != '\0')
+    return;
+  terminalType_.clear();
+  for (char c : parameters.substr(2, kTerminalTypeLimit))
+    terminalType_.push_back(static_cast<char>(std::tolower(static_cast<unsigned char>(c))));
+  Settle(terminalType_ == "dumb" ? Negotiation::kNotNegotiated : Negotiation::kNegotiated, replies);
 }
 
 void TelnetInput::ReadData(std::uint8_t byte, TelnetFeed* out) {
@@ -67,6 +117,9 @@ void TelnetInput::ReadData(std::uint8_t byte, TelnetFeed* out) {
   } else {
     out->data.push_back(static_cast<char>(byte));
     if (byte == '\r') state_ = State::kAfterCr;
+    // Data before any answer: a client that takes no part in negotiation.
+    if (commandLine_ && client_[kTelnetTerminalType] == Option::kOffered)
+      Settle(Negotiation::kNotNegotiated, &out->replies);
   }
 }
 
@@ -81,7 +134,8 @@ void TelnetInput::ReadCommand(std::uint8_t byte) {
       state_ = State::kOptionName;
       break;
     case kTelnetSubnegotiation:
-      state_ = State::kSubnegotiation;  // no parameters are used: skipped up to IAC SE
+      state_ = State::kSubnegotiation;  // parameters kept up to IAC SE
+      subnegotiation_.clear();
       break;
     default:
       state_ = State::kData;  // IAC IAC, and commands without effect here (NOP, GA, AYT, ...)
@@ -110,7 +164,7 @@ void TelnetInput::AnswerServerOption(std::uint8_t option, bool enable, std::stri
     AppendCommand(replies, supported ? kTelnetWill : kTelnetWont, option);
   } else if (!enable && state == Option::kOn) {
     state = Option::kOff;
-    AppendCommand(replies, kTelnetWont, option);
+    if (!commandLine_) AppendCommand(replies, kTelnetWont, option);
   }
 }
 
@@ -119,16 +173,25 @@ void TelnetInput::AnswerServerOption(std::uint8_t option, bool enable, std::stri
 void TelnetInput::AnswerClientOption(std::uint8_t option, bool enable, std::string* replies) {
   Option& state = client_[option];
   bool supported = option == kTelnetSuppressGoAhead;
-  if (enable && state == Option::kOff) {
+  if (state == Option::kOffered) {  // the answer to asking for the terminal type
+    state = enable ? Option::kOn : Option::kOff;
+    if (!enable) {
+      Settle(Negotiation::kNotNegotiated, replies);
+      return;
+    }
+    replies->append(kSendTerminalType);
+  } else if (enable && state == Option::kOff) {
     if (supported) state = Option::kOn;
     AppendCommand(replies, supported ? kTelnetDo : kTelnetDont, option);
   } else if (!enable && state == Option::kOn) {
     state = Option::kOff;
-    AppendCommand(replies, kTelnetDont, option);
+    if (!commandLine_) AppendCommand(replies, kTelnetDont, option);
   }
 }
 
 bool TelnetInput::ServerEchoes() const {
+  if (commandLine_ && negotiation_ != Negotiation::kNegotiated)
+    return firstDataLength_ > 0 && firstDataLength_ < kLineAtOnce;
   switch (server_[kTelnetEcho]) {
     case Option::kOn:
       return true;

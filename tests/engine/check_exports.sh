@@ -14,7 +14,14 @@ grep -v '^#' "$(dirname "$0")/pending_exports.txt" >"$work/pending" || true
   class=$(printf '%s' "${file#./}" | sed 's/\.java$//; s#/#_#g')
   grep -o ' native [^(]*(' "$sources/$file" | sed 's/($//; s/.* //' |
     while read -r method; do echo "Java_${class}_${method}"; done
-done | LC_ALL=C sort >"$work/expected"
+done >"$work/expected.unsorted"
+# Natives whose Java class is not in the host sources yet (written at the same time on another
+# branch): each counts until its class appears, and from then on only the class's own natives.
+grep -v '^#' "$(dirname "$0")/pending_natives.txt" | while read -r symbol; do
+  class=$(printf '%s' "${symbol#Java_}" | sed 's/_[^_]*$//; s#_#/#g')
+  [ -f "$sources/$class.java" ] || echo "$symbol"
+done >>"$work/expected.unsorted"
+LC_ALL=C sort "$work/expected.unsorted" >"$work/expected"
 nm -D --defined-only "$library" | awk 'NF == 3 { print $3 }' | LC_ALL=C sort >"$work/actual"
 if [ ! -s "$work/expected" ] || ! LC_ALL=C sort -u "$work/actual" "$work/pending" | diff "$work/expected" -; then
   echo "the library's exports differ from the host's native methods (< missing, > unexpected)"

@@ -190,4 +190,45 @@ HostAnswer MemoryHost::Tl1GetResponseBlock(const Tl1HostQuery& query) {
   return found == tl1Replies_.end() ? std::nullopt : found->second.response;
 }
 
+void MemoryHost::SetCliReply(const std::string& line, std::int32_t mode, HostAnswer reply) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  cliReplies_[{line, mode}] = std::move(reply);
+}
+
+void MemoryHost::SetCliHelp(const std::string& line, std::string help) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  cliHelp_[line] = std::move(help);
+}
+
+void MemoryHost::SetCliCompletion(const std::string& line, std::string completed) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  cliCompletions_[line] = std::move(completed);
+}
+
+std::vector<CliHostQuery> MemoryHost::CliQueries() const {
+  std::lock_guard<std::mutex> lock(mutex_);
+  return cliQueries_;
+}
+
+HostAnswer MemoryHost::CliEnterResponse(const CliHostQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  cliQueries_.push_back(query);
+  auto found = cliReplies_.find({query.line, query.mode});
+  return found == cliReplies_.end() ? std::nullopt : found->second;
+}
+
+std::optional<std::string> MemoryHost::CliQuestionResponse(const CliHostQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  auto found = cliHelp_.find(query.line);
+  if (found == cliHelp_.end()) return std::nullopt;
+  return found->second;
+}
+
+std::optional<std::string> MemoryHost::CliTabResponse(const CliHostQuery& query) {
+  std::lock_guard<std::mutex> lock(mutex_);
+  auto found = cliCompletions_.find(query.line);
+  if (found == cliCompletions_.end()) return std::nullopt;
+  return found->second;
+}
+
 }  // namespace tessel

@@ -49,6 +49,14 @@ class MemoryHost : public HostBridge {
   void SetTl1Reply(const std::string& commandCode, Tl1Reply reply);
   std::vector<Tl1HostQuery> Tl1Queries() const;
 
+  // What a CLI line answers, by the line as the engine passes it and the session's mode; a line
+  // without a reply answers null. Help and completion answer by the line alone. The queries of
+  // the line calls are kept in order.
+  void SetCliReply(const std::string& line, std::int32_t mode, HostAnswer reply);
+  void SetCliHelp(const std::string& line, std::string help);
+  void SetCliCompletion(const std::string& line, std::string completed);
+  std::vector<CliHostQuery> CliQueries() const;
+
   void PrintStatus(const std::string& text) override;
   HostAnswer ScalarGetOidVal(const HostValueQuery& query) override;
   HostAnswer ScalarGetNextOidVal(const HostValueQuery& query) override;
@@ -61,6 +69,9 @@ class MemoryHost : public HostBridge {
   std::optional<ScrambleChanges> ScramblePDU(const ScrambleQuery& query) override;
   std::int32_t Tl1GetAck(const Tl1HostQuery& query) override;
   HostAnswer Tl1GetResponseBlock(const Tl1HostQuery& query) override;
+  HostAnswer CliEnterResponse(const CliHostQuery& query) override;
+  std::optional<std::string> CliQuestionResponse(const CliHostQuery& query) override;
+  std::optional<std::string> CliTabResponse(const CliHostQuery& query) override;
 
  private:
   struct Entry {
@@ -86,6 +97,10 @@ class MemoryHost : public HostBridge {
   std::vector<ScrambleQuery> scrambleQueries_;
   std::map<std::string, Tl1Reply> tl1Replies_;
   std::vector<Tl1HostQuery> tl1Queries_;
+  std::map<std::pair<std::string, std::int32_t>, HostAnswer> cliReplies_;
+  std::map<std::string, std::string> cliHelp_;
+  std::map<std::string, std::string> cliCompletions_;
+  std::vector<CliHostQuery> cliQueries_;
 };
 
 // The session of an agent on 127.0.0.1, port 161 (stored as 160), with the read community

@@ -1,16 +1,13 @@
 #include "tl1/tl1_service.h"
 
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <netinet/in.h>
-#include <poll.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 #include <atomic>
 #include <chrono>
 #include <thread>
 
+#include "support/loopback_client.h"
 #include "support/memory_host.h"
 #include "tl1/noon.h"
 
@@ -32,71 +29,10 @@ std::string Response(const std::string& ctag, const std::string& word) {
   return "\r\n\n   NE1 24-06-30 12:00:00\r\nM  " + ctag + " " + word + "\r\n;" + kPrompt;
 }
 
-// A loopback client; every read waits at most a few seconds.
-class Client {
- public:
-  explicit Client(std::uint16_t port) : socket_(::socket(AF_INET, SOCK_STREAM, 0)) {
-    sockaddr_in to{};
-    to.sin_family = AF_INET;
-    to.sin_port = htons(port);
-    inet_pton(AF_INET, kAddress.c_str(), &to.sin_addr);
-    connected_ = ::connect(socket_, reinterpret_cast<sockaddr*>(&to), sizeof to) == 0;
-  }
-  ~Client() { ::close(socket_); }
-  bool Connected() const { return connected_; }
-  void EndOutput() { ::shutdown(socket_, SHUT_WR); }
-  void Send(const std::string& bytes) {
-    ASSERT_EQ(::send(socket_, bytes.data(), bytes.size(), MSG_NOSIGNAL),
-              static_cast<ssize_t>(bytes.size()));
-  }
-  // Everything received up to and including the count-th occurrence of until; what was received
-  // so far when it does not come in time.
-  std::string ReadUntil(const std::string& until, int count = 1,
-                        std::chrono::milliseconds timeout = 3s) {
-    auto deadline = std::chrono::steady_clock::now() + timeout;
-    while (true) {
-      std::size_t end = 0;
-      int found = 0;
-      for (std::size_t at = buffer_.find(until); at != std::string::npos;
-           at = buffer_.find(until, at + until.size())) {
-        end = at + until.size();
-        if (++found == count) break;
-      }
-      if (found == count) {
-        std::string head = buffer_.substr(0, end);
-        buffer_.erase(0, end);
-        return head;
-      }
-      if (!Fill(deadline)) return std::exchange(buffer_, {});
-    }
-  }
-  // Whether the server closed the connection within the timeout (input before it is dropped).
-  bool WaitClosed(std::chrono::milliseconds timeout) {
-    auto deadline = std::chrono::steady_clock::now() + timeout;
-    while (Fill(deadline)) buffer_.clear();
-    return closed_;
-  }
-
- private:
-  bool Fill(std::chrono::steady_clock::time_point deadline) {
-    auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-        deadline - std::chrono::steady_clock::now());
-    pollfd ready{socket_, POLLIN, 0};
-    if (left.count() <= 0 || ::poll(&ready, 1, static_cast<int>(left.count())) <= 0) return false;
-    char bytes[8192];
-    ssize_t read = ::recv(socket_, bytes, sizeof bytes, 0);
-    if (read <= 0) {
-      closed_ = true;
-      return false;
-    }
-    buffer_.append(bytes, static_cast<std::size_t>(read));
-    return true;
-  }
-
-  int socket_;
-  bool connected_ = false;
-  bool closed_ = false;
-  std::string buffer_;
+// A loopback client on the agent's address; every read waits at most a few seconds.
+struct Client : LoopbackClient {
+  explicit Client(std::uint16_t port) : LoopbackClient(kAddress, port) {}
+  void Send(const std::string& bytes) { ASSERT_TRUE(LoopbackClient::Send(bytes)); }
 };
 
 // A host that takes its time over each response, as a busy one may.

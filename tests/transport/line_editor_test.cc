@@ -131,5 +131,75 @@ TEST(LineEditorTest, WithoutEchoNothingIsDrawn) {
 }
 // clang-format on
 
+struct HandOff {
+  const char* name;
+  std::string keys;
+  bool echo;
+  LineEditor::Masking masking;
+  std::string output;
+  std::optional<LineEditor::Request> request;  // else one completed line:
+  std::string line;
+  std::size_t consumed;
+};
+
+// A command-line session: every completed line is written back, TAB, '?' and Ctrl-Z go to the
+// caller, and a feed stops at the first line or request, leaving the rest for the next feed.
+TEST(LineEditorTest, CommandLineHandsOffRequestsAndEchoesEveryLine) {
+  using Kind = LineEditor::Request::Kind;
+  using M = LineEditor::Masking;
+  const HandOff cases[] = {
+      {"a line with echo off is written back", "sh ver\r\nnext", false, M::kNone, "sh ver\r\n",
+       std::nullopt, "sh ver", 7},
+      {"CR NUL ends it once", "a\r\0b", false, M::kNone, "a\r\n", std::nullopt, "a", 2},
+      {"a hidden line shows nothing", "secret\rx", true, M::kHidden, "\r\n", std::nullopt,
+       "secret", 7},
+      {"hidden without echo", "secret\n", false, M::kHidden, "\r\n", std::nullopt, "secret", 7},
+      {"stars", "ab\x7f\x7fxyz\r", true, M::kStars, "**\x1b[D\x1b[0K\x1b[D\x1b[0K***\r\n", std::nullopt,
+       "xyz", 8},
+      {"TAB", "int gi\tx", true, M::kNone, "int gi", LineEditor::Request{Kind::kComplete, "int gi"},
+       "", 7},
+      {"'?' shown", "sh ?x", true, M::kNone, "sh ?", LineEditor::Request{Kind::kHelp, "sh "}, "", 4},
+      {"'?' without echo", "sh ?\r\n", false, M::kNone, "",
+       LineEditor::Request{Kind::kHelp, "sh "}, "", 4},
+      {"a '?' in a secret is part of it", "a?b\r", true, M::kStars, "***\r\n", std::nullopt, "a?b",
+       4},
+      {"Ctrl-Z drops the line", "conf\x1a", true, M::kNone, "conf^Z\r\n",
+       LineEditor::Request{Kind::kSuspend, ""}, "", 5},
+  };
+  for (const HandOff& c : cases) {
+    LineEditor editor("R1>", {}, {true, true});
+    editor.SetEcho(c.echo);
+    editor.SetMasking(c.masking);
+    LineEditor::Result result = editor.Feed(c.keys);
+    EXPECT_EQ(result.output, c.output) << c.name;
+    EXPECT_EQ(result.consumed, c.consumed) << c.name;
+    ASSERT_EQ(result.request.has_value(), c.request.has_value()) << c.name;
+    if (c.request) {
+      EXPECT_EQ(result.request->kind, c.request->kind) << c.name;
+      EXPECT_EQ(result.request->line, c.request->line) << c.name;
+      EXPECT_TRUE(result.lines.empty()) << c.name;
+    } else {
+      EXPECT_EQ(result.lines, std::vector<std::string>{c.line}) << c.name;
+    }
+  }
+}
+
+TEST(LineEditorTest, CommandLineAnswersReplaceOrShowTheLine) {
+  LineEditor editor("R1>", {}, {true, true});
+  editor.Feed("sh");
+  editor.Feed("o\t");
+  EXPECT_EQ(editor.SetLine("show"), "w") << "only what changed is drawn";
+  EXPECT_EQ(editor.Feed(" ?").output, " ?");
+  EXPECT_EQ(editor.ShowLine(), "show ") << "drawn whole after the caller's prompt";
+  EXPECT_EQ(editor.Feed("v\r").lines, std::vector<std::string>{"show v"});
+  editor.SetMasking(LineEditor::Masking::kStars);
+  editor.Feed("secret\r");
+  editor.SetMasking(LineEditor::Masking::kNone);
+  EXPECT_EQ(editor.History(), std::vector<std::string>{"show v"}) << "secrets are not kept";
+  EXPECT_EQ(editor.Feed(kUp + "\r").lines, std::vector<std::string>{"show v"});
+  editor.SetHistorySize(0);
+  EXPECT_EQ(editor.Feed(kUp + "\r").lines, std::vector<std::string>{""});
+}
+
 }  // namespace
 }  // namespace tessel

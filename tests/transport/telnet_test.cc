@@ -84,6 +84,64 @@ TEST(TelnetTest, ClientThatDoesNotAnswerIsJudgedByItsFirstData) {
   }
 }
 
+struct Opening {
+  const char* name;
+  std::string received, replies;
+  TelnetInput::Negotiation negotiation;
+  std::string terminalType;
+};
+
+// The command-line opening: the terminal type is asked for first, and only a client that names
+// one other than "dumb" is offered echo and go-ahead suppression; no WONT or DONT is answered.
+TEST(TelnetTest, CommandLineOpeningAsksForTheTerminalType) {
+  using N = TelnetInput::Negotiation;
+  const std::string send = "\xff\xfa\x18\x01\xff\xf0"s,
+                    offer = Command(kWill, kGoAhead) + Command(kWill, kEcho);
+  auto is = [](const std::string& name) { return "\xff\xfa\x18\x00"s + name + "\xff\xf0"; };
+  const Opening openings[] = {
+      {"names a terminal", Command(kWill, kTerminalType) + is("XTerm"), send + offer,
+       N::kNegotiated, "xterm"},
+      {"a dumb terminal, in any case", Command(kWill, kTerminalType) + is("DuMb"), send,
+       N::kNotNegotiated, "dumb"},
+      {"refuses", Command(kWont, kTerminalType), "", N::kNotNegotiated, ""},
+      {"sends data first", "admin\r\n", "", N::kNotNegotiated, ""},
+      {"agrees but has not named one", Command(kWill, kTerminalType), send, N::kPending, ""},
+      {"WONT and DONT are never answered",
+       Command(kWill, kTerminalType) + is("vt100") + Command(kDo, kEcho) + Command(kDont, kEcho) +
+           Command(kWill, kGoAhead) + Command(kWont, kGoAhead),
+       send + offer + Command(kDo, kGoAhead), N::kNegotiated, "vt100"},
+      {"a long name is cut, the overflow dropped",
+       Command(kWill, kTerminalType) + is(std::string(600, 'A')), send + offer, N::kNegotiated,
+       std::string(40, 'a')},
+  };
+  for (const Opening& opening : openings) {
+    for (std::size_t readSize : {opening.received.size(), std::size_t{1}}) {
+      TelnetInput telnet;
+      EXPECT_EQ(telnet.OpenAskingTerminalType(), Command(kDo, kTerminalType));
+      std::string replies;
+      for (std::size_t at = 0; at < opening.received.size(); at += readSize)
+        replies += telnet.Feed(opening.received.substr(at, readSize)).replies;
+      std::string how = opening.name + " in reads of "s + std::to_string(readSize);
+      EXPECT_EQ(replies, opening.replies) << how;
+      EXPECT_EQ(telnet.NegotiationState(), opening.negotiation) << how;
+      EXPECT_EQ(telnet.TerminalType(), opening.terminalType) << how;
+    }
+  }
+}
+
+TEST(TelnetTest, UnsettledOpeningGivenUpIsServedByItsFirstData) {
+  for (auto [firstRead, echoes] : {std::pair{"show version\r\n", false}, {"s", true}}) {
+    TelnetInput telnet;
+    telnet.OpenAskingTerminalType();
+    telnet.Feed(Command(kWill, kTerminalType));
+    telnet.GiveUpNegotiation();
+    EXPECT_EQ(telnet.NegotiationState(), TelnetInput::Negotiation::kNotNegotiated);
+    EXPECT_EQ(telnet.Feed("\xff\xfa\x18\x00xterm\xff\xf0"s).replies, "") << "too late";
+    telnet.Feed(firstRead);
+    EXPECT_EQ(telnet.ServerEchoes(), echoes) << firstRead;
+  }
+}
+
 TEST(TelnetTest, EscapedDataReadsBackUnchanged) {
   std::string bytes;
   for (int byte = 0; byte < 256; ++byte)
