@@ -3,6 +3,7 @@
 #include <sys/resource.h>
 
 #include <cstdio>
+#include <memory>
 #include <mutex>
 
 #include "base/stop_signal.h"
@@ -17,6 +18,7 @@
 #include "snmpv3/engine_id.h"
 #include "snmpv3/v3_config.h"
 #include "tl1/tl1_service.h"
+#include "transport/ssh_server.h"
 
 namespace tessel {
 namespace {
@@ -150,6 +152,13 @@ CliService& TheCliService() {
   static auto* service = [] {
     CliServiceOptions options;
     options.status = [](const std::string& text) { PrintStatus(text); };
+    options.sshServer = [](TcpSessionEvents* events, CliPasswordCheck check,
+                           const std::string& keyDirectory) -> std::unique_ptr<StreamServer> {
+      SshServerOptions ssh;
+      ssh.hostKeyDirectory = keyDirectory;
+      ssh.authenticate = std::move(check);
+      return std::make_unique<SshServer>(events, std::move(ssh));
+    };
     return new CliService(std::move(options));
   }();
   return *service;

@@ -272,13 +272,19 @@ class NetworkFileTest {
   }
 
   @Test
-  void shippedDefaultNetworkIsTheHundredRoutersAndTwentyOpticalElements() throws Exception {
+  void shippedDefaultNetworkIsTheHundredRoutersWithTheirCliAndTwentyOpticalElements() throws Exception {
     Path profiles = Path.of(System.getProperty("tessel.profiles.dir", "profiles")).toAbsolutePath().normalize();
     Network network = NetworkFile.read(profiles.resolve("network.yaml"));
     Snmp snmp = new Snmp(1161, profiles.resolve("router.snmprec"), Optional.of(profiles.resolve("snmpv3.conf")),
         "public", "private");
     assertEquals(2, network.groups().size());
-    assertEquals(new Group("routers", 100, 0x7F00_0101L, "R{n}", Optional.of(snmp)), network.groups().get(0));
+    Group routers = network.groups().get(0);
+    assertEquals(new Group("routers", 100, 0x7F00_0101L, "R{n}", Optional.of(snmp), List.of(), List.of(),
+        Optional.empty(), routers.cli()), routers);
+    Network.Cli cli = routers.cli().orElseThrow();
+    assertEquals(List.of("2323", "2222", "admin", "admin", "enable", profiles.resolve("router.cli").toString()),
+        List.of("" + cli.port(), "" + cli.sshPort().getAsInt(), cli.user(), cli.password(), cli.enable(),
+            cli.dataFile().toString()));
     Group optical = network.groups().get(1);
     Tl1 tl1 = optical.tl1().orElseThrow();
     assertEquals(List.of("optical", "20", "127.0.2.1", "NE20", "false", "3083", "OptionalInt[3023]", "0", "false",
