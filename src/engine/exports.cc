@@ -17,6 +17,7 @@
 #include "snmp/statistics.h"
 #include "snmpv3/v3_config.h"
 #include "snmpv3/vacm.h"
+#include "vip/virtual_ips.h"
 
 namespace tessel {
 namespace {
@@ -210,7 +211,15 @@ Java_com_kestrelon_simulator_tessel_NetworkSimulator_jniGetEngineBootCounts(JNIE
 
 JNIEXPORT jint JNICALL
 Java_com_kestrelon_simulator_tessel_NetworkSimulator_GetIPv6InterfaceIndex(JNIEnv*, jobject) {
+  // The adapter is selected at first need; its index scopes IPv6 link-local binds.
   std::int32_t index = gv_ipv6InterfaceIndex.load();
+  if (index == 0) {
+    index = Guarded<std::int32_t>(0, [] {
+      std::optional<NetworkInterface> adapter = TheVirtualIps().Adapter();
+      return adapter ? static_cast<std::int32_t>(adapter->index) : 0;
+    });
+    gv_ipv6InterfaceIndex = index;
+  }
   LOG_TRACE("Value from GetIPv6InterfaceIndex .... [%d] ", index);
   return index;
 }
