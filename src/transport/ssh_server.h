@@ -123,7 +123,6 @@ class SshServer final : public StreamServer {
   ssh_bind_struct* bind_ = nullptr;  // the host keys and algorithms every connection gets
 
   std::mutex startMutex_;  // orders starting and stopping the loop thread and loading the keys
-  bool keysLoaded_ = false;
   std::thread loop_;
   std::atomic<bool> stopping_{false};
 
